@@ -7,6 +7,10 @@
 
 namespace quarry {
 
+// %m is the C library's own.
+#pragma GCC diagnostic push
+#pragma GCC diagnostic ignored "-Wformat"
+
 void LogError(const LogSite& site, const std::string& message) {
   if (errno != 0) {
     syslog(LOG_ERR, "%s:%d (%d, %u) (%s) %s [err: %m]", site.unit, site.line, getpid(), geteuid(),
@@ -17,6 +21,8 @@ void LogError(const LogSite& site, const std::string& message) {
            site.function, message.c_str());
   }
 }
+
+#pragma GCC diagnostic pop
 
 void LogLine(const LogSite& site, const std::string& message) {
   syslog(LOG_ERR, "%s:%d %s", site.unit, site.line, message.c_str());

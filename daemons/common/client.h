@@ -23,8 +23,8 @@ struct ClientOptions {
 // One daemon's client. Its connection is kept open from request to request. One thread at a time.
 class Client {
  public:
-  // `daemon` names it in messages. Nothing is connected yet. Throws Error 502 when the path does not
-  // fit a socket address.
+  // `daemon` names it in messages. Nothing is connected yet. Throws Error 502 when the path does
+  // not fit a socket address.
   Client(const std::string& daemon, const std::string& socket_path, ClientOptions options = {});
   ~Client();
   Client(const Client&) = delete;

@@ -7,9 +7,10 @@
 
 namespace quarry::daemon {
 
-// Names the program in the system log (facility LOG_DAEMON) and, with `foreground`, sends every line
-// to stderr as well. Call it once, before threads are started; without it lines go to the system log
-// under the program's own name.
+// Names the program in the system log (facility LOG_DAEMON) and, with `foreground`, sends every
+// line to stderr as well. Call it once, before threads are started; without it lines go to the
+// system log under the program's own name. With `foreground` SIGPIPE is ignored from then on: a
+// daemon outlives the terminal that it talks to.
 void OpenLog(const std::string& name, bool foreground);
 
 // Each writes one line. Control characters and backslashes are escaped, so that text from outside

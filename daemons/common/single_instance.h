@@ -16,13 +16,13 @@ std::string PidFilePath(const std::string& name);
 // block. A daemon that is just starting may count as not running.
 pid_t RunningPid(const std::string& pid_path);
 
-// Holds the daemon's pid file, locked, as long as the object lives. The file stays behind, empty and
-// unlocked: removing it would let two processes lock two files of the same name.
+// Holds the daemon's pid file, locked, as long as the object lives. The file stays behind, empty
+// and unlocked: removing it would let two processes lock two files of the same name.
 class SingleInstance {
  public:
   // Locks the pid file and writes this process's id and a line feed into it, creating missing
-  // directories above it. Does not wait. Throws Error 506 when another process holds it, naming that
-  // process, and Error 502 on a system failure.
+  // directories above it. Waits for 0.1 s at most. Throws Error 506 when another process holds it,
+  // naming that process, and Error 502 on a system failure.
   explicit SingleInstance(const std::string& name);
   // The same with a pid file of its own; `name` is used in messages only.
   SingleInstance(const std::string& name, const std::string& pid_path);

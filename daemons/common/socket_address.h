@@ -14,7 +14,13 @@ namespace quarry::daemon {
 sockaddr_un SocketAddress(const std::string& path);
 
 // Fails as SocketAddress does, for callers that want to know before they begin.
-inline void CheckSocketPath(const std::string& path) { SocketAddress(path); }
+inline void CheckSocketPath(const std::string& path) {
+  SocketAddress(path);
+}
+
+// What connecting to the socket at `path` gives: 0, or the errno. ECONNREFUSED means that nobody
+// listens there, EAGAIN that somebody does who has no room at present. Does not block.
+int ProbeSocket(const std::string& path);
 
 }  // namespace quarry::daemon
 
