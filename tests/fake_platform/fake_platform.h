@@ -45,8 +45,8 @@ int Outstanding();
 // ---- Failures
 
 struct Failure {
-  int result = -1;         // returned by functions of type int; others return null or false, or throw
-  int error_number = 0;    // errno, left alone when 0
+  int result = -1;       // returned by functions of type int; others return null or false, or throw
+  int error_number = 0;  // errno, left alone when 0
   int platform_error = 0;  // HLIBCErrGet(), left alone when 0
 };
 // Makes the nth call of `function` from now on fail, counted from 1.
@@ -83,7 +83,8 @@ struct User {
   bool administrator = false;
 };
 // Adds an account, or replaces the one of that name. ResetCredentialsByName succeeds for unknown
-// accounts too; for known ones it changes the ids where SetEffectiveIds of system_calls.h is in use.
+// accounts too; for known ones it changes the ids where SetEffectiveIds of system_calls.h is in
+// use.
 void AddUser(const User& user);
 void RemoveUser(const std::string& name);
 

@@ -58,7 +58,8 @@ void FailSystemCall(const std::string& name, int nth, int error_number);
 void FailEverySystemCall(const std::string& name, int error_number);
 // Makes the nth write from now on write no more than `bytes` bytes.
 void CutWrite(int nth, size_t bytes);
-// Runs before each such call, failing ones included, with no lock held; its own calls do not run it.
+// Runs before each such call, failing ones included, with no lock held; its own calls do not run
+// it.
 void OnSystemCall(const std::string& name, std::function<void()> hook);
 // How many times a call was made since the reset.
 int SystemCallCount(const std::string& name);
