@@ -25,9 +25,6 @@ namespace {
 using Clock = Connection::Clock;
 using State = Connection::State;
 
-// When every place is taken, a peer that has been silent for this long makes room for one that
-// waits.
-constexpr auto kEvictAfter = std::chrono::seconds(1);
 // How long no connection is accepted after the system has run out of descriptors or memory.
 constexpr auto kAcceptPause = std::chrono::milliseconds(100);
 constexpr std::size_t kMaxReplyBytes = std::numeric_limits<std::uint32_t>::max();
@@ -213,7 +210,7 @@ Clock::time_point SocketServer::Impl::NextEviction() const {
   Clock::time_point next = Clock::time_point::max();
   for (const auto& [id, connection] : connections_) {
     if (connection.state() == State::kWorking) continue;
-    next = std::min(next, connection.LastActive() + kEvictAfter);
+    next = std::min(next, connection.LastActive() + options_.evict_after);
   }
   return next;
 }
@@ -327,7 +324,7 @@ bool SocketServer::Impl::MakeRoom() {
     }
   }
   if (oldest == connections_.end()) return false;
-  if (oldest->second.LastActive() + kEvictAfter > Clock::now()) return false;
+  if (oldest->second.LastActive() + options_.evict_after > Clock::now()) return false;
   Close(oldest);
   return true;
 }

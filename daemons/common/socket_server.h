@@ -37,8 +37,10 @@ struct SocketServerOptions {
   // What all connections together may hold in requests and answers; the one that would exceed it is
   // closed.
   std::size_t max_buffered_bytes = std::size_t{512} << 20;
-  // Connections beyond this number wait in the kernel until another one ends.
+  // Connections beyond this number wait in the kernel until another one ends, or has neither sent
+  // nor taken anything for `evict_after`: then it gives its place up.
   std::size_t max_connections = 256;
+  std::chrono::milliseconds evict_after = std::chrono::seconds(1);
   // How long a peer may take from the first byte of a request to its last, and for taking an answer
   // without accepting a single byte.
   std::chrono::milliseconds partial_timeout = std::chrono::seconds(30);
