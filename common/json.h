@@ -22,11 +22,15 @@ QUARRY_EXPORT bool fromString(Json::Value& out, const std::string& text);
 QUARRY_EXPORT std::string toString(const Json::Value& value);
 
 // Parses the whole file as fromString does. Returns false, and leaves `out` null, when the file is
-// not a regular file, cannot be read or is not JSON.
+// not a regular file (after links), is larger than 256 MiB, cannot be read or is not JSON. Errno is
+// set unless the text is the reason.
 QUARRY_EXPORT bool fromFile(Json::Value& out, const std::string& path);
 
 // Replaces the file by the text of `value`, whole and durably: readers see the old or the new text,
-// also after a power failure. Returns false, with errno set and the old file untouched, on failure.
+// also after a power failure. The file keeps its permissions, a symbolic link is followed; a new
+// file gets mode 0666 less the process's umask. Returns false, with errno set and the old file
+// untouched, on failure; only when the directory could not be synced at the end the new text is
+// there already.
 QUARRY_EXPORT bool toFile(const Json::Value& value, const std::string& path);
 
 // Whether `value` has members to ask for: an object, or null, which is an object without members.
@@ -64,12 +68,12 @@ Json::Value Vec2JsonArr(const std::vector<T>& values);
 template <typename T>
 std::vector<T> JsonArr2Vec(const Json::Value& array);
 
-#define QUARRY_JSON_TYPE(T)                                          \
-  template <>                                                        \
-  QUARRY_EXPORT bool isJsonType<T>(const Json::Value& value);        \
-  template <>                                                        \
-  QUARRY_EXPORT T asJsonType<T>(const Json::Value& value);           \
-  template <>                                                        \
+#define QUARRY_JSON_TYPE(T)                                                                    \
+  template <>                                                                                  \
+  QUARRY_EXPORT bool isJsonType<T>(const Json::Value& value);                                  \
+  template <>                                                                                  \
+  QUARRY_EXPORT T asJsonType<T>(const Json::Value& value);                                     \
+  template <>                                                                                  \
   QUARRY_EXPORT void GetJsonValue<T>(T & out, const Json::Value& json, const std::string& key, \
                                      bool required);
 QUARRY_JSON_TYPE(std::string)

@@ -17,7 +17,8 @@ class QUARRY_EXPORT LockFile {
  public:
   // Opens `path`, creating it with mode 0644 if it is missing, and locks it: exclusively, or shared
   // with other shared holders. Blocks for up to about a minute, in at most 64 attempts with pauses
-  // of 0 to 0.9 seconds. Throws Error 506 when the file cannot be opened or locked.
+  // of 0 to 0.9 seconds. Throws Error 506 when the file cannot be opened or locked. Leaves errno as
+  // it was when it succeeds.
   LockFile(const std::string& path, bool exclusive);
   ~LockFile();
   LockFile(const LockFile&) = delete;

@@ -14,6 +14,8 @@ const std::string& Root() {
   return root;
 }
 
-std::string RootedPath(const std::string& fixed_path) { return Root() + fixed_path; }
+std::string RootedPath(const std::string& fixed_path) {
+  return Root() + fixed_path;
+}
 
 }  // namespace quarry

@@ -6,6 +6,7 @@
 #include <sys/types.h>
 
 #include <string>
+#include <vector>
 
 #include "common/export.h"
 
@@ -17,10 +18,11 @@ class QUARRY_EXPORT SDKCredentials {
  public:
   // Remembers the current user. Throws Error 503 when it has no account.
   SDKCredentials();
-  // Remembers the current ids and becomes `user`, see AsUser. The destructor returns to `user`'s
-  // account by name, and then to the remembered ids if they still differ.
+  // Remembers the current ids and becomes `user`, see AsUser.
   explicit SDKCredentials(const std::string& user);
-  // Never throws; a failure is logged.
+  // Where the ids differ from those remembered: becomes the account of the constructor, by name,
+  // and then takes the remembered ids back if they still differ. Never throws; a failure is logged.
+  // Leaves errno as it was.
   ~SDKCredentials();
   SDKCredentials(const SDKCredentials&) = delete;
   SDKCredentials& operator=(const SDKCredentials&) = delete;
@@ -29,8 +31,13 @@ class QUARRY_EXPORT SDKCredentials {
   void AsUser(const std::string& user);
 
  private:
+  bool AreIdsRestored() const;
+  // Takes the remembered ids and groups back, as far as the system allows.
+  bool RestoreIds();
+
   uid_t euid_;
   gid_t egid_;
+  std::vector<gid_t> groups_;
   std::string username_;
 };
 
