@@ -1,0 +1,28 @@
+// The commands of the program. Each function adds one to the application; parsing a command line
+// then runs it. A command throws Problem or Error when it cannot do its work.
+
+#ifndef QUARRY_CLI_COMMANDS_COMMANDS_H_
+#define QUARRY_CLI_COMMANDS_COMMANDS_H_
+
+#include <CLI/CLI.hpp>
+
+namespace quarry::cli {
+
+void AddRunCommand(CLI::App& app);
+void AddShareCommand(CLI::App& app);
+void AddFolderCommand(CLI::App& app);
+void AddSearchCommand(CLI::App& app);
+void AddStatusCommand(CLI::App& app);
+void AddQueueCommand(CLI::App& app);
+void AddIndexCommand(CLI::App& app);
+void AddCompletionCommand(CLI::App& app);
+
+// A "--json" option of `command`. The reference stays valid as long as the application.
+const bool& JsonOption(CLI::App& command);
+
+// Ends the command's help with examples.
+void Examples(CLI::App& command, const std::string& lines);
+
+}  // namespace quarry::cli
+
+#endif  // QUARRY_CLI_COMMANDS_COMMANDS_H_

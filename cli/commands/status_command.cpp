@@ -1,0 +1,99 @@
+#include <ctime>
+#include <iostream>
+
+#include "cli/commands/commands.h"
+#include "cli/folder_status.h"
+#include "cli/folders.h"
+#include "cli/output.h"
+#include "cli/problem.h"
+#include "cli/system.h"
+#include "daemons/common/client.h"
+#include "fileindex/config/status_mgr.h"
+
+namespace quarry::cli {
+namespace {
+
+Json::Value Services() {
+  if (!daemon::IsListening(SupervisorSocket())) return Json::Value(Json::arrayValue);
+  try {
+    return AskSupervisor("status", Json::Value(Json::objectValue))["services"];
+  } catch (const Problem&) {
+    return Json::Value(Json::arrayValue);
+  }
+}
+
+Json::Value Folders(const Json::Value& report) {
+  Json::Value list(Json::arrayValue);
+  for (const auto& folder : AllFolders()) list.append(FolderStatus(*folder, report));
+  return list;
+}
+
+Json::Value Collect() {
+  Json::Value status;
+  status["resume_time"] = Json::Int64{fileindex::StatusMgr().GetPauseInfo()};
+  status["running"] = ServicesAreManaged();
+  status["services"] = Services();
+  status["folders"] = Folders(IndexDaemonReport());
+  return status;
+}
+
+void PrintPause(std::int64_t resume_time) {
+  if (resume_time == 0) {
+    std::cout << "Indexing is paused.\n";
+  } else if (resume_time > std::time(nullptr)) {
+    std::cout << "Indexing is paused until " << HumanTime(resume_time) << ".\n";
+  }
+}
+
+void PrintServices(const Json::Value& status) {
+  if (!status["running"].asBool()) {
+    std::cout << "The system is not running. Start it with: quarry run\n";
+  }
+  for (const Json::Value& service : status["services"]) {
+    if (service["state"] != "restarting" && service["restarts"].asUInt() == 0) continue;
+    std::cout << service["name"].asString() << " is " << service["state"].asString()
+              << ", started again " << service["restarts"].asUInt()
+              << " times (last: " << Printable(service["last_end"].asString()) << ")\n";
+  }
+}
+
+std::string Rate(const Json::Value& folder) {
+  const double rate = folder["rate"].asDouble();
+  return rate > 0 ? std::to_string(static_cast<long long>(rate + 0.5)) + "/s" : "-";
+}
+
+void Print(const Json::Value& status) {
+  PrintServices(status);
+  PrintPause(status["resume_time"].asInt64());
+  if (status["folders"].empty()) {
+    std::cout << "No folder is indexed.\n";
+    return;
+  }
+  std::vector<std::vector<std::string>> rows{
+      {"FOLDER", "WAITING", "DONE", "FAILED", "RATE", "STATE"}};
+  for (const Json::Value& folder : status["folders"]) {
+    rows.push_back({Printable(folder["path"].asString()), folder["waiting"].asString(),
+                    folder["done"].asString(), folder["failed"].asString(), Rate(folder),
+                    Printable(StateInWords(folder))});
+  }
+  PrintTable(std::cout, rows);
+}
+
+}  // namespace
+
+void AddStatusCommand(CLI::App& app) {
+  CLI::App* command =
+      app.add_subcommand("status", "Show per folder what is indexed, what waits, and how fast");
+  const bool& json = JsonOption(*command);
+  Examples(*command, "  quarry status\n  quarry status --json");
+  command->callback([&json] {
+    const Json::Value status = Collect();
+    if (json) {
+      PrintJson(std::cout, status);
+    } else {
+      Print(status);
+    }
+  });
+}
+
+}  // namespace quarry::cli

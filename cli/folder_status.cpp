@@ -1,0 +1,70 @@
+#include "cli/folder_status.h"
+
+#include "cli/problem.h"
+#include "cli/system.h"
+#include "common/json.h"
+#include "daemons/common/client.h"
+
+namespace quarry::cli {
+namespace {
+
+// The daemon's numbers for the folder, zero where it has none.
+Json::Value Numbers(const std::string& path, const Json::Value& report) {
+  Json::Value numbers(Json::objectValue);
+  for (const char* key : {"waiting", "done", "failed"}) numbers[key] = 0;
+  numbers["rate"] = 0.0;
+  for (const char* key : {"state", "current", "last_error"}) numbers[key] = "";
+  for (const Json::Value& share : report["shares"]) {
+    for (const Json::Value& folder : share["folders"]) {
+      if (folder["path"] == path) JsonApplyChanges(numbers, folder);
+    }
+  }
+  return numbers;
+}
+
+std::string State(const fileindex::Folder& folder, const std::string& daemon_state) {
+  if (folder.IsPaused()) return "paused";
+  Json::Value status;
+  folder.GetStatus(status);
+  const std::string text = status["text"].asString();
+  if (text == "error") return status["desc"].asString();
+  // While work is queued the daemon knows better what becomes of it.
+  return text == "processing" && daemon_state == "retrying" ? daemon_state : text;
+}
+
+}  // namespace
+
+Json::Value IndexDaemonReport() {
+  if (!daemon::IsListening(IndexDaemonSocket())) return {};
+  try {
+    return AskIndexDaemon("status", Json::Value());
+  } catch (const Problem&) {
+    return {};  // it stopped in between, or is being started again
+  }
+}
+
+Json::Value FolderStatus(const fileindex::Folder& folder, const Json::Value& report) {
+  Json::Value status = Numbers(folder.GetPath(), report);
+  status["path"] = folder.GetPath();
+  try {
+    status["state"] = State(folder, status["state"].asString());
+  } catch (const Error& error) {
+    status["state"] = "error";
+    status["last_error"] = Explain(error);
+  }
+  return status;
+}
+
+std::string StateInWords(const Json::Value& status) {
+  const std::string state = status["state"].asString();
+  const std::string error = status["last_error"].asString();
+  if (state == "invalid_path")
+    return "cannot be indexed any longer (moved, unmounted or read-only)";
+  if (state == "need_reindex") return "needs a reindex";
+  if (state == "finished") return "up to date";
+  if (state == "processing") return "indexing";
+  if (state == "retrying") return "will try again: " + error;
+  return state == "error" ? "error: " + error : state;
+}
+
+}  // namespace quarry::cli

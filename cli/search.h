@@ -1,0 +1,31 @@
+// Asking the engine, and showing what it found.
+
+#ifndef QUARRY_CLI_SEARCH_H_
+#define QUARRY_CLI_SEARCH_H_
+
+#include <json/json.h>
+
+#include <iosfwd>
+#include <string>
+
+namespace quarry::cli {
+
+struct SearchRequest {
+  std::string query;
+  unsigned int offset = 0;
+  unsigned int limit = 10;
+};
+
+// The engine's answer: {"total", "hits": [...]}, over all indexed shares. Throws Problem or Error.
+Json::Value Search(const SearchRequest& request);
+
+// The hits for a person, numbered from `offset` + 1; matches are marked where `colours` says so.
+void PrintHits(std::ostream& out, const Json::Value& found, unsigned int offset, bool colours);
+
+// Asks for words and shows hits until the end of the input. A search that fails is reported and the
+// next one asked for.
+void SearchPrompt();
+
+}  // namespace quarry::cli
+
+#endif  // QUARRY_CLI_SEARCH_H_

@@ -1,0 +1,37 @@
+// The running system as the command line sees it.
+
+#ifndef QUARRY_CLI_SYSTEM_H_
+#define QUARRY_CLI_SYSTEM_H_
+
+#include <json/json.h>
+
+#include <string>
+
+namespace quarry::cli {
+
+// Where the supervisor and the daemons listen.
+std::string SupervisorSocket();
+std::string EngineSocket();
+std::string IndexDaemonSocket();
+std::string ExtractorSocket();
+
+// One request to a daemon. Returns the answer's "data". Throws Problem when the daemon does not run
+// or does not answer in time, and Error with the daemon's own code and message when it refuses.
+Json::Value AskSupervisor(const std::string& command, const Json::Value& data);
+Json::Value AskEngine(const std::string& command, const Json::Value& data);
+Json::Value AskIndexDaemon(const std::string& command, const Json::Value& data);
+
+// Whether somebody keeps the services running: the supervisor, or systemd for a system without a
+// root of its own.
+bool ServicesAreManaged();
+
+// Throws Problem, naming what does not run, unless folders can be changed now.
+void RequireRunningSystem();
+
+// The supervisor's work, in the foreground until it is told to stop. Throws Problem or Error when
+// it cannot begin.
+void RunSystem();
+
+}  // namespace quarry::cli
+
+#endif  // QUARRY_CLI_SYSTEM_H_

@@ -1,0 +1,109 @@
+#include "tests/system/system_under_test.h"
+
+#include <gtest/gtest.h>
+
+#include <csignal>
+#include <filesystem>
+
+#include "cli/system.h"
+#include "common/file_util.h"
+#include "common/json.h"
+#include "daemons/common/client.h"
+#include "tests/support/files.h"
+#include "tests/support/root.h"
+
+namespace quarry::test {
+namespace {
+
+constexpr int kPatience = 60'000;
+
+std::string Program() {
+  return Dirname(Dirname(RealPath("/proc/self/exe"))) + "/bin/quarry";
+}
+
+}  // namespace
+
+SystemUnderTest::SystemUnderTest() {
+  ResetTestRoot();
+}
+
+void SystemUnderTest::Start() {
+  supervisor_.emplace(Program(), std::vector<std::string>{"run"}, scratch_ / "run.log");
+  ASSERT_TRUE(WaitUntil([] {
+    return daemon::IsListening(cli::SupervisorSocket()) && daemon::IsListening(cli::EngineSocket());
+  })) << ReadFile(scratch_ / "run.log");
+}
+
+void SystemUnderTest::Stop() {
+  supervisor_->Signal(SIGTERM);
+  EXPECT_TRUE(supervisor_->WaitEnded(kPatience));
+  EXPECT_EQ(supervisor_->Ended().value_or("still running"), "exit code 0");
+  supervisor_.reset();
+}
+
+void SystemUnderTest::Kill() {
+  supervisor_->Signal(SIGKILL);
+  EXPECT_TRUE(supervisor_->WaitEnded(kPatience));
+  supervisor_.reset();
+}
+
+Ran SystemUnderTest::Quarry(const std::vector<std::string>& arguments) const {
+  const std::string output = scratch_ / "output";
+  Unlink(output);
+  cli::Child child(Program(), arguments, output);
+  if (!child.WaitEnded(kPatience)) return {ReadFile(output), "does not end"};
+  return {ReadFile(output), *child.Ended()};
+}
+
+Json::Value SystemUnderTest::QuarryJson(std::vector<std::string> arguments) const {
+  arguments.emplace_back("--json");
+  const Ran ran = Quarry(arguments);
+  EXPECT_EQ(ran.end, "exit code 0") << ran.output;
+  Json::Value value;
+  EXPECT_TRUE(fromString(value, ran.output)) << ran.output;
+  return value;
+}
+
+bool SystemUnderTest::WaitUntilIdle() const {
+  return WaitUntil(
+      [this] {
+        const Ran ran = Quarry({"folder", "list", "--status", "--json"});
+        Json::Value list;
+        if (!fromString(list, ran.output) || ran.end != "exit code 0") return false;
+        for (const Json::Value& folder : list["folder"]) {
+          if (folder["additional"]["status"]["text"] != "finished") return false;
+        }
+        return true;
+      },
+      std::chrono::milliseconds(kPatience));
+}
+
+std::multiset<std::string> SystemUnderTest::Documents(const std::string& share_path) const {
+  Json::Value data;
+  data["id"] = "fileindex_" + Basename(share_path);
+  data["query"]["qsl"]["prefix"]["TARNMDPath"] = Dirname(share_path) + "/";
+  data["query"]["load_field"].append("TARNMDPath");
+  std::multiset<std::string> paths;
+  for (const Json::Value& document : cli::AskEngine("document_get_by_query", data)) {
+    paths.insert(document["TARNMDPath"].asString());
+  }
+  return paths;
+}
+
+pid_t SystemUnderTest::Pid(const std::string& service) const {
+  const Json::Value status = cli::AskSupervisor("status", Json::Value(Json::objectValue));
+  for (const Json::Value& entry : status["services"]) {
+    if (entry["name"] == service) return entry["pid"].asInt();
+  }
+  return 0;
+}
+
+std::multiset<std::string> Listing(const std::string& top) {
+  std::multiset<std::string> paths{top};
+  for (const auto& entry : std::filesystem::recursive_directory_iterator(top)) {
+    paths.insert(entry.path());
+  }
+  return paths;
+}
+
+}  // namespace quarry::test

@@ -1,0 +1,62 @@
+// A whole private system for one test: the real programs below the test's own root.
+
+#ifndef QUARRY_TESTS_SYSTEM_SYSTEM_UNDER_TEST_H_
+#define QUARRY_TESTS_SYSTEM_SYSTEM_UNDER_TEST_H_
+
+#include <json/json.h>
+
+#include <optional>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "cli/supervisor/child.h"
+#include "tests/support/temp_dir.h"
+
+namespace quarry::test {
+
+struct Ran {
+  std::string output;  // standard output and error
+  std::string end;     // "exit code 0"
+};
+
+class SystemUnderTest {
+ public:
+  // An empty root; nothing runs yet.
+  SystemUnderTest();
+
+  // Starts "quarry run" and waits until the engine listens.
+  void Start();
+  // Asks it to stop and waits until it has. Kill() does not ask.
+  void Stop();
+  void Kill();
+
+  // Runs quarry to its end, at most a minute.
+  Ran Quarry(const std::vector<std::string>& arguments) const;
+  // The same with --json; the document it printed.
+  Json::Value QuarryJson(std::vector<std::string> arguments) const;
+
+  // Waits until no folder has anything waiting, at most a minute, and returns whether that came.
+  bool WaitUntilIdle() const;
+
+  // The paths of all documents in the index of the share, each as often as it is there.
+  std::multiset<std::string> Documents(const std::string& share_path) const;
+
+  // The process of a service, 0 when it does not run.
+  pid_t Pid(const std::string& service) const;
+
+  // A directory whose files tests index; it lies outside the root.
+  const std::string& Files() const { return files_.path(); }
+
+ private:
+  TempDir files_;
+  TempDir scratch_;
+  std::optional<cli::Child> supervisor_;
+};
+
+// All directories and regular files below `top`, and `top` itself.
+std::multiset<std::string> Listing(const std::string& top);
+
+}  // namespace quarry::test
+
+#endif  // QUARRY_TESTS_SYSTEM_SYSTEM_UNDER_TEST_H_
