@@ -1,0 +1,106 @@
+#include "daemons/fileindexd/command_handler.h"
+
+#include <unistd.h>
+
+#include <functional>
+#include <map>
+
+#include "common/error.h"
+#include "common/json.h"
+
+namespace quarry::fileindexd {
+namespace {
+
+constexpr int kProtocolVersion = 1;
+
+std::string ShareName(const Json::Value& data) {
+  std::string share;
+  GetJsonValue<std::string>(share, data, "share_name", true);
+  if (share.empty()) throw Error(kErrorBadParameter, "Missing share_name");
+  return share;
+}
+
+Json::Value SettingChanged(CommandTarget& target, const Json::Value& data) {
+  bool is_upsert = false;
+  GetJsonValue<bool>(is_upsert, data, "is_upsert", true);
+  target.SettingChanged(ShareName(data), is_upsert);
+  return Json::Value();
+}
+
+Json::Value Pause(CommandTarget& target, const Json::Value& data) {
+  long long resume_time = 0;
+  GetJsonValue<long long>(resume_time, data, "resume_time", true);
+  target.Pause(resume_time);
+  return Json::Value();
+}
+
+Json::Value Resume(CommandTarget& target, const Json::Value&) {
+  target.Resume();
+  return Json::Value();
+}
+
+Json::Value CreateWorker(CommandTarget& target, const Json::Value& data) {
+  target.CreateWorker(ShareName(data));
+  return Json::Value();
+}
+
+Json::Value DeleteWorker(CommandTarget& target, const Json::Value& data) {
+  target.DeleteWorker(ShareName(data));
+  return Json::Value();
+}
+
+Json::Value Status(CommandTarget& target, const Json::Value&) {
+  Json::Value status = target.Status();
+  status["version"] = kProtocolVersion;
+  return status;
+}
+
+Json::Value Ping(CommandTarget&, const Json::Value&) {
+  Json::Value pong;
+  pong["version"] = kProtocolVersion;
+  pong["pid"] = getpid();
+  return pong;
+}
+
+using Command = Json::Value (*)(CommandTarget& target, const Json::Value& data);
+
+const std::map<std::string, Command>& Commands() {
+  static const std::map<std::string, Command> commands = {
+      {"notify_setting_changed", SettingChanged},
+      {"pause", Pause},
+      {"resume", Resume},
+      {"worker_create", CreateWorker},
+      {"worker_delete", DeleteWorker},
+      {"status", Status},
+      {"ping", Ping},
+  };
+  return commands;
+}
+
+Json::Value Run(CommandTarget& target, const std::string& text) {
+  Json::Value request;
+  if (!fromString(request, text)) throw Error(kErrorBadParameter, "The request is not JSON");
+  std::string type;
+  GetJsonValue<std::string>(type, request, "type", true);
+  const auto command = Commands().find(type);
+  if (command == Commands().end()) throw Error(kErrorBadParameter, "Unknown type: " + type);
+  return command->second(target, request.isMember("data") ? request["data"] : Json::Value());
+}
+
+}  // namespace
+
+std::string HandleCommand(CommandTarget& target, const std::string& request) {
+  Json::Value answer;
+  try {
+    const Json::Value data = Run(target, request);
+    answer["success"] = true;
+    if (!data.isNull()) answer["data"] = data;
+  } catch (const Error& error) {
+    answer["success"] = false;
+    answer["error"]["code"] = static_cast<int>(error.code());
+    answer["error"]["msg"] = error.reason();
+  }
+  return toString(answer);
+}
+
+}  // namespace quarry::fileindexd

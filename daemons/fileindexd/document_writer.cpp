@@ -1,0 +1,153 @@
+#include "daemons/fileindexd/document_writer.h"
+
+#include <utility>
+
+#include "daemons/common/log.h"
+#include "daemons/fileindexd/failure.h"
+
+namespace quarry::fileindexd {
+namespace {
+
+// A reader of files that was started anew meanwhile does better the second time.
+constexpr int kAttempts = 2;
+
+}  // namespace
+
+DocumentWriter::DocumentWriter(Index& index, FileSystem& files, TaskLane& lane, Progress& progress,
+                               RemovalGuard may_remove)
+    : index_(index),
+      files_(files),
+      lane_(lane),
+      progress_(progress),
+      may_remove_(std::move(may_remove)) {}
+
+void DocumentWriter::Submit(const std::string& path, std::function<void()> change) {
+  progress_.AddWaiting(path);
+  lane_.Submit(path, [this, path, change = std::move(change)] {
+    progress_.Begin(path);
+    change();
+    progress_.TakeWaiting(path);
+  });
+}
+
+void DocumentWriter::Upsert(const std::string& path, bool need_meta) {
+  Submit(path, [this, path, need_meta] { UpsertNow(path, need_meta); });
+}
+
+void DocumentWriter::ReplaceDirectory(const std::string& path, bool need_meta) {
+  may_remove_();
+  Submit(path, [this, path, need_meta] {
+    index_.DeleteBelow(path);
+    UpsertNow(path, need_meta);
+  });
+}
+
+void DocumentWriter::SetAttributes(const std::string& path) {
+  Submit(path, [this, path] { SetAttributesNow(path); });
+}
+
+void DocumentWriter::Remove(const std::string& path) {
+  may_remove_();
+  Submit(path, [this, path] {
+    index_.Delete(path);
+    progress_.Done(path);
+  });
+}
+
+void DocumentWriter::RemoveTree(const std::string& path) {
+  may_remove_();
+  Submit(path, [this, path] { RemoveTreeNow(path); });
+}
+
+void DocumentWriter::Rename(const std::string& new_path, const std::string& old_path) {
+  lane_.Drain();
+  progress_.Begin(new_path);
+  index_.DeleteBelow(new_path);
+  index_.Delete(new_path);
+  index_.Rename(new_path, old_path);
+  progress_.Done(new_path);
+}
+
+void DocumentWriter::UpsertNow(const std::string& path, bool need_meta) {
+  std::optional<Error> failure = Attempt(path, [&] { index_.Upsert(path, need_meta); });
+  if (failure && need_meta && !IsGone(path)) {
+    CountFailure(path, *failure);
+    // At least its name is found.
+    failure = Attempt(path, [&] { index_.Upsert(path, false); });
+    if (!failure) return;
+  }
+  if (!failure) {
+    progress_.Done(path);
+  } else if (IsGone(path)) {
+    RemoveTreeNow(path);
+  } else if (!need_meta) {
+    CountFailure(path, *failure);
+  }
+}
+
+void DocumentWriter::SetAttributesNow(const std::string& path) {
+  const std::optional<Error> failure = Attempt(path, [&] { index_.SetAttributes(path); });
+  if (!failure) {
+    progress_.Done(path);
+  } else if (IsGone(path)) {
+    RemoveTreeNow(path);
+  } else {
+    CountFailure(path, *failure);
+  }
+}
+
+// The document itself goes last: as long as it is there, a walk that begins anew finds the way to
+// what lies below it.
+void DocumentWriter::RemoveTreeNow(const std::string& path) {
+  may_remove_();
+  index_.DeleteBelow(path);
+  index_.Delete(path);
+  progress_.Done(path);
+}
+
+std::optional<Error> DocumentWriter::Attempt(const std::string& path,
+                                             const std::function<void()>& change) {
+  std::optional<Error> failure;
+  for (int i = 0; i < kAttempts; ++i) {
+    try {
+      change();
+      return std::nullopt;
+    } catch (const Error& error) {
+      RequireOwnFault(error);
+      failure = error;
+    }
+    if (IsGone(path)) break;
+  }
+  return failure;
+}
+
+// Throws unless the failure is due to the one document that was asked for.
+void DocumentWriter::RequireOwnFault(const Error& error) {
+  switch (Classify(error)) {
+    case Failure::kDocument:
+      if (error.code() == kErrorParseDocument && !index_.CanRead()) {
+        throw Error(kErrorParseDocument,
+                    "The content extractor (tarncontentextractd) is not running");
+      }
+      return;
+    case Failure::kChannel:
+      index_.Epoch();
+      return;
+    case Failure::kIndexMissing:
+    case Failure::kPass:
+      throw error;
+  }
+}
+
+bool DocumentWriter::IsGone(const std::string& path) {
+  const PlaceKind kind = files_.Look(path, path).kind;
+  return kind == PlaceKind::kAbsent || kind == PlaceKind::kOther;
+}
+
+void DocumentWriter::CountFailure(const std::string& path, const Error& error) {
+  const std::string text = path + ": " + Describe(error);
+  progress_.Failed(path, text);
+  daemon::LogWarning("Cannot index " + text);
+}
+
+}  // namespace quarry::fileindexd

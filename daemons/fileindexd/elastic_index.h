@@ -1,0 +1,50 @@
+// The index of a share in the search engine.
+
+#ifndef QUARRY_DAEMONS_FILEINDEXD_ELASTIC_INDEX_H_
+#define QUARRY_DAEMONS_FILEINDEXD_ELASTIC_INDEX_H_
+
+#include <json/json.h>
+
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "daemons/fileindexd/index.h"
+
+namespace quarry::fileindexd {
+
+// Asks an engine that does not run once and fails, instead of waiting for it: the worker does that.
+// An engine that says it is busy is asked again for as long as it takes.
+class ElasticIndex : public Index {
+ public:
+  explicit ElasticIndex(const std::string& share);
+
+  std::string Epoch() override;
+  void Create() override;
+  void Commit() override;
+  std::uint64_t Count() override;
+  void Upsert(const std::string& path, bool need_meta) override;
+  void SetAttributes(const std::string& path) override;
+  void Delete(const std::string& path) override;
+  void DeleteBelow(const std::string& dir) override;
+  void Rename(const std::string& new_path, const std::string& old_path) override;
+  std::optional<Document> Find(const std::string& path) override;
+  std::vector<Document> Children(const std::string& dir) override;
+  std::vector<std::string> PathsBelow(const std::string& dir) override;
+  bool CanRead() override;
+
+ private:
+  Json::Value EngineStatus();
+  std::vector<Document> Query(const char* field, const std::string& value);
+
+  const std::string share_;
+  const std::string id_;
+};
+
+// Where the engine and the reader of files listen.
+const std::string& EngineSocketPath();
+const std::string& ExtractorSocketPath();
+
+}  // namespace quarry::fileindexd
+
+#endif  // QUARRY_DAEMONS_FILEINDEXD_ELASTIC_INDEX_H_

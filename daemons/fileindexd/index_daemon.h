@@ -1,0 +1,64 @@
+// The daemon as a whole.
+
+#ifndef QUARRY_DAEMONS_FILEINDEXD_INDEX_DAEMON_H_
+#define QUARRY_DAEMONS_FILEINDEXD_INDEX_DAEMON_H_
+
+#include <chrono>
+#include <cstddef>
+#include <memory>
+#include <set>
+#include <string>
+
+#include "daemons/common/socket_server.h"
+#include "daemons/fileindexd/command_handler.h"
+#include "daemons/fileindexd/slots.h"
+#include "daemons/fileindexd/state_files.h"
+#include "daemons/fileindexd/worker_table.h"
+
+namespace quarry::fileindexd {
+
+// Where the daemon listens.
+const std::string& CommandSocketPath();
+
+// Keeps one worker per share with indexed folders and answers commands. One thread.
+class IndexDaemon : private CommandTarget {
+ public:
+  // `threads` documents are in work at a time. Listens at once; workers are started by Step().
+  // Throws Error 502 when somebody listens there already.
+  explicit IndexDaemon(std::size_t threads);
+
+  // Waits up to `timeout_ms` for a command, answers what has come, and follows what has changed.
+  void Step(int timeout_ms);
+
+  // Step() returns as soon as `fd` is readable.
+  void WakeOn(int fd) { server_->WakeOn(fd); }
+
+  // Takes no more commands and stops the workers. Returns whether all have ended in that time; the
+  // socket file is gone in any case. Nothing else may be called afterwards.
+  bool Stop(std::chrono::milliseconds time);
+
+ private:
+  void SettingChanged(const std::string& share, bool is_upsert) override;
+  void Pause(long long resume_time) override;
+  void Resume() override;
+  void CreateWorker(const std::string& share) override;
+  void DeleteWorker(const std::string& share) override;
+  Json::Value Status() const override;
+
+  void FollowFolders();
+  void FollowStatus();
+  void ApplyPause();
+
+  const std::size_t threads_;
+  Slots slots_;
+  FileWatch folders_watch_;
+  FileWatch status_watch_;
+  PauseState pause_;
+  bool paused_ = false;
+  WorkerTable workers_;
+  std::unique_ptr<daemon::SocketServer> server_;
+};
+
+}  // namespace quarry::fileindexd
+
+#endif  // QUARRY_DAEMONS_FILEINDEXD_INDEX_DAEMON_H_

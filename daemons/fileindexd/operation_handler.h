@@ -1,0 +1,53 @@
+// What is done about each kind of pending operation.
+
+#ifndef QUARRY_DAEMONS_FILEINDEXD_OPERATION_HANDLER_H_
+#define QUARRY_DAEMONS_FILEINDEXD_OPERATION_HANDLER_H_
+
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "daemons/fileindexd/reconciler.h"
+#include "fileindex/queue/optree.h"
+
+namespace quarry::fileindexd {
+
+// An operation as a pass keeps it.
+struct Operation {
+  fileindex::FileIndexOP kind = fileindex::OP_NONE;
+  std::string path;
+  std::string old_path;  // of a rename
+};
+
+// An operation only says where to look: what is done follows from what is there now. Therefore an
+// operation may be done late, or again, without harm. One thread; throws as the Reconciler does.
+class OperationHandler {
+ public:
+  OperationHandler(const PassTools& tools, const std::string& share_root);
+
+  // Hands what is to be done to the lane.
+  void Handle(const Operation& operation);
+
+  // Brings the whole share in line with the disk, documents of no folder included.
+  void HandleFullReindex();
+
+  // After HandleFullReindex and a commit: removes what that could not find, if there is anything.
+  // Returns whether there was.
+  bool RemoveOrphans();
+
+ private:
+  void HandleIndex(const std::string& path);
+  void HandleAttributes(const std::string& path);
+  void HandleRename(const std::string& new_path, const std::string& old_path);
+  std::vector<std::pair<std::string, std::string>> RenameRoots(const std::string& new_path,
+                                                               const std::string& old_path) const;
+  void MoveDocuments(const std::string& new_path, const std::string& old_path);
+
+  PassTools tools_;
+  Reconciler reconciler_;
+  const std::string share_root_;
+};
+
+}  // namespace quarry::fileindexd
+
+#endif  // QUARRY_DAEMONS_FILEINDEXD_OPERATION_HANDLER_H_

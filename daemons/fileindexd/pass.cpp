@@ -1,0 +1,93 @@
+#include "daemons/fileindexd/pass.h"
+
+#include <algorithm>
+#include <memory>
+
+#include "fileindex/queue/queue_mgr.h"
+
+namespace quarry::fileindexd {
+namespace {
+
+using fileindex::OP;
+using fileindex::QueueMgr;
+
+using Operations = std::vector<std::shared_ptr<OP>>;
+
+Operations TakeOperations(QueueMgr& queue) {
+  Operations operations;
+  queue.ProcessOP([&](std::shared_ptr<OP> op) { operations.push_back(op); }, true);
+  return operations;
+}
+
+bool IsFullReindex(const std::shared_ptr<OP>& op) {
+  return op->op == fileindex::OP_FULL_REINDEX;
+}
+
+bool IsWalk(const std::shared_ptr<OP>& op) {
+  return op->op == fileindex::OP_REINDEX || op->op == fileindex::OP_UPDATE_CFG || IsFullReindex(op);
+}
+
+class Pass {
+ public:
+  explicit Pass(const PassSetup& setup)
+      : setup_(setup),
+        lane_(setup.threads, setup.slots),
+        writer_(setup.index, setup.survey.files(), lane_, setup.progress, [this] { CheckRoot(); }),
+        handler_({setup.index, setup.survey, writer_, lane_, setup.gate, setup.progress},
+                 setup.share_root) {}
+  // Tasks still use what is destroyed before the lane.
+  ~Pass() { lane_.End(); }
+  Pass(const Pass&) = delete;
+  Pass& operator=(const Pass&) = delete;
+
+  PassResult Run(bool full) {
+    const std::string epoch = setup_.index.Epoch();
+    QueueMgr queue(setup_.queue_path);
+    Operations operations = TakeOperations(queue);
+    full = full || std::any_of(operations.begin(), operations.end(), IsFullReindex);
+    // Comparing the whole share includes all smaller walks.
+    if (full) std::erase_if(operations, IsWalk);
+    Do(operations);
+    if (full) handler_.HandleFullReindex();
+    lane_.Drain();
+    setup_.index.Commit();
+    if (full && handler_.RemoveOrphans()) {
+      lane_.Drain();
+      setup_.index.Commit();
+    }
+    if (setup_.index.Epoch() != epoch) return PassResult::kAgain;
+    queue.DeleteTmp();
+    return PassResult::kDone;
+  }
+
+ private:
+  void Do(const Operations& operations) {
+    for (const auto& op : operations) setup_.progress.AddWaiting(op->node->GetPath());
+    for (const auto& op : operations) {
+      setup_.gate.Pass();
+      const Operation operation{op->op, op->node->GetPath(), op->src};
+      setup_.progress.Begin(operation.path);
+      handler_.Handle(operation);
+      setup_.progress.TakeWaiting(operation.path);
+    }
+  }
+
+  // A disk that is gone looks as if all its files had been deleted.
+  void CheckRoot() const {
+    if (setup_.survey.files().Identify(setup_.share_root) == setup_.root_identity) return;
+    throw Error(kErrorSystem, "The share's directory " + setup_.share_root + " is gone");
+  }
+
+  const PassSetup& setup_;
+  TaskLane lane_;
+  DocumentWriter writer_;
+  OperationHandler handler_;
+};
+
+}  // namespace
+
+PassResult RunPass(const PassSetup& setup, bool full) {
+  return Pass(setup).Run(full);
+}
+
+}  // namespace quarry::fileindexd

@@ -1,0 +1,173 @@
+#include "daemons/fileindexd/worker.h"
+
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <exception>
+#include <utility>
+
+#include "common/error.h"
+#include "daemons/common/log.h"
+#include "daemons/fileindexd/failure.h"
+
+namespace quarry::fileindexd {
+namespace {
+
+using std::chrono::milliseconds;
+using std::chrono::seconds;
+
+constexpr milliseconds kPoll(200);
+constexpr milliseconds kFirstBackoff(500);
+constexpr milliseconds kLongestBackoff = seconds(60);
+
+// A queue that is there but empty was only touched in order to lock it.
+bool HasLines(const std::string& path) {
+  struct stat status {};
+  return stat(path.c_str(), &status) == 0 && status.st_size > 0;
+}
+
+bool Exists(const std::string& path) {
+  struct stat status {};
+  return stat(path.c_str(), &status) == 0;
+}
+
+bool HasNewlyActive(const FolderRules& before, const FolderRules& now) {
+  return std::any_of(now.folders().begin(), now.folders().end(), [&](const auto& entry) {
+    const FolderRule* old = before.At(entry.first);
+    return !entry.second.paused && old != nullptr && old->paused;
+  });
+}
+
+}  // namespace
+
+Worker::Worker(const std::string& share, WorkerParts parts)
+    : share_(share),
+      parts_(std::move(parts)),
+      progress_(share),
+      survey_(
+          *parts_.files, [this] { return CurrentRules(); },
+          [this](const std::string& path) { return parts_.host->IsInRecycleBin(path); }) {}
+
+void Worker::Reload() {
+  reload_ = true;
+  gate_.Wake();
+}
+
+void Worker::Run() {
+  daemon::LogInfo("Worker of share " + share_ + " started");
+  // What has its worker started queues its event only now: one walk can do for both.
+  gate_.WaitFor(kPoll);
+  while (!gate_.Stopping()) gate_.WaitFor(Step());
+  daemon::LogInfo("Worker of share " + share_ + " stopped");
+}
+
+Worker::Milliseconds Worker::Step() {
+  if (gate_.Stopping()) return milliseconds(0);
+  try {
+    RefreshLayout();
+    ClaimReindex();
+    if (gate_.Paused() || layout_.rules->AllPaused()) return kPoll;
+    if (!HasWork()) {
+      if (last_error_.empty()) progress_.SetState(WorkState::kIdle);
+      return kPoll;
+    }
+    progress_.SetState(WorkState::kIndexing);
+    RunOnePass();
+    return milliseconds(0);
+  } catch (const Interrupted&) {
+    return milliseconds(0);
+  } catch (const Error& error) {
+    const Milliseconds wait = Fail(Describe(error));
+    HandleMissingIndex(error);
+    return wait;
+  } catch (const std::exception& error) {
+    return Fail(error.what());
+  }
+}
+
+// The folder list is loaded when it may have changed, in the middle of a pass too.
+bool Worker::RefreshLayout() {
+  if (!reload_.exchange(false)) return false;
+  try {
+    ShareLayout layout = parts_.host->Load();
+    // While a folder was paused nobody watched it.
+    if (layout_.rules && HasNewlyActive(*layout_.rules, *layout.rules)) compare_all_ = true;
+    layout_ = std::move(layout);
+    progress_.SetFolders(layout_.rules);
+  } catch (...) {
+    reload_ = true;
+    throw;
+  }
+  return true;
+}
+
+Survey::Rules Worker::CurrentRules() {
+  if (reload_) RefreshLayout();
+  return layout_.rules;
+}
+
+// A share that is marked as needing a reindex gets it; the mark goes first, so that one that is set
+// meanwhile is not lost.
+void Worker::ClaimReindex() {
+  if (!check_status_.exchange(false)) return;
+  try {
+    if (!parts_.host->NeedsReindex()) return;
+    compare_all_ = true;
+    parts_.host->ClearNeedsReindex();
+  } catch (...) {
+    check_status_ = true;
+    throw;
+  }
+}
+
+bool Worker::HasWork() {
+  return compare_all_ || Exists(layout_.queue_path + ".tmp") || HasLines(layout_.queue_path);
+}
+
+void Worker::RunOnePass() {
+  const Identity root = parts_.files->Identify(layout_.root);
+  CheckShareIsThere(root);
+  const PassSetup setup{layout_.queue_path, layout_.root,  *parts_.index,  survey_, gate_,
+                        progress_,          *parts_.slots, parts_.threads, root};
+  if (RunPass(setup, compare_all_) == PassResult::kAgain) {
+    daemon::LogWarning("The search engine was started anew while share " + share_ +
+                       " was indexed; doing it again");
+    return;
+  }
+  compare_all_ = false;
+  backoff_ = milliseconds(0);
+  if (!last_error_.empty()) daemon::LogInfo("Share " + share_ + " is indexed again");
+  last_error_.clear();
+  progress_.EndPass("");
+}
+
+// All documents of a disk that is unplugged would be deleted otherwise.
+void Worker::CheckShareIsThere(const Identity& root) {
+  if (!root.exists || (was_mounted_ && !root.mount_root)) {
+    throw Error(kErrorSystem, "The share's directory " + layout_.root + " is not there");
+  }
+  was_mounted_ = root.mount_root;
+}
+
+Worker::Milliseconds Worker::Fail(const std::string& error) {
+  progress_.SetState(WorkState::kRetrying);
+  progress_.EndPass(error);
+  if (error != last_error_)
+    daemon::LogError("Share " + share_ + " cannot be indexed now: " + error);
+  last_error_ = error;
+  backoff_ = std::clamp(2 * backoff_, kFirstBackoff, kLongestBackoff);
+  return backoff_;
+}
+
+void Worker::HandleMissingIndex(const Error& error) {
+  if (Classify(error) != Failure::kIndexMissing) return;
+  try {
+    if (!parts_.host->CreateIndexIfWanted([this] { parts_.index->Create(); })) return;
+    daemon::LogWarning("The index of share " + share_ + " was missing; made it anew");
+    compare_all_ = true;
+  } catch (const Error& failure) {
+    daemon::LogError("The index of share " + share_ + " cannot be made: " + Describe(failure));
+  }
+}
+
+}  // namespace quarry::fileindexd

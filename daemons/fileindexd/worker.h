@@ -1,0 +1,86 @@
+// What keeps the index of one share up to date.
+
+#ifndef QUARRY_DAEMONS_FILEINDEXD_WORKER_H_
+#define QUARRY_DAEMONS_FILEINDEXD_WORKER_H_
+
+#include <json/json.h>
+
+#include <atomic>
+#include <chrono>
+#include <cstddef>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "daemons/fileindexd/file_system.h"
+#include "daemons/fileindexd/gate.h"
+#include "daemons/fileindexd/index.h"
+#include "daemons/fileindexd/pass.h"
+#include "daemons/fileindexd/progress.h"
+#include "daemons/fileindexd/share_host.h"
+#include "daemons/fileindexd/slots.h"
+
+namespace quarry::fileindexd {
+
+// One worker's parts, which it owns, and what all workers share.
+struct WorkerParts {
+  std::unique_ptr<ShareHost> host;
+  std::unique_ptr<Index> index;
+  std::unique_ptr<FileSystem> files;
+  Slots* slots = nullptr;   // outlives the worker
+  std::size_t threads = 1;  // documents in work at a time
+};
+
+// Looks for work, does a pass when there is some, and waits longer and longer while passes fail. It
+// begins by comparing the whole share, since nobody knows what happened before it was there. What
+// that leaves undone when the process is killed the next start does again.
+class Worker {
+ public:
+  using Milliseconds = std::chrono::milliseconds;
+
+  Worker(const std::string& share, WorkerParts parts);
+
+  // One round: at most one pass. Returns how long to wait for the next one. Does not throw; blocks
+  // as long as the pass takes. One thread.
+  Milliseconds Step();
+  // Step after Step until Stop().
+  void Run();
+
+  // The members below may be called from any thread, and do not block.
+  void Stop() { gate_.Stop(); }
+  void SetPaused(bool paused) { gate_.SetPaused(paused); }
+  // The folder list may have changed. A worker that waits after a failure tries again at once.
+  void Reload();
+  // The status file has changed.
+  void CheckStatus() { check_status_ = true; }
+  Json::Value Report() const { return progress_.Report(gate_.Paused()); }
+
+ private:
+  bool RefreshLayout();
+  bool HasWork();
+  void ClaimReindex();
+  void RunOnePass();
+  void CheckShareIsThere(const Identity& root);
+  Milliseconds Fail(const std::string& error);
+  void HandleMissingIndex(const Error& error);
+  Survey::Rules CurrentRules();
+
+  const std::string share_;
+  WorkerParts parts_;
+  Gate gate_;
+  Progress progress_;
+  std::atomic<bool> reload_{true};
+  std::atomic<bool> check_status_{true};
+
+  // The worker's thread only.
+  ShareLayout layout_;
+  Survey survey_;
+  bool compare_all_ = true;
+  bool was_mounted_ = false;
+  std::string last_error_;
+  Milliseconds backoff_{0};
+};
+
+}  // namespace quarry::fileindexd
+
+#endif  // QUARRY_DAEMONS_FILEINDEXD_WORKER_H_
