@@ -1,0 +1,124 @@
+#include "daemons/tarncontentextractd/service.h"
+
+#include <cerrno>
+#include <system_error>
+#include <utility>
+#include <variant>
+#include <vector>
+
+#include "common/error.h"
+#include "common/file_util.h"
+#include "common/json.h"
+#include "daemons/tarncontentextractd/path_open.h"
+#include "daemons/tarncontentextractd/stamp.h"
+
+namespace quarry::extract {
+namespace {
+
+std::string ErrnoText() {
+  return std::generic_category().message(errno);
+}
+
+// The path as documents name it.
+std::string CheckedPath(std::string path) {
+  if (path.empty() || path[0] != '/') {
+    throw Error(kErrorBadParameter, "Not an absolute path: " + path);
+  }
+  if (path.find('\0') != std::string::npos) {
+    throw Error(kErrorBadParameter, "A path cannot hold a NUL byte");
+  }
+  while (path.size() > 1 && path.back() == '/') path.pop_back();
+  return path;
+}
+
+Json::Value ToJson(const FieldValue& value) {
+  if (const auto* text = std::get_if<std::string>(&value)) return *text;
+  if (const auto* whole = std::get_if<std::int64_t>(&value)) return Json::Int64{*whole};
+  return std::get<double>(value);
+}
+
+// What the file system says is never overruled by what a parser says.
+void AddFields(const std::vector<Field>& fields, Json::Value& document) {
+  for (const Field& field : fields) {
+    if (!document.isMember(field.name)) document[field.name] = ToJson(field.value);
+  }
+}
+
+Json::Value ErrorAnswer(const Error& error) {
+  Json::Value answer(Json::objectValue);
+  answer["success"] = false;
+  answer["error"]["code"] = static_cast<int>(error.code());
+  answer["error"]["msg"] = error.reason();
+  return answer;
+}
+
+}  // namespace
+
+// Returns whether the content has been dealt with, for good or ill; if not it is to be tried again
+// another time.
+bool ExtractService::AddContent(const std::string& path, int place, const Attributes& attributes,
+                                Json::Value& document) {
+  if (!S_ISREG(attributes.status.st_mode) || attributes.status.st_size == 0) return true;
+  const std::string stamp = AttributeStamp(attributes.status);
+  if (bad_files_.Contains(path, stamp)) return true;
+  const UniqueFd file = OpenForReading(place);
+  if (!file.valid()) return errno != EMFILE && errno != ENFILE && errno != ENOMEM;
+  std::vector<Field> fields;
+  switch (pool_.Parse(file.get(), GetFileExtension(path, true), path, &fields)) {
+    case PoolOutcome::kDone:
+      AddFields(fields, document);
+      return true;
+    case PoolOutcome::kBadFile:
+      bad_files_.Add(path, stamp);
+      return true;
+    case PoolOutcome::kBroken:
+      return false;
+    case PoolOutcome::kStopped:
+      break;
+  }
+  throw Error(kErrorSystem, "The extractor is stopping");
+}
+
+Json::Value ExtractService::ParseFile(const std::string& given_path, bool need_meta) {
+  const std::string path = CheckedPath(given_path);
+  const UniqueFd place = OpenPlace(path);
+  Attributes attributes;
+  if (!place.valid() || !ReadAttributes(place.get(), &attributes)) {
+    throw Error(kErrorParseDocument, "Cannot open " + path + ": " + ErrnoText());
+  }
+  Json::Value document = AttributeDocument(path, attributes);
+  if (need_meta && AddContent(path, place.get(), attributes, document)) {
+    document[kContentStampField] = ContentStamp(attributes.status);
+  }
+  return document;
+}
+
+Json::Value ExtractService::Answer(const std::string& request) {
+  Json::Value json;
+  if (!fromString(json, request)) throw Error(kErrorBadParameter, "The request is not JSON");
+  std::string command;
+  Json::Value data;
+  std::string path;
+  Json::Value options;
+  bool need_meta = false;
+  GetJsonValue(command, json, "command", true);
+  if (command != "parse") throw Error(kErrorBadParameter, "Unknown command: " + command);
+  GetJsonValue(data, json, "data", true);
+  GetJsonValue(path, data, "path", true);
+  GetJsonValue(options, data, "options", false);
+  GetJsonValue(need_meta, options, "need_meta", false);
+  Json::Value answer(Json::objectValue);
+  answer["data"] = ParseFile(path, need_meta);
+  answer["success"] = true;
+  return answer;
+}
+
+std::string ExtractService::Handle(const std::string& request) {
+  try {
+    return toString(Answer(request));
+  } catch (const Error& error) {
+    return toString(ErrorAnswer(error));
+  }
+}
+
+}  // namespace quarry::extract

@@ -1,0 +1,45 @@
+// Answering the daemon's requests. docs/extractor-protocol.md describes them.
+
+#ifndef QUARRY_DAEMONS_TARNCONTENTEXTRACTD_SERVICE_H_
+#define QUARRY_DAEMONS_TARNCONTENTEXTRACTD_SERVICE_H_
+
+#include <json/json.h>
+
+#include <cstddef>
+#include <string>
+
+#include "daemons/tarncontentextractd/attributes.h"
+#include "daemons/tarncontentextractd/bad_files.h"
+#include "daemons/tarncontentextractd/worker_pool.h"
+
+namespace quarry::extract {
+
+inline constexpr std::size_t kMaxBadFiles = 10000;
+inline constexpr std::size_t kMaxBadFileBytes = std::size_t{8} << 20;
+
+// Makes documents of files. Any thread, any number at once.
+class ExtractService {
+ public:
+  // `pool` must outlive the object.
+  explicit ExtractService(WorkerPool& pool) : pool_(pool) {}
+
+  // The text of the answer to the text of a request. Throws nothing but std::bad_alloc.
+  std::string Handle(const std::string& request);
+
+  // The document of what stands at the absolute `path`: attributes, and with `need_meta` content
+  // where it is a regular file whose content can be read. Throws Error 120 for a path that is none,
+  // 914 when nothing can be said about it, and 502 when the daemon is stopping.
+  Json::Value ParseFile(const std::string& path, bool need_meta);
+
+ private:
+  Json::Value Answer(const std::string& request);
+  bool AddContent(const std::string& path, int place, const Attributes& attributes,
+                  Json::Value& document);
+
+  WorkerPool& pool_;
+  BadFiles bad_files_{kMaxBadFiles, kMaxBadFileBytes};
+};
+
+}  // namespace quarry::extract
+
+#endif  // QUARRY_DAEMONS_TARNCONTENTEXTRACTD_SERVICE_H_

@@ -1,0 +1,49 @@
+#include "daemons/tarncontentextractd/source.h"
+
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <utility>
+
+namespace quarry::extract {
+namespace {
+
+// Grown in such steps, so that memory follows what the file really holds.
+constexpr std::size_t kReadStep = std::size_t{1} << 20;
+
+}  // namespace
+
+Source Source::OfBytes(std::string bytes, std::string extension) {
+  Source source(-1, std::move(extension));
+  source.truncated_ = bytes.size() > kMaxFileBytes;
+  source.bytes_ = std::move(bytes);
+  source.at_end_ = true;
+  return source;
+}
+
+void Source::ReadUpTo(std::size_t size) {
+  while (!at_end_ && bytes_.size() < size) {
+    const std::size_t got = bytes_.size();
+    bytes_.resize(std::min(size, got + kReadStep));
+    ssize_t count = 0;
+    do {
+      count = pread(fd_, bytes_.data() + got, bytes_.size() - got, static_cast<off_t>(got));
+    } while (count < 0 && errno == EINTR);
+    bytes_.resize(got + static_cast<std::size_t>(std::max<ssize_t>(count, 0)));
+    if (count <= 0) at_end_ = true;
+  }
+}
+
+std::string_view Source::Head() {
+  ReadUpTo(kHeadBytes);
+  return std::string_view(bytes_).substr(0, kHeadBytes);
+}
+
+std::string_view Source::Bytes() {
+  ReadUpTo(kMaxFileBytes + 1);
+  if (bytes_.size() > kMaxFileBytes) truncated_ = true;
+  return std::string_view(bytes_).substr(0, kMaxFileBytes);
+}
+
+}  // namespace quarry::extract

@@ -1,0 +1,88 @@
+#include "daemons/tarncontentextractd/worker.h"
+
+#include <sys/time.h>
+#include <unistd.h>
+
+#include <exception>
+#include <new>
+
+#include "daemons/tarncontentextractd/charset.h"
+#include "daemons/tarncontentextractd/markup.h"
+#include "daemons/tarncontentextractd/sandbox.h"
+#include "daemons/tarncontentextractd/worker_protocol.h"
+
+namespace quarry::extract {
+namespace {
+
+// Longer than the daemon waits, so that it is the daemon that notices.
+constexpr int kLastResortSeconds = 60;
+
+void SetTimer(int seconds) {
+  itimerval timer{};
+  timer.it_value.tv_sec = seconds;
+  setitimer(ITIMER_REAL, &timer, nullptr);
+}
+
+// Libraries fetch data at first use; what they open must be open before the sandbox closes.
+void LoadData() {
+  PrepareXmlLibrary();
+  for (const char* charset : {"UTF-8", "windows-1252", "Shift_JIS"}) ConvertToUtf8("x", charset);
+}
+
+// A worker whose parsers cannot work at all must not get as far as the first file, which would be
+// taken for the cause.
+void TryParsers(const Registry& registry) {
+  for (const char* extension : {"html", "xml", "md", "txt"}) {
+    Source source = Source::OfBytes(
+        "<p>gr\xFC\xDF"
+        "e</p>\n",
+        extension);
+    ParseFile(registry, source);
+  }
+}
+
+}  // namespace
+
+std::vector<Field> ParseFile(const Registry& registry, Source& source) {
+  Extraction extraction;
+  try {
+    const Extractor* extractor = registry.Find(source);
+    if (extractor != nullptr) extractor->Extract(source, extraction);
+  } catch (const std::bad_alloc&) {
+    _exit(kExitOutOfMemory);
+  } catch (const std::exception&) {
+    // What was found before is good.
+    return extraction.Take();
+  }
+  return extraction.Take();
+}
+
+bool Announce(int channel, const std::string& problem) {
+  return SendAnswer(channel, problem.empty() ? kReady : problem) && problem.empty();
+}
+
+void ServeFiles(const Registry& registry, int channel, int seconds) {
+  std::string extension;
+  UniqueFd file;
+  while (ReceiveRequest(channel, &extension, &file)) {
+    SetTimer(seconds);
+    Source source(file.get(), extension);
+    const bool sent = SendAnswer(channel, EncodeFields(ParseFile(registry, source)));
+    SetTimer(0);
+    file.Reset();
+    if (!sent) return;
+  }
+}
+
+int RunWorker(const Registry& registry, int channel) {
+  closefrom(channel + 1);
+  LoadData();
+  std::string problem = CloseSandbox(channel);
+  if (problem.empty()) problem = FindGap();
+  if (problem.empty()) TryParsers(registry);
+  if (!Announce(channel, problem)) return kExitNotClosed;
+  ServeFiles(registry, channel, kLastResortSeconds);
+  return kExitOk;
+}
+
+}  // namespace quarry::extract

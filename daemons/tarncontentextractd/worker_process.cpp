@@ -1,0 +1,198 @@
+#include "daemons/tarncontentextractd/worker_process.h"
+
+#include <fcntl.h>
+#include <poll.h>
+#include <signal.h>
+#include <spawn.h>
+#include <sys/socket.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <cstring>
+
+#include "common/error.h"
+#include "daemons/common/system_error.h"
+#include "daemons/tarncontentextractd/sandbox.h"
+#include "daemons/tarncontentextractd/worker.h"
+#include "daemons/tarncontentextractd/worker_protocol.h"
+
+namespace quarry::extract {
+namespace {
+
+using Clock = std::chrono::steady_clock;
+using std::chrono::milliseconds;
+
+// An answer is stored in such steps, so that memory follows what arrives and not what is claimed.
+constexpr std::size_t kReadStep = std::size_t{1} << 20;
+
+// How a child is to begin: alone in its group, without the daemon's signal mask, terminal or files.
+class SpawnPlan {
+ public:
+  explicit SpawnPlan(int channel) {
+    posix_spawn_file_actions_init(&actions_);
+    posix_spawnattr_init(&attributes_);
+    PlanFiles(channel);
+    PlanSignals();
+  }
+  ~SpawnPlan() {
+    posix_spawnattr_destroy(&attributes_);
+    posix_spawn_file_actions_destroy(&actions_);
+  }
+  SpawnPlan(const SpawnPlan&) = delete;
+  SpawnPlan& operator=(const SpawnPlan&) = delete;
+
+  int Spawn(const std::vector<std::string>& command, pid_t* pid) const {
+    std::vector<char*> arguments;
+    for (const std::string& argument : command) {
+      arguments.push_back(const_cast<char*>(argument.c_str()));
+    }
+    arguments.push_back(nullptr);
+    return posix_spawn(pid, arguments[0], &actions_, &attributes_, arguments.data(), environ);
+  }
+
+ private:
+  void PlanFiles(int channel) {
+    posix_spawn_file_actions_adddup2(&actions_, channel, kWorkerChannel);
+    // Opened for reading only, all three: a worker holds nothing that could be written to. A
+    // sanitizer's report must be seen, however.
+    const int last = kSandboxed ? STDERR_FILENO : STDOUT_FILENO;
+    for (int fd = STDIN_FILENO; fd <= last; ++fd) {
+      posix_spawn_file_actions_addopen(&actions_, fd, "/dev/null", O_RDONLY, 0);
+    }
+  }
+
+  void PlanSignals() {
+    sigset_t none;
+    sigset_t all;
+    sigemptyset(&none);
+    sigfillset(&all);
+    posix_spawnattr_setsigmask(&attributes_, &none);
+    posix_spawnattr_setsigdefault(&attributes_, &all);
+    posix_spawnattr_setpgroup(&attributes_, 0);
+    posix_spawnattr_setflags(
+        &attributes_, POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF | POSIX_SPAWN_SETPGROUP);
+  }
+
+  posix_spawn_file_actions_t actions_;
+  posix_spawnattr_t attributes_;
+};
+
+int MillisecondsUntil(Clock::time_point deadline) {
+  const auto left = std::chrono::ceil<milliseconds>(deadline - Clock::now()).count();
+  return static_cast<int>(std::clamp<decltype(left)>(left, 0, 1000000));
+}
+
+std::string DescribeEnd(int status) {
+  if (WIFSIGNALED(status)) return "was ended by signal " + std::to_string(WTERMSIG(status));
+  return "ended with code " + std::to_string(WEXITSTATUS(status));
+}
+
+std::string Describe(WorkerOutcome outcome, const std::string& ending) {
+  if (outcome == WorkerOutcome::kDied) return "it " + ending;
+  return outcome == WorkerOutcome::kTimedOut ? "it does not get ready" : "the daemon stops";
+}
+
+}  // namespace
+
+WorkerProcess::WorkerProcess(const std::vector<std::string>& command, milliseconds timeout,
+                             int stop_fd)
+    : stop_fd_(stop_fd) {
+  int ends[2] = {-1, -1};
+  if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) {
+    daemon::ThrowSystemError("Cannot make a worker's channel");
+  }
+  channel_.Reset(ends[0]);
+  UniqueFd theirs(ends[1]);
+  Spawn(command, theirs.get());
+  // Else the end of the worker could not be told from its silence.
+  theirs.Reset();
+  std::string text;
+  const WorkerOutcome outcome = ReadMessage(&text, Clock::now() + timeout);
+  if (outcome == WorkerOutcome::kDone && text == kReady) return;
+  const std::string ending = End();
+  throw Error(kErrorSystem, outcome == WorkerOutcome::kDone
+                                ? "Its sandbox did not close: " + text
+                                : "Worker not started: " + Describe(outcome, ending));
+}
+
+WorkerProcess::~WorkerProcess() {
+  End();
+}
+
+void WorkerProcess::Spawn(const std::vector<std::string>& command, int channel) {
+  const int error = SpawnPlan(channel).Spawn(command, &pid_);
+  if (error == 0) return;
+  pid_ = -1;
+  errno = error;
+  daemon::ThrowSystemError("Cannot start " + command[0]);
+}
+
+std::string WorkerProcess::End() {
+  if (pid_ < 0) return ending_;
+  // The group first: its leader cannot be taken for another process before it has been waited for.
+  kill(-pid_, SIGKILL);
+  kill(pid_, SIGKILL);
+  int status = 0;
+  pid_t ended = -1;
+  do {
+    ended = waitpid(pid_, &status, 0);
+  } while (ended < 0 && errno == EINTR);
+  ending_ = DescribeEnd(status);
+  pid_ = -1;
+  channel_.Reset();
+  return ending_;
+}
+
+WorkerOutcome WorkerProcess::WaitReadable(Deadline deadline) const {
+  std::array<pollfd, 2> watched{{{channel_.get(), POLLIN, 0}, {stop_fd_, POLLIN, 0}}};
+  int ready = 0;
+  do {
+    ready = poll(watched.data(), watched.size(), MillisecondsUntil(deadline));
+  } while (ready < 0 && errno == EINTR);
+  if (watched[0].revents != 0) return WorkerOutcome::kDone;
+  if (watched[1].revents != 0) return WorkerOutcome::kStopped;
+  return ready == 0 ? WorkerOutcome::kTimedOut : WorkerOutcome::kDied;
+}
+
+WorkerOutcome WorkerProcess::ReadAll(char* buffer, std::size_t size, Deadline deadline) {
+  while (size > 0) {
+    const WorkerOutcome outcome = WaitReadable(deadline);
+    if (outcome != WorkerOutcome::kDone) return outcome;
+    const ssize_t count = recv(channel_.get(), buffer, size, MSG_DONTWAIT);
+    if (count < 0 && (errno == EINTR || errno == EAGAIN)) continue;
+    if (count <= 0) return WorkerOutcome::kDied;
+    buffer += count;
+    size -= static_cast<std::size_t>(count);
+  }
+  return WorkerOutcome::kDone;
+}
+
+WorkerOutcome WorkerProcess::ReadMessage(std::string* text, Deadline deadline) {
+  std::uint32_t size = 0;
+  WorkerOutcome outcome = ReadAll(reinterpret_cast<char*>(&size), sizeof(size), deadline);
+  if (outcome == WorkerOutcome::kDone && size > kMaxAnswerBytes) return WorkerOutcome::kDied;
+  text->clear();
+  while (outcome == WorkerOutcome::kDone && text->size() < size) {
+    const std::size_t got = text->size();
+    text->resize(std::min<std::size_t>(size, got + kReadStep));
+    outcome = ReadAll(text->data() + got, text->size() - got, deadline);
+  }
+  return outcome;
+}
+
+WorkerOutcome WorkerProcess::Parse(int file, const std::string& extension, milliseconds timeout,
+                                   std::vector<Field>* out) {
+  out->clear();
+  if (!SendRequest(channel_.get(), extension, file)) return WorkerOutcome::kDied;
+  std::string answer;
+  const WorkerOutcome outcome = ReadMessage(&answer, Clock::now() + timeout);
+  if (outcome != WorkerOutcome::kDone) return outcome;
+  if (!DecodeFields(answer, out)) return WorkerOutcome::kDied;
+  ++files_done_;
+  return WorkerOutcome::kDone;
+}
+
+}  // namespace quarry::extract
