@@ -36,9 +36,21 @@ const Json::StreamWriterBuilder& WriterBuilder() {
   return *builder;
 }
 
+// Whether the text holds what the library overlooks: it takes a NUL byte for the end of the text,
+// and lets comments pass in some places even where they are not allowed. Outside strings a "/" can
+// only begin a comment.
+bool HoldsCommentOrNul(const std::string& text) {
+  bool in_string = false;
+  for (size_t i = 0; i < text.size(); ++i) {
+    if (text[i] == '\0' || (text[i] == '/' && !in_string)) return true;
+    if (text[i] == '"') in_string = !in_string;
+    if (text[i] == '\\' && in_string && i + 1 < text.size() && text[i + 1] != '\0') ++i;
+  }
+  return false;
+}
+
 bool Parse(Json::Value& out, const std::string& text) {
-  // The library takes a NUL byte for the end of the text and would not see what follows.
-  if (text.find('\0') != std::string::npos) return false;
+  if (HoldsCommentOrNul(text)) return false;
   const std::unique_ptr<Json::CharReader> reader(ReaderBuilder().newCharReader());
   try {
     return reader->parse(text.data(), text.data() + text.size(), &out, nullptr);
