@@ -92,7 +92,7 @@ TEST_F(JsonTest, NulBytesAreRefusedWhereverTheyStand) {
 }
 
 TEST_F(JsonTest, CommentsAreRefusedWhereverTheyStand) {
-  const std::string text = R"({"a":[1,"/*x*/ //y \"],"/\"/":null})";
+  const std::string text = R"({"a":[1,"/*x*/ //y \\"],"/\"/":null})";
   Doc(text);
   int refused = 0;
   for (size_t at = 0; at <= text.size(); ++at) {
