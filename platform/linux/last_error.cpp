@@ -20,13 +20,22 @@ int SetLastError(int error, const char* file, int line) {
   return -1;
 }
 
+}  // namespace quarry::platform
+
+using namespace quarry::platform;
+
 extern "C" {
 
-int HLIBCErrGet() { return last.error; }
+int HLIBCErrGet() {
+  return last.error;
+}
 
-const char* HLIBCErrorGetFile() { return last.file; }
+const char* HLIBCErrorGetFile() {
+  return last.file;
+}
 
-int HLIBCErrorGetLine() { return last.line; }
+int HLIBCErrorGetLine() {
+  return last.line;
+}
 
 }  // extern "C"
-}  // namespace quarry::platform

@@ -22,7 +22,9 @@ HLIBCSZLIST* HLIBCSzListAlloc(int size) {
   }
 }
 
-void HLIBCSzListFree(HLIBCSZLIST* list) { delete list; }
+void HLIBCSzListFree(HLIBCSZLIST* list) {
+  delete list;
+}
 
 int HLIBCSzListPush(const char* text, HLIBCSZLIST** list) {
   if (text == nullptr || list == nullptr || *list == nullptr) return -1;

@@ -1,0 +1,100 @@
+// The registrations of the file-change monitor: one file for each application and queue in
+// RootedPath("/var/lib/quarry/monitor/"), named after both:
+//
+//   {"application": "fileindex", "type": 1, "queue": file,
+//    "config": [{"path": directory, "mask": bits, "ignore": [name, ...]}, ...]}
+
+#include <unistd.h>
+
+#include <cerrno>
+#include <string>
+
+#include "common/json.h"
+#include "common/paths.h"
+#include "platform/include/monitor.h"
+#include "platform/linux/durable_file.h"
+#include "platform/linux/path_name.h"
+
+namespace quarry::platform {
+namespace {
+
+const std::string& MonitorDirectory() {
+  static const std::string directory = RootedPath("/var/lib/quarry/monitor");
+  return directory;
+}
+
+bool IsApplicationName(const std::string& name) {
+  return !name.empty() && name.size() <= 64 && name.front() != '.' &&
+         name.find_first_not_of(
+             "abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789._") ==
+             std::string::npos;
+}
+
+// The file of a registration, empty, with errno set, when it cannot be named. An application's name
+// has no "-", so that no two pairs share a file.
+std::string FileFor(const std::string& queue_path, const std::string& application) {
+  if (!IsApplicationName(application) || queue_path.find('\0') != std::string::npos ||
+      !IsPlainAbsolutePath(queue_path)) {
+    errno = EINVAL;
+    return std::string();
+  }
+  std::string name = application + "-" + NameForPath(queue_path);
+  constexpr std::size_t kMaxNameBytes = 240;
+  if (name.size() > kMaxNameBytes) {
+    // The hash at the end of a long name is of the whole path, so the middle can go.
+    const std::string end = NameForPath(queue_path + "/" + std::string(kMaxNameBytes, 'x'));
+    name = application + "-" + end.substr(end.rfind('~'));
+  }
+  return MonitorDirectory() + "/" + name + ".json";
+}
+
+// Whether the entries are what the monitor can follow.
+bool IsConfig(const Json::Value& config) {
+  if (!config.isArray()) return false;
+  for (const Json::Value& entry : config) {
+    if (!entry.isObject() || !entry["path"].isString() || !entry["mask"].isIntegral()) return false;
+    const Json::Value& ignore = entry["ignore"];
+    if (!ignore.isNull() && !ignore.isArray()) return false;
+  }
+  return true;
+}
+
+bool RemoveDurably(const std::string& file) {
+  if (unlink(file.c_str()) == 0) return SyncDirectory(MonitorDirectory());
+  if (errno != ENOENT) return false;
+  errno = 0;
+  return true;
+}
+
+}  // namespace
+}  // namespace quarry::platform
+
+namespace TARN::TARNOTIFYD {
+
+using namespace quarry::platform;
+
+bool MonitorQueue::Upsert(const MonitorQueue& queue, const std::string& application,
+                          MonitorQueueType type) {
+  const Json::Value& config = queue.Config();
+  if (!config.isObject() || !config["queue"].isString() || !IsConfig(config["config"])) {
+    errno = EINVAL;
+    return false;
+  }
+  const std::string file = FileFor(config["queue"].asString(), application);
+  if (file.empty()) return false;
+  Json::Value document;
+  document["application"] = application;
+  document["type"] = static_cast<int>(type);
+  document["queue"] = config["queue"];
+  document["config"] = config["config"];
+  return MakeDirectories(MonitorDirectory(), 0750) &&
+         WriteFileDurably(file, quarry::toString(document) + "\n");
+}
+
+bool MonitorQueue::Delete(const std::string& queue_path, const std::string& application,
+                          MonitorQueueType) {
+  const std::string file = FileFor(queue_path, application);
+  return !file.empty() && RemoveDurably(file);
+}
+
+}  // namespace TARN::TARNOTIFYD
