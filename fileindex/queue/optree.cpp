@@ -1,0 +1,250 @@
+#include "fileindex/queue/optree.h"
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <cstring>
+#include <string_view>
+#include <utility>
+
+#include "common/error.h"
+#include "common/log.h"
+#include "fileindex/queue/ledger.h"
+#include "fileindex/queue/queue_reader.h"
+#include "fileindex/queue/relocation.h"
+
+namespace quarry::fileindex {
+namespace {
+
+// What a new record does when it meets a pending one at the same node.
+enum Rule : std::uint8_t {
+  Keep,   // nothing: both stand
+  Drop,   // the new one is dropped
+  Take,   // the pending one becomes what the new one is, in its own place; the new one is dropped
+  Merge,  // the pending one takes the new one's switches in; the new one is dropped
+};
+
+}  // namespace
+
+struct RuleRow {
+  FileIndexOP kind;             // of the new record
+  std::array<Rule, 8> meeting;  // by the kind of the pending one
+};
+
+namespace {
+
+// clang-format off
+//                                                NONE  DELETE INDEX ATTR  UPD.  REN.  REINDEX FULL
+constexpr RuleRow kDelete    = {OP_DELETE,      {{Keep, Drop,  Take, Take, Keep,  Keep, Keep,   Keep}}};
+constexpr RuleRow kCreate    = {OP_INDEX,       {{Keep, Take,  Drop, Take, Drop,  Keep, Drop,   Keep}}};
+constexpr RuleRow kModify    = {OP_INDEX,       {{Keep, Drop,  Drop, Take, Drop,  Keep, Drop,   Keep}}};
+constexpr RuleRow kAttr      = {OP_ATTR,        {{Keep, Drop,  Drop, Drop, Drop,  Keep, Drop,   Keep}}};
+constexpr RuleRow kUpdateCfg = {OP_UPDATE_CFG,  {{Keep, Drop,  Take, Take, Merge, Keep, Drop,   Keep}}};
+constexpr RuleRow kReindex   = {OP_REINDEX,     {{Keep, Drop,  Take, Take, Take,  Keep, Drop,   Keep}}};
+// clang-format on
+
+void Meet(OP& pending, OP& rec, const RuleRow& rules) {
+  const auto kind = static_cast<std::size_t>(pending.op);
+  const Rule rule = kind < rules.meeting.size() ? rules.meeting[kind] : Keep;
+  if (rule == Keep) return;
+  if (rule == Merge) pending.MergeData(rec.data);
+  if (rule == Take) {
+    pending.op = rules.kind;
+    if (rules.kind == OP_UPDATE_CFG) pending.data = rec.data;
+  }
+  rec.op = OP_NONE;
+}
+
+void CancelBelow(OPNode& node) {
+  std::vector<OPNode*> waiting = Ledger::TakeReindexable(node);
+  while (!waiting.empty()) {
+    OPNode& below = *waiting.back();
+    waiting.pop_back();
+    Ledger::ForEachOwn(below, nullptr, [](OP& rec) {
+      if (rec.op != OP_RENAME) rec.op = OP_NONE;
+    });
+    const std::vector<OPNode*> children = Ledger::TakeReindexable(below);
+    waiting.insert(waiting.end(), children.begin(), children.end());
+  }
+}
+
+// What was there before something was moved over it is gone.
+void CancelReplaced(OPNode& destination, const OP* current) {
+  Ledger::ForEachOwn(destination, current, [](OP& rec) {
+    if (rec.op == OP_DELETE || rec.op == OP_INDEX || rec.op == OP_ATTR) rec.op = OP_NONE;
+  });
+}
+
+// A path is handed to the system as text that ends at the first NUL byte: cut there it would name,
+// and perhaps remove, something else.
+void RefuseNul(const std::string& path) {
+  if (path.find('\0') != std::string::npos) {
+    throw Error(kErrorBadParameter, "NUL byte in path: " + path);
+  }
+}
+
+std::string OpenFailure() {
+  return std::string("Failed to open queue, reason=") + strerror(errno);
+}
+
+}  // namespace
+
+OPTree::OPTree(const std::string& path, Empty)
+    : queue_path(path), root(std::make_shared<OPNode>(nullptr, "")) {}
+
+// Delegates first, so that the destructor takes the tree apart when building fails.
+OPTree::OPTree(const std::string& path) : OPTree(path, Empty()) {
+  BuildTree();
+}
+
+OPTree::~OPTree() {
+  ops.clear();
+  std::vector<std::shared_ptr<OPNode>> orphans;
+  if (root) orphans.push_back(std::move(root));
+  while (!orphans.empty()) {
+    const std::shared_ptr<OPNode> node = std::move(orphans.back());
+    orphans.pop_back();
+    Ledger::Dismantle(*node, orphans);
+  }
+}
+
+void OPTree::BuildTree() {
+  QueueReader input(queue_path);
+  if (input.failed()) {
+    Fail(QUARRY_SITE("optree"), "!input_stream", kErrorSystem, OpenFailure());
+  }
+  std::string line;
+  while (input.Next(line)) {
+    InsertLine(line);
+    if (crashed) return;
+  }
+  // Half a queue must not pass for a whole one: the rest would be deleted with it.
+  if (input.failed()) {
+    Fail(QUARRY_SITE("optree"), "!input_stream", kErrorSystem, OpenFailure());
+  }
+}
+
+void OPTree::InsertLine(const std::string& line) {
+  if (log_level == 7) LogLine(QUARRY_SITE("optree"), "Got event: " + line);
+  try {
+    InsertEvent(std::make_shared<Event>(line));
+  } catch (const Error& error) {
+    LogError(LogSite{"optree.cpp", __LINE__, "BuildTree"},
+             "InsertEvent failed, event_raw=" + line +
+                 ", code=" + std::to_string(static_cast<std::int32_t>(error.code())) +
+                 ", reason=" + error.reason());
+  }
+}
+
+void OPTree::InsertEvent(std::shared_ptr<Event> event) {
+  RefuseNul(event->path);
+  RefuseNul(event->path_old);
+  const std::shared_ptr<OPNode> node = GetNodeByPath(event->path);
+  const auto rec = std::make_shared<OP>(node, OP_NONE, "", Json::Value());
+  const auto has = [&event](EventKind kind) { return (event->op & kind) != 0; };
+
+  if (has(EVENT_CREATE)) event->is_dir ? HandleReindex(node, rec) : HandleCreate(node, rec);
+  if (has(EVENT_ATTR)) HandleAttr(node, rec);
+  if (has(EVENT_MODIFY)) HandleModify(node, rec);
+  if (has(EVENT_DELETE)) event->is_dir ? HandleReindex(node, rec) : HandleDelete(node, rec);
+  if (has(EVENT_RENAME)) {
+    rec->src = event->path_old;
+    HandleRename(node, rec);
+  }
+  if (has(EVENT_REINDEX)) HandleReindex(node, rec);
+  if (has(EVENT_UPDATE_CFG)) {
+    rec->data = event->data;
+    HandleUpdateCfg(node, rec);
+  }
+  if (has(EVENT_OVERFLOW)) crashed = true;
+}
+
+std::shared_ptr<OPNode> OPTree::GetNodeByPath(const std::string& path) {
+  std::shared_ptr<OPNode> node = root;
+  for (std::size_t begin = 0; node && begin < path.size();) {
+    const std::size_t end = std::min(path.find('/', begin), path.size());
+    const std::string_view component(path.data() + begin, end - begin);
+    if (!component.empty()) node = Ledger::Child(*node, component);
+    begin = end + 1;
+  }
+  if (!node) throw Error(kErrorTreePath, "GetNodeByPath failed, path=" + path);
+  return node;
+}
+
+void OPTree::Attach(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& rec) {
+  if (std::exchange(rec->attached_, true)) return;
+  ops.push_back(rec);
+  node->ops.push_back(rec);
+  Ledger::Touch(*node);
+}
+
+void OPTree::Fold(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& rec,
+                  const RuleRow& rules) {
+  rec->op = rules.kind;
+  Ledger::ForEachOwn(*node, rec.get(), [&](OP& pending) { Meet(pending, *rec, rules); });
+  if (rec->op != OP_NONE) Attach(node, rec);
+}
+
+void OPTree::HandleCreate(std::shared_ptr<OPNode> node, std::shared_ptr<OP> rec) {
+  Fold(node, rec, kCreate);
+}
+
+void OPTree::HandleModify(std::shared_ptr<OPNode> node, std::shared_ptr<OP> rec) {
+  Fold(node, rec, kModify);
+}
+
+void OPTree::HandleAttr(std::shared_ptr<OPNode> node, std::shared_ptr<OP> rec) {
+  Fold(node, rec, kAttr);
+}
+
+void OPTree::HandleDelete(std::shared_ptr<OPNode> node, std::shared_ptr<OP> rec) {
+  Fold(node, rec, kDelete);
+}
+
+void OPTree::HandleUpdateCfg(std::shared_ptr<OPNode> node, std::shared_ptr<OP> rec) {
+  Fold(node, rec, kUpdateCfg);
+}
+
+void OPTree::HandleReindex(std::shared_ptr<OPNode> node, std::shared_ptr<OP> rec) {
+  Fold(node, rec, kReindex);
+  CancelBelow(*node);
+}
+
+void OPTree::HandleRename(std::shared_ptr<OPNode> node, std::shared_ptr<OP> rec) {
+  const std::shared_ptr<OPNode> source = GetNodeByPath(rec->src);
+  rec->op = OP_RENAME;
+  std::vector<std::shared_ptr<OP>> carriers;
+  if (source != node) {
+    CancelReplaced(*node, rec.get());
+    // An old path without components names nothing that could have been moved.
+    if (source != root) carriers = Relocation(*source, *node).Deliver(rec.get());
+  }
+  Attach(node, rec);
+  for (const std::shared_ptr<OP>& carrier : carriers) Attach(carrier->node, carrier);
+}
+
+void OPTree::TraverseNodeDescendant(std::shared_ptr<OPNode> node,
+                                    std::function<void(std::shared_ptr<OPNode>)> fn,
+                                    bool skip_self) {
+  std::vector<std::shared_ptr<OPNode>> waiting{node};
+  while (!waiting.empty()) {
+    const std::shared_ptr<OPNode> at = std::move(waiting.back());
+    waiting.pop_back();
+    if (!skip_self || at != node) fn(at);
+    waiting.insert(waiting.end(), at->children.rbegin(), at->children.rend());
+  }
+}
+
+std::int32_t OPTree::ProcessOP(std::function<void(std::shared_ptr<OP>)> fn) {
+  if (crashed) {
+    LogLine(QUARRY_SITE("optree"), "Queue crashed: " + queue_path);
+    fn(std::make_shared<OP>(root, OP_FULL_REINDEX, "", Json::Value()));
+    return 1;
+  }
+  for (std::size_t i = 0; i < ops.size(); ++i) {
+    if (ops[i]->op != OP_NONE) fn(ops[i]);
+  }
+  return static_cast<std::int32_t>(ops.size());
+}
+
+}  // namespace quarry::fileindex

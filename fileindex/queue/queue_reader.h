@@ -1,0 +1,36 @@
+// Reading a queue file line by line.
+
+#ifndef QUARRY_FILEINDEX_QUEUE_QUEUE_READER_H_
+#define QUARRY_FILEINDEX_QUEUE_QUEUE_READER_H_
+
+#include <string>
+#include <vector>
+
+#include "common/unique_fd.h"
+
+namespace quarry::fileindex {
+
+class QueueReader {
+ public:
+  // Opens the file. When that fails, failed() is true and errno says why.
+  explicit QueueReader(const std::string& path);
+
+  // The next line without its newline, of any bytes and any length; the last one need not be ended.
+  // False at the end of the file, and when reading fails: then failed() is true and errno says why.
+  bool Next(std::string& line);
+
+  bool failed() const { return failed_; }
+
+ private:
+  bool Fill();
+
+  UniqueFd fd_;
+  bool failed_;
+  std::vector<char> buffer_;
+  size_t begin_ = 0;  // what has not been handed out yet is buffer_[begin_, end_)
+  size_t end_ = 0;
+};
+
+}  // namespace quarry::fileindex
+
+#endif  // QUARRY_FILEINDEX_QUEUE_QUEUE_READER_H_

@@ -1,0 +1,48 @@
+// What a rename does to the work that is pending at the old path and below it.
+
+#ifndef QUARRY_FILEINDEX_QUEUE_RELOCATION_H_
+#define QUARRY_FILEINDEX_QUEUE_RELOCATION_H_
+
+#include <cstddef>
+#include <memory>
+#include <vector>
+
+#include "fileindex/queue/ledger.h"
+#include "fileindex/queue/optree.h"
+
+namespace quarry::fileindex {
+
+// Moves records from a subtree to the corresponding nodes below another place. All lists are taken
+// before the first one is moved, so the two places may lie within each other; the destination's own
+// subtree is never moved, for it would move into itself.
+class Relocation {
+ public:
+  // Takes the records of `source` and of the nodes below it where something is pending. Those that
+  // can be done at the new place as well are cancelled. Both nodes must outlive this object, and
+  // differ.
+  Relocation(OPNode& source, OPNode& destination);
+
+  // Hands all records to their new nodes. Returns the work to be done there, one record per node,
+  // parents first, not attached yet.
+  std::vector<std::shared_ptr<OP>> Deliver(const OP* current);
+
+ private:
+  struct Stop {
+    OPNode* from;
+    std::size_t above;     // the stop of the parent of `from`; only for the source its own
+    OPNode* to = nullptr;  // not looked up before it is needed, so that no empty nodes come up
+    bool loaded = false;   // `bundle` has been taken
+    FileIndexOP carried = OP_NONE;
+    Ledger::Bundle bundle{};
+  };
+
+  void Collect(OPNode& source, OPNode& destination);
+  static void Load(Stop& stop);
+  OPNode& Target(std::size_t index);
+
+  std::vector<Stop> stops_;  // in walk order, the source first
+};
+
+}  // namespace quarry::fileindex
+
+#endif  // QUARRY_FILEINDEX_QUEUE_RELOCATION_H_

@@ -1,0 +1,203 @@
+// Queues of such sizes and shapes that anything but linear cost would not end in time, and anything
+// that recurses with the depth of a path would not end well.
+
+#include <gtest/gtest.h>
+
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "common/error.h"
+#include "fileindex/queue/optree.h"
+#include "tests/fake_platform/fixture.h"
+#include "tests/fileindex/queue/queue_lines.h"
+
+namespace quarry::fileindex {
+namespace {
+
+using Strings = std::vector<std::string>;
+
+class BoundsTest : public fake::FakePlatformTest {
+ protected:
+  BoundsTest() { log_level = 6; }
+  ~BoundsTest() override { log_level = 7; }
+
+  void Insert(std::uint32_t kind, const std::string& path, const std::string& path_old = "") {
+    event_->op = kind;
+    event_->path = path;
+    event_->path_old = path_old;
+    tree_.InsertEvent(event_);
+  }
+
+  // The last records that are handed out.
+  Strings Last(size_t count) {
+    Strings texts;
+    for (auto op = tree_.ops.rbegin(); op != tree_.ops.rend() && texts.size() < count; ++op) {
+      if ((*op)->op != OP_NONE) texts.insert(texts.begin(), Text(**op));
+    }
+    return texts;
+  }
+
+  int Pending() {
+    int pending = 0;
+    tree_.ProcessOP([&pending](std::shared_ptr<OP>) { ++pending; });
+    return pending;
+  }
+
+  QueueFile queue_;
+  OPTree tree_{queue_.path()};
+  std::shared_ptr<Event> event_ = std::make_shared<Event>(R"({"event":0,"path":""})");
+};
+
+std::string Nth(const std::string& prefix, int i) {
+  return prefix + std::to_string(i);
+}
+
+TEST_F(BoundsTest, DirectoryOfAMillionFiles) {
+  for (int i = 0; i < 1'000'000; ++i) Insert(EVENT_MODIFY, Nth("/s/d/file-", i));
+  for (int i = 0; i < 1'000'000; i += 10) Insert(EVENT_ATTR, Nth("/s/d/file-", i));
+  EXPECT_EQ(tree_.GetNodeByPath("/s/d")->children.size(), 1'000'000u);
+  EXPECT_EQ(tree_.ops.size(), 1'000'000u);
+  EXPECT_EQ(Pending(), 1'000'000);
+}
+
+TEST_F(BoundsTest, PathOfTwoThousandComponents) {
+  std::string path;
+  for (int i = 0; i < 2000; ++i) path += Nth("/component-", i);
+  for (int i = 0; i < 1000; ++i) Insert(EVENT_MODIFY, Nth(path + "/f", i));
+  Insert(EVENT_RENAME, path + "x", path);
+  EXPECT_EQ(Last(1), Strings{"index " + path + "x/f999"});
+  EXPECT_EQ(Pending(), 1001);
+  Insert(EVENT_REINDEX, "/component-0");
+  EXPECT_EQ(Pending(), 2);
+}
+
+TEST_F(BoundsTest, PathOfHundredsOfThousandsOfComponents) {
+  std::string path;
+  for (int i = 0; i < 300'000; ++i) path += "/d";
+  Insert(EVENT_MODIFY, path);
+  Insert(EVENT_RENAME, "/e", "/d");
+  EXPECT_EQ(Last(1), Strings{"index /e" + path.substr(2)});
+  int nodes = 0;
+  tree_.TraverseNodeDescendant(
+      tree_.root, [&nodes](std::shared_ptr<OPNode>) { ++nodes; }, true);
+  EXPECT_EQ(nodes, 600'000);
+  Insert(EVENT_REINDEX, "/e");
+  EXPECT_EQ(Pending(), 2);
+}
+
+TEST_F(BoundsTest, RecordKeepsAllNodesAboveItUntilItGoes) {
+  std::string path;
+  for (int i = 0; i < 300'000; ++i) path += "/d";
+  std::shared_ptr<OP> kept;
+  {
+    OPTree tree(queue_.path());
+    event_->op = EVENT_MODIFY;
+    event_->path = path;
+    tree.InsertEvent(event_);
+    kept = tree.ops.front();
+  }
+  EXPECT_EQ(kept->node->GetPath(), path);
+  const std::weak_ptr<OPNode> node = kept->node;
+  kept.reset();
+  EXPECT_TRUE(node.expired());
+}
+
+TEST_F(BoundsTest, RenameOfADirectoryWithManyPendingDescendants) {
+  for (int i = 0; i < 100'000; ++i)
+    Insert(EVENT_MODIFY, "/s/d/" + Nth("dir", i / 100) + Nth("/f", i));
+  Insert(EVENT_RENAME, "/s/e", "/s/d");
+  EXPECT_EQ(tree_.ops.size(), 200'001u);
+  EXPECT_EQ(Pending(), 100'001);
+  EXPECT_EQ(tree_.ops[100'000]->op, OP_RENAME);
+  EXPECT_EQ(Text(*tree_.ops[100'001]), "index /s/e/dir0/f0");
+  EXPECT_EQ(Last(1), Strings{"index /s/e/dir999/f99999"});
+}
+
+TEST_F(BoundsTest, ModifyBelowAndReindexInTurn) {
+  for (int i = 0; i < 100'000; ++i) {
+    Insert(EVENT_MODIFY, "/s/d/e/f");
+    Insert(EVENT_REINDEX, "/s/d");
+  }
+  EXPECT_EQ(Pending(), 1);
+  EXPECT_EQ(tree_.GetNodeByPath("/s/d/e/f")->ops.size(), 100'000u);
+}
+
+TEST_F(BoundsTest, ModifyOfAnotherFileBelowAndReindexInTurn) {
+  for (int i = 0; i < 100'000; ++i) {
+    Insert(EVENT_MODIFY, Nth("/s/d/", i) + "/f");
+    Insert(EVENT_REINDEX, "/s/d");
+  }
+  EXPECT_EQ(Pending(), 1);
+  EXPECT_EQ(tree_.ops.size(), 100'001u);
+}
+
+TEST_F(BoundsTest, ManyReindexesAboveManySurvivors) {
+  for (int i = 0; i < 100'000; ++i) Insert(EVENT_RENAME, Nth("/s/d/to", i), Nth("/from/", i));
+  for (int i = 0; i < 100'000; ++i) Insert(EVENT_REINDEX, "/s/d");
+  EXPECT_EQ(Pending(), 100'001);
+}
+
+TEST_F(BoundsTest, RenamesOfADirectoryWhereAllIsCancelled) {
+  for (int i = 0; i < 100'000; ++i) Insert(EVENT_MODIFY, Nth("/s/d/", i));
+  Insert(EVENT_REINDEX, "/s/d");
+  for (int i = 0; i < 50'000; ++i) {
+    Insert(EVENT_RENAME, "/s/e", "/s/d");
+    Insert(EVENT_RENAME, "/s/d", "/s/e");
+  }
+  EXPECT_EQ(Last(2), (Strings{"rename /s/e -> /s/d", "reindex /s/d"}));
+  EXPECT_EQ(tree_.GetNodeByPath("/s/d")->children.size(), 100'000u);
+  EXPECT_EQ(tree_.GetNodeByPath("/s/e")->children.size(), 0u);
+}
+
+TEST_F(BoundsTest, RenamesOntoOnePlaceAndItsDeletionInTurn) {
+  for (int i = 0; i < 100'000; ++i) {
+    Insert(EVENT_RENAME, "/s/f", "/s/x");
+    Insert(EVENT_DELETE, "/s/f");
+  }
+  EXPECT_EQ(Last(2), (Strings{"rename /s/x -> /s/f", "delete /s/f"}));
+  EXPECT_EQ(Pending(), 100'001);
+}
+
+TEST_F(BoundsTest, RenamesToAndFroWithDeletionsInTurn) {
+  for (int i = 0; i < 50'000; ++i) {
+    Insert(EVENT_DELETE, "/s/g");
+    Insert(EVENT_RENAME, "/s/g", "/s/f");
+    Insert(EVENT_DELETE, "/s/f");
+    Insert(EVENT_RENAME, "/s/f", "/s/g");
+  }
+  EXPECT_EQ(Pending(), 100'000);
+  EXPECT_EQ(tree_.ops.size(), 200'000u);
+}
+
+TEST_F(BoundsTest, SavingByRenamingInTurn) {
+  for (int i = 0; i < 50'000; ++i) {
+    Insert(EVENT_CREATE, "/s/new");
+    Insert(EVENT_RENAME, "/s/old", "/s/f");
+    Insert(EVENT_RENAME, "/s/f", "/s/new");
+    Insert(EVENT_DELETE, "/s/old");
+  }
+  EXPECT_EQ(Last(3), (Strings{"delete /s/old", "rename /s/new -> /s/f", "index /s/f"}));
+}
+
+TEST_F(BoundsTest, LineOfManyMegabytes) {
+  const std::string name(20'000'000, 'n');
+  const std::string rubbish(20'000'000, '{');
+  test::WriteFile(queue_.path(),
+                  Line(EVENT_MODIFY, "/" + name) + rubbish + "\n" + Line(EVENT_MODIFY, "/a"));
+  OPTree tree(queue_.path());
+  ASSERT_EQ(tree.ops.size(), 2u);
+  EXPECT_EQ(tree.ops[0]->node->name, name);
+  EXPECT_EQ(Text(*tree.ops[1]), "index /a");
+}
+
+TEST_F(BoundsTest, LineNestedTooDeepIsSkipped) {
+  const std::string deep = std::string(100'000, '[') + std::string(100'000, ']');
+  EXPECT_EQ(Folded("{\"data\":" + deep + ",\"event\":2,\"path\":\"/a\"}\n" + deep + "\n" +
+                   Line(EVENT_MODIFY, "/b")),
+            Strings{"index /b"});
+  EXPECT_EQ(fake::LogsWith("code=906").size(), 2u);
+}
+
+}  // namespace
+}  // namespace quarry::fileindex

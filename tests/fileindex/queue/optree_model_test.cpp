@@ -1,0 +1,197 @@
+// The tree against the plain model, on random queues.
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <memory>
+#include <random>
+#include <string>
+#include <vector>
+
+#include "common/error.h"
+#include "fileindex/queue/optree.h"
+#include "tests/fake_platform/fixture.h"
+#include "tests/fileindex/queue/naive_tree.h"
+#include "tests/fileindex/queue/queue_lines.h"
+
+namespace quarry::fileindex {
+namespace {
+
+struct Mix {
+  const char* name;
+  int names;   // how many names a directory may hold
+  int depth;   // the longest path, in components
+  int events;  // per queue
+  int seeds;
+  int rename_odds;  // one in so many events is a rename, one a reindex
+  int bits_odds;    // one in so many events has several bits
+  bool odd_paths;   // "/", "//a/", ""
+};
+
+std::ostream& operator<<(std::ostream& stream, const Mix& mix) {
+  return stream << mix.name;
+}
+
+class Generator {
+ public:
+  Generator(const Mix& mix, unsigned int seed) : mix_(mix), random_(seed) {}
+
+  NaiveEvent Next() {
+    NaiveEvent event;
+    event.op = Kind();
+    event.is_dir = Pick(4) == 0;
+    event.path = Path();
+    if (event.op & EVENT_RENAME) event.path_old = Pick(4) == 0 ? Near(event.path) : Path();
+    if (event.op & EVENT_UPDATE_CFG) event.data = Data();
+    return event;
+  }
+
+ private:
+  int Pick(int count) { return std::uniform_int_distribution<int>(0, count - 1)(random_); }
+
+  std::uint32_t Kind() {
+    static const std::uint32_t kKinds[] = {EVENT_MODIFY, EVENT_ATTR, EVENT_CREATE, EVENT_DELETE,
+                                           EVENT_UPDATE_CFG};
+    if (Pick(mix_.rename_odds) == 0) return EVENT_RENAME;
+    if (Pick(mix_.rename_odds) == 0) return EVENT_REINDEX;
+    std::uint32_t kind = kKinds[Pick(5)];
+    if (Pick(mix_.bits_odds) != 0) return kind;
+    for (const std::uint32_t bit : {0x1u, 0x2u, 0x4u, 0x40u, 0x80u, 0x100u, 0x10000u, 0x20000u}) {
+      if (Pick(3) == 0) kind |= bit;
+    }
+    return kind;
+  }
+
+  std::string Path() {
+    if (mix_.odd_paths && Pick(30) == 0) return Pick(2) == 0 ? "/" : "";
+    std::string path;
+    for (int left = 1 + Pick(mix_.depth); left > 0; --left) {
+      path += mix_.odd_paths && Pick(20) == 0 ? "//" : "/";
+      path += static_cast<char>('a' + Pick(mix_.names));
+    }
+    return mix_.odd_paths && Pick(20) == 0 ? path + "/" : path;
+  }
+
+  // A place above or below, so that renames go into themselves.
+  std::string Near(const std::string& path) {
+    if (Pick(2) == 0) return path + Path();
+    return path.substr(0, path.rfind('/') == std::string::npos ? 0 : path.rfind('/'));
+  }
+
+  Json::Value Data() {
+    Json::Value data;
+    if (Pick(12) == 0) return Json::Value(7);
+    for (const char* name : {"document", "audio", "video", "photo", "other"}) {
+      if (Pick(3) == 0) data[name] = Pick(2) == 0;
+    }
+    return data;
+  }
+
+  const Mix& mix_;
+  std::mt19937 random_;
+};
+
+std::string Show(const NaiveEvent& event) {
+  return std::to_string(event.op) + (event.is_dir ? "d " : " ") + event.path_old + " -> " +
+         event.path + " " + toString(event.data);
+}
+
+std::string Show(int op, const std::string& src, const std::string& path, const Json::Value& data) {
+  return std::to_string(op) + " " + src + " -> " + path + " " + toString(data);
+}
+
+std::vector<std::string> Show(const NaiveList& list) {
+  std::vector<std::string> texts;
+  for (const auto& e : list) texts.push_back(Show(e->op, e->src, e->path, e->data));
+  return texts;
+}
+
+std::vector<std::string> Show(const std::vector<std::shared_ptr<OP>>& list) {
+  std::vector<std::string> texts;
+  for (const auto& e : list) texts.push_back(Show(e->op, e->src, e->node->GetPath(), e->data));
+  return texts;
+}
+
+// Whether both say that the event cannot be folded, or both that it can.
+bool SameVerdict(OPTree& tree, NaiveTree& model, const NaiveEvent& event) {
+  const auto real = std::make_shared<Event>(R"({"event":0,"path":""})");
+  real->op = event.op;
+  real->is_dir = event.is_dir;
+  real->path = event.path;
+  real->path_old = event.path_old;
+  real->data = event.data;
+  bool refused = false;
+  bool model_refused = false;
+  try {
+    tree.InsertEvent(real);
+  } catch (const Error&) {
+    refused = true;
+  }
+  try {
+    model.Insert(event);
+  } catch (const NaiveFailure&) {
+    model_refused = true;
+  }
+  return refused == model_refused;
+}
+
+void CompareNodes(OPTree& tree, const NaiveTree& model) {
+  std::vector<std::string> paths;
+  tree.TraverseNodeDescendant(
+      tree.root,
+      [&](std::shared_ptr<OPNode> node) {
+        const std::string path = node->GetPath();
+        paths.push_back(path);
+        std::vector<std::string> list = Show(node->ops);
+        std::vector<std::string> expected = Show(model.At(path));
+        if (list.size() > 32) {  // the order of long lists is nobody's business
+          std::sort(list.begin(), list.end());
+          std::sort(expected.begin(), expected.end());
+        }
+        EXPECT_EQ(list, expected) << path;
+        std::vector<std::string> children;
+        for (const auto& child : node->children) children.push_back(child->GetPath());
+        EXPECT_EQ(children, model.ChildrenOf(path));
+      },
+      false);
+  std::sort(paths.begin(), paths.end());
+  EXPECT_EQ(paths, model.Paths());
+}
+
+class ModelTest : public fake::FakePlatformTest, public ::testing::WithParamInterface<Mix> {};
+
+TEST_P(ModelTest, TreeAndModelAgree) {
+  const QueueFile queue;
+  for (int seed = 0; seed < GetParam().seeds; ++seed) {
+    SCOPED_TRACE("seed " + std::to_string(seed));
+    Generator generator(GetParam(), static_cast<unsigned int>(seed));
+    OPTree tree(queue.path());
+    NaiveTree model;
+    std::string history;
+    for (int i = 0; i < GetParam().events; ++i) {
+      const NaiveEvent event = generator.Next();
+      history += Show(event) + "\n";
+      ASSERT_TRUE(SameVerdict(tree, model, event)) << history;
+      if (GetParam().events > 100 && i % 50 != 0) continue;
+      ASSERT_EQ(Show(tree.ops), Show(model.ops)) << history;
+    }
+    ASSERT_EQ(Show(tree.ops), Show(model.ops)) << history;
+    CompareNodes(tree, model);
+    ASSERT_FALSE(HasFailure()) << history;
+  }
+}
+
+INSTANTIATE_TEST_SUITE_P(Mixes, ModelTest,
+                         ::testing::Values(Mix{"small", 2, 2, 20, 1500, 3, 6, false},
+                                           Mix{"deep", 2, 5, 40, 500, 3, 6, false},
+                                           Mix{"wide", 12, 2, 60, 200, 4, 8, false},
+                                           Mix{"odd", 2, 3, 30, 800, 3, 3, true},
+                                           Mix{"calm", 3, 3, 60, 300, 15, 50, false},
+                                           Mix{"one_place", 1, 1, 300, 30, 6, 4, true},
+                                           Mix{"long_lists", 2, 2, 400, 60, 4, 6, false},
+                                           Mix{"long_lists_of_renames", 2, 1, 400, 60, 2, 10,
+                                               true}),
+                         ::testing::PrintToStringParamName());
+
+}  // namespace
+}  // namespace quarry::fileindex
