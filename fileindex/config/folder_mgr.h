@@ -19,7 +19,7 @@ namespace fileindex {
 QUARRY_EXPORT extern const std::string kFileIndexFoldersCfgPath;
 
 // The most folders that the list may hold.
-constexpr std::size_t kFileIndexFoldersMax = 1000;
+inline constexpr std::size_t kFileIndexFoldersMax = 1000;
 
 // A short-lived value: load, ask or change, Save(). It takes no lock; whoever changes the list
 // holds the lock file "/tmp/quarry_cfg_folder.lock" from before the load until after the save. One

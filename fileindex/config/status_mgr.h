@@ -17,8 +17,8 @@ namespace fileindex {
 QUARRY_EXPORT extern const std::string kFileIndexStatusCfgPath;
 
 // Bits of a share's status.
-constexpr int kShareNeedReindex = 1;  // its documents are doubtful
-constexpr int kShareNeedRebuild = 2;  // its index must be deleted and created anew
+inline constexpr int kShareNeedReindex = 1;  // its documents are doubtful
+inline constexpr int kShareNeedRebuild = 2;  // its index must be deleted and created anew
 
 // A short-lived value: constructing one loads the file, each changing member saves it. A change is
 // made to what this object loaded, so hold one for one operation only. Changing members hold the

@@ -429,6 +429,17 @@ TEST_F(FolderRefusalTest, AnUnknownShareAndAPathOfNoShare) {
   EXPECT_THAT(effects_->All(), IsEmpty());
 }
 
+TEST_F(FolderRefusalTest, APathWithANulByteEvenInUpdaterMode) {
+  Begin();
+  for (const std::string& path : {std::string("/photo/a\0b", 10), std::string("/photo\0/a", 9)}) {
+    for (bool updater_mode : {true, false}) {
+      EXPECT_NE(FailureOf([&] { FolderAdd(Array({Record(path)}), updater_mode); }), "");
+      EXPECT_NE(FailureOf([&] { FolderSet(Array({Record(path)}), updater_mode); }), "");
+    }
+  }
+  EXPECT_THAT(effects_->All(), IsEmpty());
+}
+
 TEST_F(FolderRefusalTest, AShareThatMayHaveNoIndex) {
   fake::AddShare({"photo", volume_ + "/photo", false, true});
   Begin();

@@ -151,6 +151,11 @@ TEST_F(FolderMgrTest, AFileThatIsNotJsonIsRefused) {
   }
 }
 
+TEST_F(FolderMgrTest, AFileNestedBeyondReasonIsRefused) {
+  Store(std::string(100000, '[') + std::string(100000, ']'));
+  EXPECT_EQ(LoadFailure(), "504 Cannot load json: " + kFileIndexFoldersCfgPath);
+}
+
 TEST_F(FolderMgrTest, SomethingThatIsNoRegularFileIsRefused) {
   const std::string refused = "504 Cannot load json: " + kFileIndexFoldersCfgPath;
   test::MakeDirs(kFileIndexFoldersCfgPath);

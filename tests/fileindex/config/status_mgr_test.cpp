@@ -84,6 +84,13 @@ TEST_F(StatusMgrTest, AFileThatIsNotJsonIsRefused) {
   }
 }
 
+TEST_F(StatusMgrTest, AFileNestedBeyondReasonIsRefused) {
+  std::string text;
+  for (int i = 0; i < 100000; ++i) text += "{\"a\":";
+  Store(text + "1" + std::string(100000, '}'));
+  EXPECT_EQ(CodeOf([] { StatusMgr(); }), 504);
+}
+
 TEST_F(StatusMgrTest, SomethingThatIsNoRegularFileIsRefused) {
   test::MakeDirs(kFileIndexStatusCfgPath);
   EXPECT_EQ(CodeOf([] { StatusMgr(); }), 504);
