@@ -1,0 +1,387 @@
+#include "daemons/tarnelasticd/engine.h"
+
+#include <sys/random.h>
+
+#include <array>
+#include <cstdio>
+#include <new>
+#include <utility>
+#include <vector>
+
+#include "common/json.h"
+#include "daemons/common/log.h"
+#include "daemons/tarnelasticd/engine_error.h"
+#include "daemons/tarnelasticd/index_files.h"
+#include "daemons/tarnelasticd/request.h"
+#include "daemons/tarnelasticd/search.h"
+#include "daemons/tarnelasticd/selection.h"
+
+namespace quarry::engine {
+namespace {
+
+// A number that no other life of this process has had.
+std::string RandomId() {
+  std::array<unsigned char, 16> bytes{};
+  if (getrandom(bytes.data(), bytes.size(), 0) != static_cast<ssize_t>(bytes.size())) {
+    throw Error(kErrorSystem, "The system gives no random numbers");
+  }
+  std::string id;
+  for (const unsigned char byte : bytes) {
+    std::array<char, 3> hex{};
+    std::snprintf(hex.data(), hex.size(), "%02x", byte);
+    id += hex.data();
+  }
+  return id;
+}
+
+Json::Value Success(Json::Value data) {
+  Json::Value response;
+  response["success"] = true;
+  if (!data.isNull()) response["data"] = std::move(data);
+  return response;
+}
+
+Json::Value Failure(int code, const std::string& message) {
+  Json::Value response;
+  response["success"] = false;
+  response["error"]["code"] = code;
+  response["error"]["msg"] = message;
+  return response;
+}
+
+// What the administrator must know of; mistakes of peers are theirs.
+void LogFailure(const std::string& command, const Error& error) {
+  switch (static_cast<int>(error.code())) {
+    case kErrorEngineBusy:
+    case kErrorEngineBusyMemory:
+    case kDamagedIndex:
+    case kDiskFull:
+    case kStorageFailed:
+    case kInternalFailure:
+    case kOutOfMemory:
+      daemon::LogError(command + " failed: " + error.reason());
+      break;
+    default:
+      break;
+  }
+}
+
+std::optional<std::string> OptionalName(const Json::Value& data, const char* key) {
+  if (!data.isMember(key)) return std::nullopt;
+  return NameProperty(data, key);
+}
+
+// Damage that shows up during work is remembered, so that the next index_create repairs it.
+template <typename Action>
+auto NotingDamage(Index* index, Action action) {
+  try {
+    return action();
+  } catch (const Error& error) {
+    if (error.code() == ErrorCode{kDamagedIndex}) index->NoteDamage(error);
+    throw;
+  }
+}
+
+// An index and its reader for one search.
+class OpenIndex {
+ public:
+  OpenIndex(std::shared_ptr<Index> index, std::chrono::steady_clock::time_point deadline)
+      : index_(std::move(index)), access_(index_.get()), reader_(access_.TakeReader()) {
+    reader_->Begin(deadline);
+  }
+  SearchedIndex Searched(const std::string& id) const { return {id, access_.schema(), &*reader_}; }
+
+ private:
+  std::shared_ptr<Index> index_;
+  Index::Access access_;
+  ReaderPool::Lease reader_;
+};
+
+Json::Value SkippedJson(const std::string& id, int code, const std::string& message) {
+  Json::Value json;
+  json["id"] = id;
+  json["code"] = code;
+  json["msg"] = message;
+  return json;
+}
+
+}  // namespace
+
+Engine::Engine(const EngineOptions& options)
+    : options_(options),
+      life_(RandomId()),
+      memory_(options.memory_bytes),
+      catalog_(options.registry_path, options.writer, [this] { ++losses_; }) {}
+
+Engine::~Engine() {
+  CommitAll();
+}
+
+const std::map<std::string, Engine::Command>& Engine::Commands() {
+  static const std::map<std::string, Command> commands = {
+      {"index_create", {&Engine::IndexCreate, true}},
+      {"index_delete", {&Engine::IndexDelete, true}},
+      {"index_pause", {&Engine::IndexPause, true}},
+      {"index_resume", {&Engine::IndexResume, true}},
+      {"index_config_set", {&Engine::IndexConfigSet, true}},
+      {"document_upsert_by_id", {&Engine::DocumentUpsert, false}},
+      {"document_set_by_id", {&Engine::DocumentSet, false}},
+      {"document_del_by_id", {&Engine::DocumentDelete, false}},
+      {"document_del_by_query", {&Engine::DocumentDeleteByQuery, false}},
+      {"document_get_by_query", {&Engine::DocumentGetByQuery, false}},
+      {"commit", {&Engine::Commit, false}},
+      {"update_term_suggestion", {&Engine::UpdateTermSuggestion, false}},
+      {"search", {&Engine::Search, false}},
+      {"engine_status", {&Engine::Status, true}},
+  };
+  return commands;
+}
+
+std::string Engine::HandleText(const std::string& text) {
+  Json::Value request;
+  if (!fromString(request, text)) {
+    return toString(Failure(kMalformedRequest, "The request is no JSON"));
+  }
+  return toString(Handle(request));
+}
+
+Json::Value Engine::Handle(const Json::Value& request) {
+  if (request.isObject() && request.isMember("compound")) return HandleBatch(request["compound"]);
+  return HandleOne(request);
+}
+
+Json::Value Engine::HandleBatch(const Json::Value& elements) {
+  if (!elements.isArray()) return Failure(kMalformedRequest, "Not an array: compound");
+  Json::Value response = Success(Json::Value(Json::arrayValue));
+  response["has_fail"] = false;
+  for (const Json::Value& element : elements) {
+    Json::Value answer = HandleOne(element);
+    if (!answer["success"].asBool()) response["has_fail"] = true;
+    response["data"].append(std::move(answer));
+  }
+  return response;
+}
+
+Json::Value Engine::HandleOne(const Json::Value& request) {
+  std::string name = "A request";
+  try {
+    name = StringProperty(request, "command");
+    return Success(RunCommand(name, request));
+  } catch (const Error& error) {
+    LogFailure(name, error);
+    return Failure(error.code(), error.reason());
+  } catch (const Json::Exception& failure) {
+    return Failure(kMalformedRequest, failure.what());
+  } catch (const std::exception& failure) {
+    LogFailure(name, Error(kInternalFailure, failure.what()));
+    return Failure(kInternalFailure, failure.what());
+  }
+}
+
+Json::Value Engine::RunCommand(const std::string& name, const Json::Value& request) {
+  const auto command = Commands().find(name);
+  if (command == Commands().end()) throw Error(kUnknownCommand, "There is no command " + name);
+  static const Json::Value none(Json::objectValue);
+  const bool has_data = name != "engine_status" || request.isMember("data");
+  try {
+    try {
+      return (this->*command->second.run)(has_data ? ObjectProperty(request, "data") : none);
+    } catch (const std::bad_alloc&) {
+      throw Error(kErrorEngineBusyMemory, "Out of memory");
+    }
+  } catch (const Error& error) {
+    if (!command->second.never_busy || error.code() != kErrorEngineBusyMemory) throw;
+    throw Error(kOutOfMemory, error.reason());
+  }
+}
+
+Json::Value Engine::IndexCreate(const Json::Value& data) {
+  IndexRecord record;
+  record.id = NameProperty(data, "id");
+  record.path = NameProperty(data, "path");
+  CheckDirectory(record.path);
+  record.settings = data["settings"];
+  record.mappings = data["mappings"];
+  record.event_handler = data["event_handler"];
+  catalog_.Create(record);
+  return {};
+}
+
+Json::Value Engine::IndexDelete(const Json::Value& data) {
+  catalog_.Delete(NameProperty(data, "id"));
+  return {};
+}
+
+Json::Value Engine::IndexPause(const Json::Value& data) {
+  catalog_.SetPaused(NameProperty(data, "id"), true);
+  return {};
+}
+
+Json::Value Engine::IndexResume(const Json::Value& data) {
+  catalog_.SetPaused(NameProperty(data, "id"), false);
+  return {};
+}
+
+Json::Value Engine::IndexConfigSet(const Json::Value& data) {
+  const std::string id = NameProperty(data, "id");
+  const Json::Value& changes = ObjectProperty(data, "data");
+  const std::optional<std::string> new_path = OptionalName(changes, "path");
+  if (new_path) CheckDirectory(*new_path);
+  Json::Value result;
+  result["found"] = catalog_.Configure(id, OptionalName(changes, "id"), new_path);
+  return result;
+}
+
+Json::Value Engine::DocumentUpsert(const Json::Value& data) {
+  const std::shared_ptr<Index> index = catalog_.Find(NameProperty(data, "id"));
+  const std::string path = NameProperty(data, "doc_id");
+  const Json::Value& document = ObjectProperty(data, "data");
+  const MemoryBudget::Share memory(&memory_, EstimateMemory(document));
+  Index::Access access(index.get());
+  PreparedDocument prepared = PrepareDocument(*access.schema(), path, document);
+  NotingDamage(index.get(), [&] {
+    access.Write([&](IndexWriter& writer) { writer.Upsert(std::move(prepared)); });
+  });
+  return {};
+}
+
+Json::Value Engine::DocumentSet(const Json::Value& data) {
+  const std::shared_ptr<Index> index = catalog_.Find(NameProperty(data, "id"));
+  const std::string path = NameProperty(data, "doc_id");
+  const Json::Value& changes = ObjectProperty(data, "data");
+  const MemoryBudget::Share memory(&memory_, EstimateMemory(changes));
+  Index::Access access(index.get());
+  Json::Value result;
+  result["found"] = NotingDamage(index.get(), [&] {
+    return access.Write([&](IndexWriter& writer) { return writer.Set(path, changes); });
+  });
+  return result;
+}
+
+Json::Value Engine::DocumentDelete(const Json::Value& data) {
+  const std::shared_ptr<Index> index = catalog_.Find(NameProperty(data, "id"));
+  const std::string path = NameProperty(data, "doc_id");
+  Index::Access access(index.get());
+  Json::Value result;
+  result["found"] = NotingDamage(index.get(), [&] {
+    return access.Write([&](IndexWriter& writer) { return writer.Delete(path); });
+  });
+  return result;
+}
+
+Json::Value Engine::DocumentDeleteByQuery(const Json::Value& data) {
+  const std::shared_ptr<Index> index = catalog_.Find(NameProperty(data, "id"));
+  Index::Access access(index.get());
+  const Selection selection = ParseSelection(*access.schema(), ObjectProperty(data, "query"));
+  Json::Value result;
+  result["deleted"] = Json::Int64{NotingDamage(index.get(), [&] {
+    return access.Write([&](IndexWriter& writer) { return writer.DeleteSelected(selection); });
+  })};
+  return result;
+}
+
+Json::Value Engine::DocumentGetByQuery(const Json::Value& data) {
+  const std::shared_ptr<Index> index = catalog_.Find(NameProperty(data, "id"));
+  Index::Access access(index.get());
+  const Selection selection = ParseSelection(*access.schema(), ObjectProperty(data, "query"));
+  return NotingDamage(index.get(), [&] {
+    return access.UseWriter([&](IndexWriter& writer) { return writer.Find(selection); });
+  });
+}
+
+Json::Value Engine::Commit(const Json::Value& data) {
+  const std::shared_ptr<Index> index = catalog_.Find(NameProperty(data, "id"));
+  NotingDamage(index.get(), [&] { index->Commit(); });
+  return {};
+}
+
+Json::Value Engine::UpdateTermSuggestion(const Json::Value& data) {
+  const std::shared_ptr<Index> index = catalog_.Find(NameProperty(data, "db_name"));
+  StringProperty(data, "doc_id_field");
+  // What a paused index suggests cannot have changed.
+  if (index->paused()) return {};
+  Index::Access access(index.get());
+  NotingDamage(index.get(),
+               [&] { access.Write([](IndexWriter& writer) { writer.RequestTerms(); }); });
+  return {};
+}
+
+std::map<std::string, std::shared_ptr<Index>> Engine::SearchedIndexes(const Json::Value& data,
+                                                                      Json::Value* skipped) const {
+  if (!data.isMember("ids")) return catalog_.All();
+  if (!data["ids"].isArray()) FailMalformed("Not an array: ids");
+  std::map<std::string, std::shared_ptr<Index>> indexes;
+  for (const Json::Value& id : data["ids"]) {
+    if (!id.isString()) FailMalformed("Not a string: ids");
+    try {
+      indexes[id.asString()] = catalog_.Find(id.asString());
+    } catch (const Error& error) {
+      skipped->append(SkippedJson(id.asString(), error.code(), error.reason()));
+    }
+  }
+  return indexes;
+}
+
+Json::Value Engine::Search(const Json::Value& data) {
+  const SearchRequest request = ParseSearchRequest(data);
+  ParseQuery(request.query);
+  const auto deadline = std::chrono::steady_clock::now() + options_.search_time;
+  Json::Value skipped(Json::arrayValue);
+  std::vector<std::unique_ptr<OpenIndex>> open;
+  std::vector<SearchedIndex> searched;
+  for (const auto& [id, index] : SearchedIndexes(data, &skipped)) {
+    try {
+      NotingDamage(index.get(), [&] {
+        open.push_back(std::make_unique<OpenIndex>(index, deadline));
+        searched.push_back(open.back()->Searched(id));
+      });
+    } catch (const Error& error) {
+      if (error.code() != ErrorCode{kDamagedIndex}) throw;
+      skipped.append(SkippedJson(id, error.code(), error.reason()));
+    }
+  }
+  // One index that is gone must not hide what the others hold; but all gone is a failure.
+  if (searched.empty() && !skipped.empty()) {
+    throw Error(skipped[0]["code"].asInt(), skipped[0]["msg"].asString());
+  }
+  Json::Value found = engine::Search(request, searched);
+  if (!skipped.empty()) found["skipped"] = std::move(skipped);
+  return found;
+}
+
+Json::Value Engine::Status(const Json::Value& /*data*/) {
+  Json::Value status;
+  status["epoch"] = Epoch();
+  status["indexes"] = Json::Value(Json::arrayValue);
+  for (const auto& [id, index] : catalog_.All()) {
+    Json::Value entry;
+    entry["id"] = id;
+    entry["documents"] = Json::Int64{index->documents()};
+    entry["paused"] = index->paused();
+    const std::string problem = index->Problem();
+    if (!problem.empty()) entry["problem"] = problem;
+    status["indexes"].append(std::move(entry));
+  }
+  return status;
+}
+
+// Work that was not committed is gone with this process, and also when the engine had to undo it.
+std::string Engine::Epoch() const {
+  return life_ + '.' + std::to_string(losses_.load());
+}
+
+void Engine::Tick() {
+  for (const auto& [id, index] : catalog_.All()) index->CommitIfOld();
+}
+
+void Engine::CommitAll() {
+  for (const auto& [id, index] : catalog_.All()) {
+    try {
+      index->Commit();
+    } catch (const Error& error) {
+      if (index->Problem().empty()) daemon::LogError("Commit failed: " + error.reason());
+    }
+  }
+}
+
+}  // namespace quarry::engine

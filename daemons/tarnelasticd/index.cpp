@@ -1,0 +1,190 @@
+#include "daemons/tarnelasticd/index.h"
+
+#include <utility>
+
+#include "daemons/common/log.h"
+#include "daemons/tarnelasticd/compression.h"
+#include "daemons/tarnelasticd/document.h"
+#include "daemons/tarnelasticd/index_files.h"
+
+namespace quarry::engine {
+
+Index::Index(std::string directory, bool paused, WriterLimits limits, std::function<void()> on_lost)
+    : limits_(limits),
+      on_lost_(std::move(on_lost)),
+      paused_(paused),
+      directory_(std::move(directory)) {}
+
+Index::Access::Access(Index* index) : index_(index), lock_(index->gate_) {
+  if (!index_->store_) throw Error(kDamagedIndex, index_->Problem());
+}
+
+const std::shared_ptr<const Schema>& Index::Access::schema() const {
+  return index_->store_->schema;
+}
+
+ReaderPool::Lease Index::Access::TakeReader() {
+  return index_->store_->readers->Take();
+}
+
+void Index::CheckLost() {
+  if (store_->writer->TakeLost()) on_lost_();
+}
+
+// However replacing the database ends, what is there then is opened.
+struct Index::Reopen {
+  Index* index;
+  ~Reopen() { index->OpenLocked(); }
+};
+
+bool Index::OpenLocked() {
+  if (store_) return true;
+  try {
+    auto store = std::make_unique<Store>();
+    store->schema = LoadSchema(directory_);
+    store->writer = std::make_unique<IndexWriter>(DatabasePath(directory_), store->schema, limits_);
+    store->readers = std::make_unique<ReaderPool>(DatabasePath(directory_));
+    store_ = std::move(store);
+    const std::lock_guard<std::mutex> lock(problem_mutex_);
+    problem_.clear();
+    return true;
+  } catch (const Error& error) {
+    NoteDamage(error);
+    return false;
+  }
+}
+
+bool Index::Open() {
+  const std::unique_lock<std::shared_mutex> lock(gate_);
+  return OpenLocked();
+}
+
+bool Index::IsSound() {
+  if (!Problem().empty()) return false;
+  const std::shared_lock<std::shared_mutex> lock(gate_);
+  if (!store_) return false;
+  const std::lock_guard<std::mutex> writer_lock(writer_mutex_);
+  return store_->writer->IsInPlace();
+}
+
+void Index::NoteDamage(const Error& error) {
+  const std::lock_guard<std::mutex> lock(problem_mutex_);
+  if (problem_ == error.reason()) return;
+  problem_ = error.reason();
+  daemon::LogError("An index cannot be used: " + problem_);
+}
+
+std::string Index::Problem() {
+  const std::lock_guard<std::mutex> lock(problem_mutex_);
+  return problem_;
+}
+
+std::string Index::directory() {
+  const std::shared_lock<std::shared_mutex> lock(gate_);
+  return directory_;
+}
+
+std::int64_t Index::documents() {
+  // Whoever asks how things stand must not wait for a database that is being moved.
+  const std::shared_lock<std::shared_mutex> lock(gate_, std::try_to_lock);
+  return lock.owns_lock() && store_ ? store_->writer->documents() : 0;
+}
+
+void Index::Recreate(const Schema& schema) {
+  const std::unique_lock<std::shared_mutex> lock(gate_);
+  const Reopen reopen{this};
+  if (store_ && store_->writer->HasUncommitted()) on_lost_();
+  store_.reset();
+  CreateDatabase(directory_, schema);
+}
+
+void Index::CopyDocuments(const Schema& schema, const std::string& database_path) {
+  IndexWriter writer(database_path, std::make_shared<const Schema>(schema), limits_);
+  const ReaderPool::Lease reader = store_->readers->Take();
+  const Schema& old = *store_->schema;
+  Statement rows = reader->db().Prepare("SELECT " + RowColumns(old) + " FROM docs ORDER BY id");
+  Statement text = reader->db().Prepare("SELECT packed FROM texts WHERE id=?1");
+  while (rows.Step()) {
+    Json::Value document = ReadRow(old, rows, nullptr);
+    text.Bind(1, rows.Int(0));
+    if (text.Step()) AddTexts(old, Decompress(text.Blob(0)), nullptr, &document);
+    text.Reset();
+    writer.Upsert(PrepareDocument(schema, rows.Text(1), document));
+  }
+  writer.Commit();
+}
+
+void Index::Remap(const Schema& schema) {
+  const std::unique_lock<std::shared_mutex> lock(gate_);
+  if (!store_) throw Error(kDamagedIndex, Problem());
+  const Reopen reopen{this};
+  store_->writer->Commit();
+  CopyDocuments(schema, CreateSpareDatabase(directory_, schema));
+  store_.reset();
+  PlaceSpareDatabase(directory_);
+}
+
+void Index::Remove() {
+  const std::unique_lock<std::shared_mutex> lock(gate_);
+  store_.reset();
+  RemoveDatabase(directory_);
+}
+
+void Index::CloseCommitted() {
+  if (!store_) return;
+  try {
+    store_->writer->Commit();
+  } catch (const Error& error) {
+    CheckLost();
+    // A database that is gone or broken has nothing that could be kept.
+    if (error.code() != ErrorCode{kDamagedIndex}) throw;
+  }
+  store_.reset();
+}
+
+void Index::Move(const std::string& to, const MoveSteps& steps) {
+  const std::unique_lock<std::shared_mutex> lock(gate_);
+  const Reopen reopen{this};
+  CloseCommitted();
+  const bool has_database = HasDatabase(directory_) || HasDatabase(to);
+  steps.begin();
+  if (has_database && directory_ != to) {
+    try {
+      MoveDatabase(directory_, to);
+    } catch (const Error&) {
+      // Once the new place has it, the rest is tidying up.
+      if (!HasDatabase(to)) {
+        steps.abandon();
+        throw;
+      }
+    }
+  }
+  directory_ = to;
+  steps.end();
+}
+
+void Index::Commit() {
+  Access(this).UseWriter([](IndexWriter& writer) { writer.Commit(); });
+}
+
+void Index::CommitIfOld() {
+  const std::shared_lock<std::shared_mutex> lock(gate_, std::try_to_lock);
+  if (!lock.owns_lock() || !store_ || !store_->writer->HasUncommitted()) return;
+  const std::unique_lock<std::mutex> writer_lock(writer_mutex_, std::try_to_lock);
+  if (!writer_lock.owns_lock()) return;
+  try {
+    store_->writer->CommitIfOld();
+  } catch (const Error& error) {
+    daemon::LogError("An index lost uncommitted work: " + error.reason());
+  }
+  CheckLost();
+}
+
+void Index::Pause() {
+  Access(this).UseWriter([this](IndexWriter& writer) {
+    writer.Commit();
+    paused_ = true;
+  });
+}
+
+}  // namespace quarry::engine

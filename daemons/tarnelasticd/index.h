@@ -1,0 +1,140 @@
+// One index, open and in use by several threads.
+
+#ifndef QUARRY_DAEMONS_TARNELASTICD_INDEX_H_
+#define QUARRY_DAEMONS_TARNELASTICD_INDEX_H_
+
+#include <atomic>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <shared_mutex>
+#include <string>
+
+#include "common/error.h"
+#include "daemons/tarnelasticd/engine_error.h"
+#include "daemons/tarnelasticd/index_reader.h"
+#include "daemons/tarnelasticd/index_writer.h"
+#include "daemons/tarnelasticd/schema.h"
+
+namespace quarry::engine {
+
+// Any thread. Writers of one index wait for each other; readers wait for nobody but for who
+// replaces or moves the database.
+class Index {
+ public:
+  // `on_lost` is called, from any thread, when work that was not committed has been undone.
+  Index(std::string directory, bool paused, WriterLimits limits, std::function<void()> on_lost);
+  Index(const Index&) = delete;
+  Index& operator=(const Index&) = delete;
+
+  // Keeps the database open as long as it lives: replacing or moving it waits.
+  class Access {
+   public:
+    // Throws Error kDamagedIndex, saying why, when there is no sound database.
+    explicit Access(Index* index);
+
+    const std::shared_ptr<const Schema>& schema() const;
+    ReaderPool::Lease TakeReader();
+
+    // Runs `action` with the writer to itself. Throws Error kPausedIndex when the index takes no
+    // writes.
+    template <typename Action>
+    auto Write(Action action) {
+      return index_->UseWriter(/*paused_too=*/false, action);
+    }
+    // The same for what changes nothing that was not there.
+    template <typename Action>
+    auto UseWriter(Action action) {
+      return index_->UseWriter(/*paused_too=*/true, action);
+    }
+
+   private:
+    Index* index_;
+    std::shared_lock<std::shared_mutex> lock_;
+  };
+
+  // Opens the database. Returns whether it is sound; if it is not, says why in the log, and every
+  // Access does. Opening what is open already does nothing.
+  bool Open();
+  // Whether the database is open, nothing was found wrong with it and its file is in its place.
+  bool IsSound();
+  // Remembers that the database turned out to be damaged. Logs it.
+  void NoteDamage(const Error& error);
+
+  // Replaces the database, sound or not, by an empty one.
+  void Recreate(const Schema& schema);
+  // Gives a sound database other mappings; its documents stay.
+  void Remap(const Schema& schema);
+  // Closes the database for good and removes it.
+  void Remove();
+  // Moves the database to another directory, which holds none. All is committed before. `begin` is
+  // called before anything moves, `abandon` when moving has failed and the database is where it
+  // was, `end` once it has moved; what they throw is passed on. A database that is damaged moves as
+  // it is, and where there is none only the directory's name changes.
+  struct MoveSteps {
+    std::function<void()> begin;
+    std::function<void()> abandon;
+    std::function<void()> end;
+  };
+  void Move(const std::string& to, const MoveSteps& steps);
+
+  void Commit();
+  // Commits what has been open for too long. Does not wait for a writer that is at work.
+  void CommitIfOld();
+  // Commits, then refuses writes until Resume().
+  void Pause();
+  void Resume() { paused_ = false; }
+
+  bool paused() const { return paused_; }
+  // Documents, uncommitted ones included; 0 while there is no sound database.
+  std::int64_t documents();
+  // Why there is no sound database, or "".
+  std::string Problem();
+  std::string directory();
+
+ private:
+  struct Store {
+    std::shared_ptr<const Schema> schema;
+    std::unique_ptr<IndexWriter> writer;
+    std::unique_ptr<ReaderPool> readers;
+  };
+
+  struct Reopen;
+
+  template <typename Action>
+  auto UseWriter(bool paused_too, Action action);
+  void CheckLost();
+  void CloseCommitted();
+  bool OpenLocked();
+  void CopyDocuments(const Schema& schema, const std::string& database_path);
+
+  const WriterLimits limits_;
+  const std::function<void()> on_lost_;
+  std::atomic<bool> paused_;
+
+  // Shared by those who use the store, exclusive for those who replace it. Taken before
+  // writer_mutex_.
+  std::shared_mutex gate_;
+  std::mutex writer_mutex_;
+  std::string directory_;         // guarded by gate_
+  std::unique_ptr<Store> store_;  // guarded by gate_; its writer by writer_mutex_
+  std::mutex problem_mutex_;
+  std::string problem_;  // guarded by problem_mutex_
+};
+
+template <typename Action>
+auto Index::UseWriter(bool paused_too, Action action) {
+  const std::lock_guard<std::mutex> lock(writer_mutex_);
+  if (paused_ && !paused_too) throw Error(kPausedIndex, "The index is paused");
+  struct AtEnd {
+    Index* index;
+    ~AtEnd() { index->CheckLost(); }
+  } at_end{this};
+  return action(*store_->writer);
+}
+
+}  // namespace quarry::engine
+
+#endif  // QUARRY_DAEMONS_TARNELASTICD_INDEX_H_

@@ -1,0 +1,60 @@
+#include "daemons/tarnelasticd/index_reader.h"
+
+#include <utility>
+
+namespace quarry::engine {
+namespace {
+
+constexpr std::size_t kMaxIdle = 4;
+constexpr int kProgressSteps = 20000;
+
+}  // namespace
+
+// Opened for writing although it never writes: a reader must be able to tend the log's index.
+IndexReader::IndexReader(const std::string& database_path)
+    : db_(database_path, Database::Mode::kReadWrite), tokenizer_(db_.handle()) {
+  db_.Execute("PRAGMA query_only=ON;PRAGMA cache_size=-8192;");
+  RegisterRanking(db_.handle(), &rank_context_);
+  sqlite3_progress_handler(db_.handle(), kProgressSteps, &OnProgress, this);
+}
+
+int IndexReader::OnProgress(void* self) {
+  return std::chrono::steady_clock::now() > static_cast<IndexReader*>(self)->deadline_ ? 1 : 0;
+}
+
+void IndexReader::Begin(std::chrono::steady_clock::time_point deadline) {
+  deadline_ = deadline;
+  db_.Execute("BEGIN");
+}
+
+void IndexReader::End() noexcept {
+  deadline_ = std::chrono::steady_clock::time_point::max();
+  rank_context_ = nullptr;
+  if (db_.InTransaction()) sqlite3_exec(db_.handle(), "ROLLBACK", nullptr, nullptr, nullptr);
+}
+
+ReaderPool::ReaderPool(std::string database_path) : path_(std::move(database_path)) {}
+
+ReaderPool::Lease::~Lease() {
+  if (reader_) pool_->Return(std::move(reader_));
+}
+
+ReaderPool::Lease ReaderPool::Take() {
+  {
+    const std::lock_guard<std::mutex> lock(mutex_);
+    if (!idle_.empty()) {
+      std::unique_ptr<IndexReader> reader = std::move(idle_.back());
+      idle_.pop_back();
+      return {this, std::move(reader)};
+    }
+  }
+  return {this, std::make_unique<IndexReader>(path_)};
+}
+
+void ReaderPool::Return(std::unique_ptr<IndexReader> reader) {
+  reader->End();
+  const std::lock_guard<std::mutex> lock(mutex_);
+  if (idle_.size() < kMaxIdle) idle_.push_back(std::move(reader));
+}
+
+}  // namespace quarry::engine

@@ -1,0 +1,371 @@
+#include "daemons/tarnelasticd/index_writer.h"
+
+#include <algorithm>
+#include <limits>
+#include <utility>
+#include <vector>
+
+#include "daemons/tarnelasticd/compression.h"
+#include "daemons/tarnelasticd/engine_error.h"
+#include "daemons/tarnelasticd/request.h"
+
+namespace quarry::engine {
+namespace {
+
+constexpr std::int64_t kDeleteChunk = 500;
+
+// Roughly what one row costs beside its text.
+constexpr std::size_t kRowBytes = 512;
+
+void Configure(Database* db) {
+  db->Execute(
+      "PRAGMA journal_mode=WAL;PRAGMA synchronous=FULL;PRAGMA cache_size=-16384;"
+      // Overwriting what is deleted with zeros would write every page twice.
+      "PRAGMA secure_delete=OFF;"
+      // A log file that one large transaction has blown up is cut back afterwards.
+      "PRAGMA wal_autocheckpoint=4000;PRAGMA journal_size_limit=67108864;");
+}
+
+std::string Placeholders(std::size_t first, std::size_t count) {
+  std::string list;
+  for (std::size_t i = 0; i < count; ++i) list += ",?" + std::to_string(first + i);
+  return list;
+}
+
+std::string InsertSql(const Schema& schema) {
+  return "INSERT INTO docs(" + RowColumns(schema) + ") VALUES(?1,?2,?3" +
+         Placeholders(4, schema.row_columns()) + ")";
+}
+
+std::string UpdateSql(const Schema& schema) {
+  std::string sql = "UPDATE docs SET path=?2,extra=?3";
+  for (std::size_t i = 0; i < schema.row_columns(); ++i) {
+    sql += ",c" + std::to_string(i) + "=?" + std::to_string(i + 4);
+  }
+  return sql + " WHERE id=?1";
+}
+
+void BindCell(Statement* statement, int index, const Cell& cell) {
+  if (const auto* number = std::get_if<std::int64_t>(&cell)) {
+    statement->Bind(index, *number);
+  } else if (const auto* real = std::get_if<double>(&cell)) {
+    statement->Bind(index, *real);
+  } else if (const auto* text = std::get_if<std::string>(&cell)) {
+    statement->Bind(index, std::string_view(*text));
+  } else {
+    statement->BindNull(index);
+  }
+}
+
+bool WantsText(const Schema& schema, const Selection& selection) {
+  if (!selection.load_fields) return false;
+  return std::any_of(selection.load_fields->begin(), selection.load_fields->end(),
+                     [&](const std::string& name) {
+                       const Field* field = schema.Find(name);
+                       return field != nullptr && field->storage == Storage::kText;
+                     });
+}
+
+void ApplyChanges(const Json::Value& changes, Json::Value* document) {
+  for (auto change = changes.begin(); change != changes.end(); ++change) {
+    if (change->isNull()) {
+      document->removeMember(change.name());
+    } else {
+      (*document)[change.name()] = *change;
+    }
+  }
+}
+
+}  // namespace
+
+PreparedDocument PrepareDocument(const Schema& schema, std::string_view path,
+                                 const Json::Value& document) {
+  PreparedDocument prepared{MakeDocument(schema, path, document), {}};
+  if (!prepared.document.body.empty()) prepared.packed = Compress(prepared.document.body);
+  return prepared;
+}
+
+IndexWriter::IndexWriter(const std::string& database_path, std::shared_ptr<const Schema> schema,
+                         const WriterLimits& limits)
+    : schema_(std::move(schema)),
+      limits_(limits),
+      db_(database_path, Database::Mode::kReadWrite),
+      tokenizer_(db_.handle()),
+      insert_sql_(InsertSql(*schema_)),
+      update_sql_(UpdateSql(*schema_)),
+      select_row_sql_("SELECT " + RowColumns(*schema_) + " FROM docs WHERE path=?1") {
+  Configure(&db_);
+  LoadCounters();
+}
+
+IndexWriter::~IndexWriter() {
+  Rollback();
+}
+
+void IndexWriter::LoadCounters() {
+  Statement last = db_.Prepare("SELECT max(id) FROM docs");
+  last.Step();
+  next_id_ = last.Int(0) + 1;
+  Statement count = db_.Prepare("SELECT value FROM meta WHERE key='documents'");
+  documents_ = count.Step() ? count.Int(0) : 0;
+}
+
+// Runs a change. Half a change must never be committed, so whatever fails undoes everything.
+template <typename Action>
+auto IndexWriter::Change(Action action) {
+  try {
+    Begin();
+    auto result = action();
+    FlushIfLarge();
+    return result;
+  } catch (...) {
+    Rollback();
+    throw;
+  }
+}
+
+void IndexWriter::Begin() {
+  if (uncommitted_) return;
+  db_.Execute("BEGIN IMMEDIATE");
+  uncommitted_ = true;
+  transaction_bytes_ = 0;
+  transaction_start_ = std::chrono::steady_clock::now();
+}
+
+void IndexWriter::Rollback() noexcept {
+  buffer_.Clear();
+  if (!uncommitted_) return;
+  uncommitted_ = false;
+  lost_ = true;
+  terms_requested_ = false;
+  try {
+    if (db_.InTransaction()) db_.Execute("ROLLBACK");
+    LoadCounters();
+  } catch (const Error&) {
+    // The database is beyond help; the next use of it says so.
+  }
+}
+
+void IndexWriter::FlushIfLarge() {
+  if (buffer_.bytes() < limits_.flush_bytes) return;
+  transaction_bytes_ += buffer_.bytes();
+  buffer_.Flush(*schema_, &db_, tokenizer_);
+  if (transaction_bytes_ >= limits_.commit_bytes) CommitNow();
+}
+
+void IndexWriter::CommitNow() {
+  // Whoever removes the file under us must not be told that documents are safe in it.
+  if (db_.HasMoved()) throw Error(kDamagedIndex, "The index's database has been removed");
+  buffer_.Flush(*schema_, &db_, tokenizer_);
+  if (terms_requested_) RebuildTerms();
+  db_.Prepare("INSERT OR REPLACE INTO meta(key,value) VALUES('documents',?1)")
+      .Bind(1, documents_.load())
+      .Run();
+  db_.Execute("COMMIT");
+  terms_requested_ = false;
+  uncommitted_ = false;
+}
+
+void IndexWriter::Commit() {
+  if (!uncommitted_) return;
+  try {
+    CommitNow();
+  } catch (...) {
+    Rollback();
+    throw;
+  }
+}
+
+void IndexWriter::CommitIfOld() {
+  if (!uncommitted_) return;
+  if (std::chrono::steady_clock::now() - transaction_start_ >= limits_.commit_age) Commit();
+}
+
+bool IndexWriter::TakeLost() {
+  return std::exchange(lost_, false);
+}
+
+void IndexWriter::RequestTerms() {
+  Change([this] { return terms_requested_ = true; });
+}
+
+// A word that stands in one document alone is as likely a slip as a word.
+void IndexWriter::RebuildTerms() {
+  db_.Execute(
+      "DELETE FROM terms;"
+      "INSERT INTO terms(term,documents) SELECT term,doc FROM body_terms "
+      "WHERE doc>1 AND length(term) BETWEEN 3 AND 40;");
+}
+
+std::optional<IndexWriter::Found> IndexWriter::FindByPath(std::string_view path) {
+  Statement row = db_.Prepare(select_row_sql_);
+  row.Bind(1, path);
+  if (!row.Step()) return std::nullopt;
+  return Found{row.Int(0), ReadLabels(*schema_, row)};
+}
+
+std::optional<std::string> IndexWriter::ReadPacked(std::int64_t id) {
+  Statement row = db_.Prepare("SELECT packed FROM texts WHERE id=?1");
+  row.Bind(1, id);
+  if (!row.Step()) return std::nullopt;
+  return std::string(row.Blob(0));
+}
+
+void IndexWriter::WriteRow(const std::string& sql, std::int64_t id,
+                           const StoredDocument& document) {
+  Statement row = db_.Prepare(sql);
+  row.Bind(1, id).Bind(2, std::string_view(document.path));
+  if (!document.extra.empty()) row.Bind(3, std::string_view(document.extra));
+  int index = 4;
+  for (const Cell& cell : document.cells) BindCell(&row, index++, cell);
+  row.Run();
+  transaction_bytes_ += kRowBytes;
+}
+
+void IndexWriter::ChangeLabels(const Found& old, const Labels& now) {
+  if (old.labels == now) return;
+  buffer_.ChangeLabels(old.id, old.labels, now);
+}
+
+void IndexWriter::WritePacked(std::int64_t id, const std::string& packed, bool exists) {
+  db_.Prepare(exists ? "UPDATE texts SET packed=?2 WHERE id=?1"
+                     : "INSERT INTO texts(id,packed) VALUES(?1,?2)")
+      .Bind(1, id)
+      .BindBlob(2, packed)
+      .Run();
+}
+
+void IndexWriter::ChangeText(std::int64_t id, const std::string& body, const std::string& packed) {
+  std::optional<std::string> old = ReadPacked(id);
+  if (old.value_or("") == packed) return;
+  if (packed.empty()) {
+    db_.Prepare("DELETE FROM texts WHERE id=?1").Bind(1, id).Run();
+    buffer_.ChangeBody(id, std::move(old), std::nullopt);
+    return;
+  }
+  WritePacked(id, packed, old.has_value());
+  buffer_.ChangeBody(id, std::move(old), body);
+}
+
+void IndexWriter::Insert(const PreparedDocument& document) {
+  const std::int64_t id = next_id_++;
+  WriteRow(insert_sql_, id, document.document);
+  buffer_.ChangeLabels(id, std::nullopt, document.document.labels);
+  if (!document.packed.empty()) {
+    WritePacked(id, document.packed, false);
+    buffer_.ChangeBody(id, std::nullopt, document.document.body);
+  }
+  ++documents_;
+}
+
+void IndexWriter::Replace(const Found& old, const PreparedDocument& document) {
+  WriteRow(update_sql_, old.id, document.document);
+  ChangeLabels(old, document.document.labels);
+  ChangeText(old.id, document.document.body, document.packed);
+}
+
+void IndexWriter::Remove(const Found& old) {
+  ChangeText(old.id, "", "");
+  buffer_.ChangeLabels(old.id, old.labels, std::nullopt);
+  db_.Prepare("DELETE FROM docs WHERE id=?1").Bind(1, old.id).Run();
+  transaction_bytes_ += kRowBytes;
+  --documents_;
+}
+
+void IndexWriter::Upsert(PreparedDocument document) {
+  Change([&] {
+    const std::optional<Found> old = FindByPath(document.document.path);
+    if (old) {
+      Replace(*old, document);
+    } else {
+      Insert(document);
+    }
+    return true;
+  });
+}
+
+bool IndexWriter::Set(std::string_view path, const Json::Value& changes) {
+  if (changes.isMember(schema_->path_field())) {
+    NameProperty(changes, schema_->path_field().c_str());
+  }
+  return Change([&] { return SetLocked(path, changes); });
+}
+
+bool IndexWriter::SetLocked(std::string_view path, const Json::Value& changes) {
+  Found found{};
+  Json::Value document;
+  {
+    Statement row = db_.Prepare(select_row_sql_);
+    row.Bind(1, path);
+    if (!row.Step()) return false;
+    found = {row.Int(0), ReadLabels(*schema_, row)};
+    document = ReadRow(*schema_, row, nullptr);
+  }
+  const bool touches_text = TouchesText(*schema_, changes);
+  if (touches_text) {
+    const std::optional<std::string> packed = ReadPacked(found.id);
+    if (packed) AddTexts(*schema_, Decompress(*packed), nullptr, &document);
+  }
+  ApplyChanges(changes, &document);
+  const std::string new_path = document[schema_->path_field()].asString();
+  if (new_path != path) {
+    const std::optional<Found> in_the_way = FindByPath(new_path);
+    if (in_the_way) Remove(*in_the_way);
+  }
+  if (touches_text) {
+    Replace(found, PrepareDocument(*schema_, new_path, document));
+  } else {
+    const StoredDocument stored = MakeDocument(*schema_, new_path, document);
+    WriteRow(update_sql_, found.id, stored);
+    ChangeLabels(found, stored.labels);
+  }
+  return true;
+}
+
+bool IndexWriter::Delete(std::string_view path) {
+  return Change([&] {
+    const std::optional<Found> old = FindByPath(path);
+    if (old) Remove(*old);
+    return old.has_value();
+  });
+}
+
+std::int64_t IndexWriter::DeleteSelected(const Selection& selection) {
+  std::int64_t left = selection.limit.value_or(std::numeric_limits<std::int64_t>::max());
+  std::int64_t deleted = 0;
+  for (;;) {
+    const std::int64_t chunk = Change([&] {
+      std::vector<Found> batch;
+      {
+        Statement rows = SelectRows(*schema_, selection, RowColumns(*schema_),
+                                    std::min(left, kDeleteChunk), &db_);
+        while (rows.Step()) batch.push_back({rows.Int(0), ReadLabels(*schema_, rows)});
+      }
+      for (const Found& old : batch) Remove(old);
+      return static_cast<std::int64_t>(batch.size());
+    });
+    deleted += chunk;
+    left -= chunk;
+    if (chunk < kDeleteChunk || left == 0) return deleted;
+  }
+}
+
+Json::Value IndexWriter::Find(const Selection& selection) {
+  const bool wants_text = WantsText(*schema_, selection);
+  const std::set<std::string>* only = selection.load_fields ? &*selection.load_fields : nullptr;
+  Json::Value found(Json::arrayValue);
+  const std::int64_t limit = std::min(selection.limit.value_or(kMaxFound + 1), kMaxFound + 1);
+  Statement rows = SelectRows(*schema_, selection, RowColumns(*schema_), limit, &db_);
+  while (rows.Step()) {
+    if (found.size() >= kMaxFound) FailMalformed("Too many documents: ask with a limit");
+    Json::Value document = ReadRow(*schema_, rows, only);
+    if (wants_text) {
+      const std::optional<std::string> packed = ReadPacked(rows.Int(0));
+      if (packed) AddTexts(*schema_, Decompress(*packed), only, &document);
+    }
+    found.append(std::move(document));
+  }
+  return found;
+}
+
+}  // namespace quarry::engine

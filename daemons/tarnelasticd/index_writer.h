@@ -1,0 +1,131 @@
+// Changing one index.
+
+#ifndef QUARRY_DAEMONS_TARNELASTICD_INDEX_WRITER_H_
+#define QUARRY_DAEMONS_TARNELASTICD_INDEX_WRITER_H_
+
+#include <json/json.h>
+
+#include <atomic>
+#include <chrono>
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "daemons/tarnelasticd/database.h"
+#include "daemons/tarnelasticd/document.h"
+#include "daemons/tarnelasticd/fts_buffer.h"
+#include "daemons/tarnelasticd/schema.h"
+#include "daemons/tarnelasticd/selection.h"
+#include "daemons/tarnelasticd/text_tokenizer.h"
+
+namespace quarry::engine {
+
+// When work is written out without being asked. What a peer sends is thus bounded in memory, and
+// what a crash can undo is bounded in time.
+struct WriterLimits {
+  // Changes of full text are handed to FTS5 when they take so much memory.
+  std::size_t flush_bytes = std::size_t{8} << 20;
+  // A transaction ends when it has taken so much text, or has been open so long.
+  std::size_t commit_bytes = std::size_t{256} << 20;
+  std::chrono::steady_clock::duration commit_age = std::chrono::seconds(30);
+};
+
+// A document to be stored, with its full text compressed already: that takes time, and needs no
+// lock.
+struct PreparedDocument {
+  StoredDocument document;
+  std::string packed;  // the compressed body, empty without full text
+};
+PreparedDocument PrepareDocument(const Schema& schema, std::string_view path,
+                                 const Json::Value& document);
+
+// The one connection that changes an index. Changes collect in a transaction: this object's own
+// questions see them at once, searches after Commit(). A change that fails, whatever for, takes all
+// that was not committed with it; Lost() tells. Throws Error as Database does. One thread at a
+// time, but for documents() and HasUncommitted().
+class IndexWriter {
+ public:
+  // Opens the database of an index that exists. `schema` is the one that it was made with.
+  IndexWriter(const std::string& database_path, std::shared_ptr<const Schema> schema,
+              const WriterLimits& limits);
+  ~IndexWriter();
+
+  // Stores a document in place of the one with its path.
+  void Upsert(PreparedDocument document);
+  // Changes fields of the document at `path`; null removes one. With a new path the document moves
+  // there, in place of the one that is there. Returns whether there is such a document. Throws
+  // kMalformedRequest for a path that is none.
+  bool Set(std::string_view path, const Json::Value& changes);
+  // Returns whether there was such a document.
+  bool Delete(std::string_view path);
+  // Returns how many documents there were.
+  std::int64_t DeleteSelected(const Selection& selection);
+  // The selected documents, as an array of objects. Throws kMalformedRequest when these would be
+  // more than kMaxFound.
+  Json::Value Find(const Selection& selection);
+
+  // Makes the words to suggest anew with the next commit.
+  void RequestTerms();
+  // Makes all changes durable and visible. Blocks for the disk.
+  void Commit();
+  // Commits when the transaction has been open too long.
+  void CommitIfOld();
+
+  // Documents, uncommitted ones included, and whether there is anything to commit. Any thread.
+  std::int64_t documents() const { return documents_; }
+  bool HasUncommitted() const { return uncommitted_; }
+  // Whether the database's file is where it was opened.
+  bool IsInPlace() const { return !db_.HasMoved(); }
+  // Whether changes that were not committed have been undone since the last call.
+  bool TakeLost();
+
+  static constexpr std::int64_t kMaxFound = 1000000;
+
+ private:
+  struct Found {
+    std::int64_t id;
+    Labels labels;
+  };
+
+  template <typename Action>
+  auto Change(Action action);
+  void Begin();
+  void Rollback() noexcept;
+  void CommitNow();
+  void LoadCounters();
+  void RebuildTerms();
+  void FlushIfLarge();
+
+  std::optional<Found> FindByPath(std::string_view path);
+  std::optional<std::string> ReadPacked(std::int64_t id);
+  void Insert(const PreparedDocument& document);
+  void Replace(const Found& old, const PreparedDocument& document);
+  void Remove(const Found& old);
+  void ChangeLabels(const Found& old, const Labels& now);
+  void ChangeText(std::int64_t id, const std::string& body, const std::string& packed);
+  void WritePacked(std::int64_t id, const std::string& packed, bool exists);
+  void WriteRow(const std::string& sql, std::int64_t id, const StoredDocument& document);
+  bool SetLocked(std::string_view path, const Json::Value& changes);
+
+  std::shared_ptr<const Schema> schema_;
+  WriterLimits limits_;
+  Database db_;
+  TextTokenizer tokenizer_;
+  FtsBuffer buffer_;
+  std::string insert_sql_;
+  std::string update_sql_;
+  std::string select_row_sql_;
+  std::int64_t next_id_ = 1;
+  std::atomic<std::int64_t> documents_{0};
+  std::atomic<bool> uncommitted_{false};
+  bool lost_ = false;
+  bool terms_requested_ = false;
+  std::size_t transaction_bytes_ = 0;
+  std::chrono::steady_clock::time_point transaction_start_{};
+};
+
+}  // namespace quarry::engine
+
+#endif  // QUARRY_DAEMONS_TARNELASTICD_INDEX_WRITER_H_

@@ -1,0 +1,47 @@
+// Which documents of one index answer a query.
+
+#ifndef QUARRY_DAEMONS_TARNELASTICD_MATCHER_H_
+#define QUARRY_DAEMONS_TARNELASTICD_MATCHER_H_
+
+#include <cstddef>
+#include <string>
+#include <vector>
+
+#include "daemons/tarnelasticd/doc_set.h"
+#include "daemons/tarnelasticd/index_reader.h"
+#include "daemons/tarnelasticd/query.h"
+#include "daemons/tarnelasticd/schema.h"
+
+namespace quarry::engine {
+
+// Where one term of a query is found, as ranking needs it.
+struct TermMatches {
+  const QueryTerm* term = nullptr;
+  DocSet labels;              // by a whole word of the file name or of a field that is not listed
+  DocSet names;               // by a part of the file name
+  std::size_t texts = 0;      // documents with it in their full text
+  std::size_t documents = 0;  // documents with it anywhere
+};
+
+struct Matches {
+  DocSet documents;
+  // One for each term that counts for ranking: words that are not negated, in order.
+  std::vector<TermMatches> terms;
+};
+
+// Finds what answers `query`, which has been resolved and must outlive the result. Every text of
+// the query reaches the database as a parameter, and as one quoted string within it.
+Matches FindMatches(const Schema& schema, const Query& query, IndexReader* reader);
+
+// The words of the query that count for ranking, in the order of Matches::terms.
+std::vector<const QueryTerm*> RankedTerms(const Query& query);
+
+// The full-text expression for the words of a term.
+std::string PhraseExpression(const QueryTerm& term);
+
+// The rows of a full-text table that match an expression.
+DocSet MatchRows(Database* db, const std::string& table, const std::string& expression);
+
+}  // namespace quarry::engine
+
+#endif  // QUARRY_DAEMONS_TARNELASTICD_MATCHER_H_

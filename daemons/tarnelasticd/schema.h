@@ -1,0 +1,94 @@
+// What an index keeps of each field, as its mappings say.
+//
+// Tables of an index's database:
+//   meta    key, value: the version of this layout, the mappings, how many documents there are
+//   docs    one row per document: its path, a column per listed field that is no full text, and
+//           what is not listed as JSON
+//   texts   the full text of a document, packed and compressed
+//   body    FTS5 over the full text, a column per field; without content of its own
+//   labels  FTS5 over the words of the file name and the texts of fields that are not listed
+//   names   FTS5 over all three letters in a row of the file name
+//   terms   words to suggest, with the number of documents that have them
+
+#ifndef QUARRY_DAEMONS_TARNELASTICD_SCHEMA_H_
+#define QUARRY_DAEMONS_TARNELASTICD_SCHEMA_H_
+
+#include <json/json.h>
+
+#include <cstddef>
+#include <map>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace quarry::engine {
+
+// The version of the layout. A database of another version counts as damaged: it is made anew.
+constexpr int kLayoutVersion = 1;
+
+// How a field's values are kept.
+enum class Storage {
+  kPath,    // identifies the document
+  kString,  // as a whole
+  kInt,
+  kDouble,
+  kBool,
+  kText,  // searched by words
+};
+
+struct Field {
+  std::string name;
+  Storage storage = Storage::kString;
+  // Which of docs' own columns, or of body's for kText, holds it; for kPath 0 and without meaning.
+  std::size_t column = 0;
+  // What a hit in this field counts, for kText.
+  double weight = 1;
+};
+
+// Immutable; any thread.
+class Schema {
+ public:
+  // Throws Error kBadMappings, saying what is wrong, when `mappings` is not as the protocol says.
+  // Null stands for the simplest mappings: a path, and everything else as the default.
+  explicit Schema(const Json::Value& mappings);
+
+  const Json::Value& mappings() const { return mappings_; }
+  // The name of the field that identifies a document.
+  const std::string& path_field() const { return path_field_; }
+  // The name of the field by whose value a document is found by parts of its file name, or "".
+  const std::string& name_field() const { return name_field_; }
+  // Whether the texts of fields that are not listed are searched.
+  bool search_unlisted() const { return search_unlisted_; }
+
+  // The listed field of that name, or null.
+  const Field* Find(const std::string& name) const;
+  const std::map<std::string, Field>& fields() const { return fields_; }
+  std::size_t row_columns() const { return row_columns_; }
+  std::size_t text_columns() const { return text_columns_; }
+  // Weights of body's columns, in order.
+  std::vector<double> Weights() const;
+
+  // The column of docs that holds the field, or "" when it has none.
+  std::string ColumnOf(const std::string& field) const;
+  // "prefix0,prefix1,..." for `count` columns.
+  static std::string ColumnList(std::string_view prefix, std::size_t count);
+
+  // The statements that make all tables of an empty database.
+  std::string CreateStatements() const;
+
+ private:
+  void AddField(const std::string& name, const Json::Value& settings,
+                const Json::Value& default_settings);
+
+  Json::Value mappings_;
+  std::string path_field_;
+  std::string name_field_;
+  bool search_unlisted_ = true;
+  std::map<std::string, Field> fields_;
+  std::size_t row_columns_ = 0;
+  std::size_t text_columns_ = 0;
+};
+
+}  // namespace quarry::engine
+
+#endif  // QUARRY_DAEMONS_TARNELASTICD_SCHEMA_H_
