@@ -18,12 +18,17 @@ struct LogSite {
   const char* function;
 };
 
-// The site of the current line in `unit`, which is given without its extension: QUARRY_SITE("util").
-#define QUARRY_SITE(unit) \
-  ::quarry::LogSite { unit ".cpp", __LINE__, __func__ }
+// The site of the current line in `unit`, which is given without its extension:
+// QUARRY_SITE("util").
+#define QUARRY_SITE(unit)           \
+  ::quarry::LogSite {               \
+    unit ".cpp", __LINE__, __func__ \
+  }
 // The same with a line number of its own.
 #define QUARRY_SITE_AT(unit, line) \
-  ::quarry::LogSite { unit ".cpp", line, __func__ }
+  ::quarry::LogSite {              \
+    unit ".cpp", line, __func__    \
+  }
 
 // Writes "unit:line (pid, euid) (function) message", with " [err: ...]" at the end when errno is
 // set, and leaves errno 0.

@@ -3,7 +3,6 @@
 #ifndef QUARRY_PLATFORM_INCLUDE_ERROR_H_
 #define QUARRY_PLATFORM_INCLUDE_ERROR_H_
 
-
 #include "common/export.h"
 
 // Out of space: on the volume, and in the quota.

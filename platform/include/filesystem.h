@@ -3,7 +3,6 @@
 #ifndef QUARRY_PLATFORM_INCLUDE_FILESYSTEM_H_
 #define QUARRY_PLATFORM_INCLUDE_FILESYSTEM_H_
 
-
 #include "common/export.h"
 
 // The one file-system type that is never indexed whatever else it is.
@@ -11,9 +10,9 @@ constexpr int kTARNFSTypeRefused = 12;
 
 // How TARNFileCopy copies. Zero-filled but for the flags that are wanted.
 struct TARNCOPYARGS {
-  int preserve;       // 1: keep owner, mode and times
-  int move;           // 1: remove the source once it is copied
-  int reserved[14];   // the platform's own
+  int preserve;      // 1: keep owner, mode and times
+  int move;          // 1: remove the source once it is copied
+  int reserved[14];  // the platform's own
 };
 
 extern "C" {

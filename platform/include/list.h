@@ -3,7 +3,6 @@
 #ifndef QUARRY_PLATFORM_INCLUDE_LIST_H_
 #define QUARRY_PLATFORM_INCLUDE_LIST_H_
 
-
 #include "common/export.h"
 
 // A growing list of NUL-terminated strings, allocated by the platform.

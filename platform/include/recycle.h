@@ -3,7 +3,6 @@
 #ifndef QUARRY_PLATFORM_INCLUDE_RECYCLE_H_
 #define QUARRY_PLATFORM_INCLUDE_RECYCLE_H_
 
-
 #include "common/export.h"
 
 extern "C" {

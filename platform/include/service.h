@@ -1,11 +1,10 @@
 // Services of the machine, the file-sharing service's search support, and running programs.
 //
-// Functions that return int return a negative number on failure, with the platform's last error set,
-// unless said otherwise.
+// Functions that return int return a negative number on failure, with the platform's last error
+// set, unless said otherwise.
 
 #ifndef QUARRY_PLATFORM_INCLUDE_SERVICE_H_
 #define QUARRY_PLATFORM_INCLUDE_SERVICE_H_
-
 
 #include "common/export.h"
 
@@ -32,9 +31,9 @@ QUARRY_EXPORT int TARNSMBIsEnableSpotlight();
 // Switches it on (1) or off (0); takes effect when the service restarts.
 QUARRY_EXPORT int TARNSMBSetSpotlight(int enable);
 
-// Runs a program and waits for it. `flags` is a bit set of the platform's; the arguments follow, the
-// program's own name among them, ended by a null pointer. Returns the exit status, or a negative
-// number when the program could not be run.
+// Runs a program and waits for it. `flags` is a bit set of the platform's; the arguments follow,
+// the program's own name among them, ended by a null pointer. Returns the exit status, or a
+// negative number when the program could not be run.
 QUARRY_EXPORT int HLIBCExecl(const char* program, unsigned int flags, ...);
 
 // The same without flags: the arguments behind the program's own name, ended by a null pointer.

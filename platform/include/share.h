@@ -9,8 +9,8 @@
 
 #include <cstddef>
 
-#include "platform/include/list.h"
 #include "common/export.h"
+#include "platform/include/list.h"
 
 // One share's record, owned by the platform: got from TARNShareGet, released with TARNShareFree.
 struct TARNSHARE {

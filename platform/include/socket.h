@@ -1,7 +1,7 @@
 // Connections to daemons on this machine, one whole message at a time.
 //
-// A message is a 4-byte length in the host's byte order and as many bytes of text. None of the calls
-// raises SIGPIPE.
+// A message is a 4-byte length in the host's byte order and as many bytes of text. None of the
+// calls raises SIGPIPE.
 
 #ifndef QUARRY_PLATFORM_INCLUDE_SOCKET_H_
 #define QUARRY_PLATFORM_INCLUDE_SOCKET_H_
