@@ -1,5 +1,7 @@
 #include "daemons/fileindexd/elastic_index.h"
 
+#include <utility>
+
 #include "comm/comm.h"
 #include "comm/elastic_control.h"
 #include "common/error.h"
@@ -101,39 +103,47 @@ void ElasticIndex::Rename(const std::string& new_path, const std::string& old_pa
   elastic::IndexRename(share_, new_path, old_path);
 }
 
-std::vector<Document> ElasticIndex::Query(const char* field, const std::string& value) {
+std::vector<Document> ElasticIndex::Query(const char* kind, const char* field,
+                                          const std::string& value, const std::string& after,
+                                          std::size_t limit) {
   Json::Value request;
   request["command"] = "document_get_by_query";
   Json::Value& data = request["data"];
   data["id"] = id_;
-  data["query"]["qsl"]["term"][field] = value;
+  data["query"]["qsl"][kind][field] = value;
+  data["query"]["limit"] = Json::UInt64(limit);
+  if (!after.empty()) data["query"]["after"] = after;
   for (const char* name : {elastic::kFieldPath, kIsDirField, extract::kAttributeStampField,
                            extract::kContentStampField}) {
     data["query"]["load_field"].append(name);
   }
   Json::Value response;
   elastic::SendRequest(response, request);
-  std::vector<Document> documents;
   if (!response["data"].isArray()) {
     throw Error(kErrorEngineQuery, "The search engine's list of documents is malformed");
   }
+  std::vector<Document> documents;
   for (const Json::Value& fields : response["data"]) documents.push_back(ToDocument(fields));
   return documents;
 }
 
 std::optional<Document> ElasticIndex::Find(const std::string& path) {
-  std::vector<Document> found = Query(elastic::kFieldPath, path);
+  std::vector<Document> found = Query("term", elastic::kFieldPath, path, "", 1);
   if (found.empty()) return std::nullopt;
   return found.front();
 }
 
-std::vector<Document> ElasticIndex::Children(const std::string& dir) {
-  return Query(elastic::kFieldParent, dir);
+std::vector<Document> ElasticIndex::Children(const std::string& dir, const std::string& after,
+                                             std::size_t limit) {
+  return Query("term", elastic::kFieldParent, dir, after, limit);
 }
 
-std::vector<std::string> ElasticIndex::PathsBelow(const std::string& dir) {
+std::vector<std::string> ElasticIndex::PathsBelow(const std::string& dir, const std::string& after,
+                                                  std::size_t limit) {
   std::vector<std::string> paths;
-  elastic::IndexGetByPrefixPath(id_, dir, paths);
+  for (Document& document : Query("prefix", elastic::kFieldPath, dir + "/", after, limit)) {
+    paths.push_back(std::move(document.path));
+  }
   return paths;
 }
 

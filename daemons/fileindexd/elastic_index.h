@@ -29,13 +29,16 @@ class ElasticIndex : public Index {
   void DeleteBelow(const std::string& dir) override;
   void Rename(const std::string& new_path, const std::string& old_path) override;
   std::optional<Document> Find(const std::string& path) override;
-  std::vector<Document> Children(const std::string& dir) override;
-  std::vector<std::string> PathsBelow(const std::string& dir) override;
+  std::vector<Document> Children(const std::string& dir, const std::string& after,
+                                 std::size_t limit) override;
+  std::vector<std::string> PathsBelow(const std::string& dir, const std::string& after,
+                                      std::size_t limit) override;
   bool CanRead() override;
 
  private:
   Json::Value EngineStatus();
-  std::vector<Document> Query(const char* field, const std::string& value);
+  std::vector<Document> Query(const char* kind, const char* field, const std::string& value,
+                              const std::string& after, std::size_t limit);
 
   const std::string share_;
   const std::string id_;

@@ -141,11 +141,15 @@ Place PosixFileSystem::Look(const std::string& base, const std::string& path) {
   return place;
 }
 
-PlaceKind PosixFileSystem::List(const std::string& dir, std::vector<Entry>& out) {
-  out.clear();
+Place PosixFileSystem::Peek(const std::string& path) {
+  return PlaceAt(AT_FDCWD, path.c_str(), [&] { return path; });
+}
+
+PlaceKind PosixFileSystem::List(const std::string& dir, std::vector<std::string>& names) {
+  names.clear();
   const int fd = open(dir.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
   if (fd < 0) return KindOfFailure(errno);
-  std::unique_ptr<DIR, CloseDir> stream(fdopendir(fd));
+  const std::unique_ptr<DIR, CloseDir> stream(fdopendir(fd));
   if (!stream) {
     close(fd);
     return PlaceKind::kUnknown;
@@ -155,9 +159,7 @@ PlaceKind PosixFileSystem::List(const std::string& dir, std::vector<Entry>& out)
     const dirent* entry = readdir(stream.get());
     if (entry == nullptr) return errno == 0 ? PlaceKind::kDirectory : KindOfFailure(errno);
     const std::string name = entry->d_name;
-    if (name == "." || name == "..") continue;
-    Place place = PlaceAt(fd, entry->d_name, [&] { return dir + "/" + name; });
-    if (place.kind != PlaceKind::kAbsent) out.push_back({name, std::move(place)});
+    if (name != "." && name != "..") names.push_back(name);
   }
 }
 

@@ -25,11 +25,6 @@ struct Place {
   std::string content_stamp;
 };
 
-struct Entry {
-  std::string name;
-  Place place;
-};
-
 // Tells whether the directory at a path is still the one that was there before.
 struct Identity {
   bool exists = false;
@@ -49,9 +44,12 @@ class FileSystem {
   // not entered on the way from `base`; what `base` itself is does not matter.
   virtual Place Look(const std::string& base, const std::string& path) = 0;
 
-  // What is in the directory, in no particular order, without "." and "..". kDirectory when `out`
-  // holds all of it, else why it does not.
-  virtual PlaceKind List(const std::string& dir, std::vector<Entry>& out) = 0;
+  // The same for an entry of a directory that is known to be one, faster.
+  virtual Place Peek(const std::string& path) = 0;
+
+  // The names in the directory, in no particular order, without "." and "..". kDirectory when
+  // `names` holds all of them, else why it does not.
+  virtual PlaceKind List(const std::string& dir, std::vector<std::string>& names) = 0;
 
   virtual Identity Identify(const std::string& dir) = 0;
 };
@@ -60,7 +58,8 @@ class FileSystem {
 class PosixFileSystem : public FileSystem {
  public:
   Place Look(const std::string& base, const std::string& path) override;
-  PlaceKind List(const std::string& dir, std::vector<Entry>& out) override;
+  Place Peek(const std::string& path) override;
+  PlaceKind List(const std::string& dir, std::vector<std::string>& names) override;
   Identity Identify(const std::string& dir) override;
 };
 

@@ -3,8 +3,8 @@
 #ifndef QUARRY_DAEMONS_FILEINDEXD_INDEX_H_
 #define QUARRY_DAEMONS_FILEINDEXD_INDEX_H_
 
+#include <cstddef>
 #include <cstdint>
-#include <functional>
 #include <optional>
 #include <string>
 #include <vector>
@@ -47,11 +47,12 @@ class Index {
   virtual void Rename(const std::string& new_path, const std::string& old_path) = 0;
 
   virtual std::optional<Document> Find(const std::string& path) = 0;
-  // The documents directly in the directory, in no particular order.
-  virtual std::vector<Document> Children(const std::string& dir) = 0;
-  // The paths of all documents below the directory: for the rare case in which nothing else helps,
-  // since all are held in memory.
-  virtual std::vector<std::string> PathsBelow(const std::string& dir) = 0;
+  // Documents directly in the directory, or paths of documents at any depth below it: the first
+  // `limit` of those whose path is greater than `after`, in ascending order of paths.
+  virtual std::vector<Document> Children(const std::string& dir, const std::string& after,
+                                         std::size_t limit) = 0;
+  virtual std::vector<std::string> PathsBelow(const std::string& dir, const std::string& after,
+                                              std::size_t limit) = 0;
 
   // Whether files can be read at all at the moment: tells a file that cannot be read from a reader
   // that does not run. Does not throw.

@@ -1,10 +1,14 @@
 #include "daemons/fileindexd/reconciler.h"
 
-#include <set>
+#include <algorithm>
+#include <cstddef>
 #include <utility>
 
 namespace quarry::fileindexd {
 namespace {
+
+// Documents that are asked for at a time.
+constexpr std::size_t kPage = 5000;
 
 // The device's number, which comes first, may be another one after each start of the machine; the
 // rest tells well enough whether it is the same file in the same state.
@@ -15,6 +19,33 @@ bool SameAttributes(const std::string& a, const std::string& b) {
   return a.compare(rest_a, std::string::npos, b, rest_b, std::string::npos) == 0;
 }
 
+// The documents directly in a directory, in ascending order of paths, a page at a time.
+class ChildCursor {
+ public:
+  ChildCursor(Index& index, const std::string& dir) : index_(index), dir_(dir) { Load(""); }
+
+  // The next document, or null at the end.
+  const Document* Get() const { return next_ < page_.size() ? &page_[next_] : nullptr; }
+
+  // Gives it away and goes on.
+  Document Take() {
+    Document taken = std::move(page_[next_++]);
+    if (next_ == page_.size() && page_.size() == kPage) Load(taken.path);
+    return taken;
+  }
+
+ private:
+  void Load(const std::string& after) {
+    page_ = index_.Children(dir_, after, kPage);
+    next_ = 0;
+  }
+
+  Index& index_;
+  const std::string dir_;
+  std::vector<Document> page_;
+  std::size_t next_ = 0;
+};
+
 }  // namespace
 
 void Reconciler::Push(const std::string& path, bool compared) {
@@ -23,16 +54,22 @@ void Reconciler::Push(const std::string& path, bool compared) {
 }
 
 void Reconciler::Reconcile(const std::string& path) {
+  visited_folders_.clear();
+  Walk(path);
+}
+
+void Reconciler::Walk(const std::string& path) {
   Push(path, false);
   Run();
 }
 
 void Reconciler::ReconcileAll(const std::string& share_root) {
-  walked_folders_.clear();
-  Reconcile(share_root);
+  visited_folders_.clear();
+  wanted_ = 0;
+  Walk(share_root);
   // A walk does not come by a folder when something on the way to it is unwanted.
   for (const FolderRule* folder : tools_.survey.rules()->FoldersBelow(share_root)) {
-    if (walked_folders_.count(folder->full_path) == 0) Reconcile(folder->full_path);
+    if (visited_folders_.count(folder->full_path) == 0) Walk(folder->full_path);
   }
 }
 
@@ -51,7 +88,13 @@ void Reconciler::Run() {
   }
 }
 
+// Whether it is a folder's own place to which another way led already.
+bool Reconciler::WasVisited(const std::string& path) {
+  return tools_.survey.rules()->At(path) != nullptr && !visited_folders_.insert(path).second;
+}
+
 void Reconciler::VisitPlace(const std::string& path) {
+  if (WasVisited(path)) return;
   const Finding finding = tools_.survey.Examine(path);
   switch (finding.verdict) {
     case Verdict::kWanted:
@@ -63,62 +106,64 @@ void Reconciler::VisitPlace(const std::string& path) {
     case Verdict::kUnwanted:
       return Drop(path);
     case Verdict::kDoubtful:
-      tools_.progress.Failed(path, path + ": what is there cannot be told");
-      return;
+      return CountDoubt(path);
     case Verdict::kAside:
       return;
   }
 }
 
-Reconciler::Documents Reconciler::TakeChildren(const std::string& dir) {
-  // What is still being done below the directory would make the answer out of date.
-  tools_.lane.Settle(dir);
-  Documents documents;
-  for (Document& document : tools_.index.Children(dir)) {
-    const std::string path = document.path;
-    documents.emplace(path, std::move(document));
-  }
-  return documents;
-}
-
 void Reconciler::VisitDirectory(const std::string& dir) {
-  std::vector<Entry> entries;
-  const PlaceKind kind = tools_.survey.files().List(dir, entries);
-  if (kind != PlaceKind::kDirectory) {
-    // It has changed since it was seen; if it is a directory again, leave it to the event of that.
-    const Verdict verdict = tools_.survey.Examine(dir).verdict;
-    if (verdict == Verdict::kUnwanted) return Drop(dir);
+  std::vector<std::string> names;
+  if (tools_.survey.files().List(dir, names) != PlaceKind::kDirectory) {
+    // It has changed since it was seen. If it is a directory again, another event tells of it.
+    if (tools_.survey.Examine(dir).verdict == Verdict::kUnwanted) return Drop(dir);
     tools_.progress.Failed(dir, dir + ": the directory cannot be read");
     return;
   }
-  if (tools_.survey.rules()->At(dir) != nullptr) walked_folders_.insert(dir);
-  Documents documents = TakeChildren(dir);
-  for (const Entry& entry : entries) {
+  std::sort(names.begin(), names.end());
+  // What is still being done below the directory would make the answers out of date.
+  tools_.lane.Settle(dir);
+  ChildCursor documents(tools_.index, dir);
+  for (const std::string& name : names) {
     tools_.gate.Pass();
-    VisitEntry(dir + "/" + entry.name, entry.place, documents);
+    const std::string path = dir + "/" + name;
+    while (documents.Get() && documents.Get()->path < path) DropVanished(documents.Take().path);
+    if (documents.Get() && documents.Get()->path == path) {
+      VisitEntry(path, documents.Take());
+    } else {
+      VisitEntry(path, std::nullopt);
+    }
   }
-  for (const auto& [path, document] : documents) {
-    if (!tools_.survey.IsAside(path)) Drop(path);
+  while (documents.Get()) DropVanished(documents.Take().path);
+}
+
+void Reconciler::DropVanished(const std::string& path) {
+  tools_.gate.Pass();
+  if (!tools_.survey.IsAside(path)) Drop(path);
+}
+
+void Reconciler::VisitEntry(const std::string& path, const std::optional<Document>& document) {
+  if (WasVisited(path)) return;
+  const Finding finding = tools_.survey.ExamineEntry(path);
+  switch (finding.verdict) {
+    case Verdict::kWanted:
+      ++wanted_;
+      Bring(path, finding.place, document);
+      if (finding.place.kind == PlaceKind::kDirectory) Push(path, true);
+      return;
+    case Verdict::kUnwanted:
+      // A folder below it has to be found though there is no way through.
+      if (document || tools_.survey.rules()->HasFolderBelow(path)) Drop(path);
+      return;
+    case Verdict::kDoubtful:
+      return CountDoubt(path);
+    case Verdict::kAside:
+      return;
   }
 }
 
-// Takes the entry's document out of `documents` unless it is to be dropped.
-void Reconciler::VisitEntry(const std::string& path, const Place& place, Documents& documents) {
-  const Finding finding = tools_.survey.Judge(path, place);
-  if (finding.verdict == Verdict::kUnwanted) {
-    // A folder below it has to be found though there is no way through.
-    if (documents.count(path) == 0 && tools_.survey.rules()->HasFolderBelow(path)) Drop(path);
-    return;
-  }
-  std::optional<Document> document;
-  if (auto node = documents.extract(path)) document = std::move(node.mapped());
-  if (finding.verdict == Verdict::kDoubtful) {
-    tools_.progress.Failed(path, path + ": what is there cannot be told");
-  }
-  if (finding.verdict != Verdict::kWanted) return;
-  ++wanted_;
-  Bring(path, finding.place, document);
-  if (finding.place.kind == PlaceKind::kDirectory) Push(path, true);
+void Reconciler::CountDoubt(const std::string& path) {
+  tools_.progress.Failed(path, path + ": what is there cannot be told");
 }
 
 void Reconciler::Bring(const std::string& path, const Place& place,
@@ -147,19 +192,31 @@ void Reconciler::Drop(const std::string& path) {
 
 // The document itself goes, and all below it that does not belong to a folder there.
 void Reconciler::DropAroundFolders(const std::string& path) {
-  std::set<std::string> below;
-  for (const auto& [child, document] : TakeChildren(path)) below.insert(child);
   for (const FolderRule* folder : tools_.survey.rules()->FoldersBelow(path)) {
-    below.insert(folder->full_path.substr(0, folder->full_path.find('/', path.size() + 1)));
+    const std::string child =
+        folder->full_path.substr(0, folder->full_path.find('/', path.size() + 1));
+    if (stops_.empty() || stops_.back().path != child) Push(child, false);
+  }
+  tools_.lane.Settle(path);
+  for (ChildCursor documents(tools_.index, path); documents.Get();) {
+    const std::string child = documents.Take().path;
+    if (!tools_.survey.rules()->HasFolderBelow(child) && !tools_.survey.rules()->At(child)) {
+      DropVanished(child);
+    }
   }
   tools_.writer.Remove(path);
-  for (const std::string& child : below) Push(child, false);
 }
 
 void Reconciler::SweepOrphans(const std::string& share_root) {
-  for (const std::string& path : tools_.index.PathsBelow(share_root)) {
-    tools_.gate.Pass();
-    if (tools_.survey.Examine(path).verdict == Verdict::kUnwanted) tools_.writer.Remove(path);
+  std::string after;
+  for (;;) {
+    const std::vector<std::string> paths = tools_.index.PathsBelow(share_root, after, kPage);
+    for (const std::string& path : paths) {
+      tools_.gate.Pass();
+      if (tools_.survey.Examine(path).verdict == Verdict::kUnwanted) tools_.writer.Remove(path);
+    }
+    if (paths.size() < kPage) return;
+    after = paths.back();
   }
 }
 

@@ -7,7 +7,6 @@
 #include <optional>
 #include <set>
 #include <string>
-#include <unordered_map>
 #include <vector>
 
 #include "daemons/fileindexd/document_writer.h"
@@ -29,8 +28,8 @@ struct PassTools {
 };
 
 // Walks places and changes only the documents that differ from what is there. Does not recurse;
-// holds one directory at a time and the names of the directories still to come. One thread. Throws
-// Error, and Interrupted when the worker is to stop; rests while it is to pause.
+// holds the names in one directory at a time and those of the directories still to come. One
+// thread. Throws Error, and Interrupted when the worker is to stop; rests while it is to pause.
 class Reconciler {
  public:
   explicit Reconciler(const PassTools& tools) : tools_(tools) {}
@@ -45,10 +44,10 @@ class Reconciler {
   // One place, without what lies below it. `document` is what the index has there.
   void Bring(const std::string& path, const Place& place, const std::optional<Document>& document);
 
-  // Removes documents that no directory leads to. Asks for all paths at once.
+  // Removes documents that no directory leads to. Asks for all documents.
   void SweepOrphans(const std::string& share_root);
 
-  // Places that were found wanted since this object was made.
+  // Places that the last ReconcileAll() found wanted.
   std::uint64_t WantedCount() const { return wanted_; }
 
  private:
@@ -56,20 +55,22 @@ class Reconciler {
     std::string path;
     bool compared;  // its own document has been brought in line
   };
-  using Documents = std::unordered_map<std::string, Document>;
 
+  void Walk(const std::string& path);
   void Push(const std::string& path, bool compared);
   void Run();
+  bool WasVisited(const std::string& path);
   void VisitPlace(const std::string& path);
   void VisitDirectory(const std::string& dir);
-  void VisitEntry(const std::string& path, const Place& place, Documents& documents);
-  Documents TakeChildren(const std::string& dir);
+  void VisitEntry(const std::string& path, const std::optional<Document>& document);
+  void CountDoubt(const std::string& path);
+  void DropVanished(const std::string& path);
   void Drop(const std::string& path);
   void DropAroundFolders(const std::string& path);
 
   PassTools tools_;
   std::vector<Stop> stops_;
-  std::set<std::string> walked_folders_;
+  std::set<std::string> visited_folders_;
   std::uint64_t wanted_ = 0;
 };
 

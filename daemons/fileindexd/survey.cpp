@@ -50,18 +50,18 @@ Finding Survey::Examine(const std::string& path) const {
   return finding;
 }
 
-Finding Survey::Judge(const std::string& path, const Place& place) const {
+Finding Survey::ExamineEntry(const std::string& path) const {
   const Rules rules = rules_();
   if (rules->At(path) != nullptr) return Examine(path);
   Finding finding;
   if (IsAside(path)) {
     finding.verdict = Verdict::kAside;
   } else if (!fileindex::IsSystemPreservedFileName(Basename(path))) {
-    finding.verdict = JudgePlace(path, place);
-    finding.place = place;
+    finding.place = files_.Peek(path);
+    finding.verdict = JudgePlace(path, finding.place);
   }
   // What is in a directory outside every bin can only be in one by being the bin.
-  if (finding.verdict == Verdict::kWanted && place.kind == PlaceKind::kDirectory &&
+  if (finding.verdict == Verdict::kWanted && finding.place.kind == PlaceKind::kDirectory &&
       in_recycle_bin_(path)) {
     finding.verdict = Verdict::kUnwanted;
   }

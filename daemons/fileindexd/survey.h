@@ -44,8 +44,8 @@ class Survey {
 
   // Any place at all.
   Finding Examine(const std::string& path) const;
-  // An entry of a directory that is wanted: `path` is its full path, `place` what was found there.
-  Finding Judge(const std::string& path, const Place& place) const;
+  // An entry of a directory that is wanted.
+  Finding ExamineEntry(const std::string& path) const;
   // Whether a document of the place is to be left alone though nothing may be there.
   bool IsAside(const std::string& path) const;
   // Whether the place's content is to be read.
