@@ -89,8 +89,8 @@ void WaitUntilIndexed(const std::string& share_path) {
 
 std::uint64_t DocumentCount(const std::string& share) {
   const std::string id = sdk::SDKShare(share).GetDBName();
-  for (const Json::Value& index :
-       AskEngine("engine_status", Json::Value(Json::objectValue))["indexes"]) {
+  const Json::Value status = AskEngine("engine_status", Json::Value(Json::objectValue));
+  for (const Json::Value& index : status["indexes"]) {
     if (index["id"] == id) return index["documents"].asUInt64();
   }
   return 0;

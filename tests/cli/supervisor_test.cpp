@@ -80,13 +80,13 @@ TEST_F(SupervisorTest, RestartsWhatDiesAfterAGrowingPause) {
   supervisor.Step();
   EXPECT_EQ(Service(supervisor)["state"].asString(), "restarting");
   now_ += milliseconds(1);
-  StepUntil(supervisor, [&] { return Service(supervisor)["restarts"] == 2; });
+  StepUntil(supervisor, [&] { return Service(supervisor)["restarts"].asInt() == 2; });
 
   now_ += milliseconds(399);
   supervisor.Step();
   EXPECT_EQ(Service(supervisor)["state"].asString(), "restarting");
   now_ += milliseconds(1);
-  StepUntil(supervisor, [&] { return Service(supervisor)["restarts"] == 3; });
+  StepUntil(supervisor, [&] { return Service(supervisor)["restarts"].asInt() == 3; });
 }
 
 TEST_F(SupervisorTest, ForgetsThePauseOfAServiceThatRanLong) {
@@ -95,7 +95,7 @@ TEST_F(SupervisorTest, ForgetsThePauseOfAServiceThatRanLong) {
   for (int death = 1; death <= 3; ++death) {
     now_ += milliseconds(10'000);
     kill(Service(supervisor)["pid"].asInt(), SIGKILL);
-    StepUntil(supervisor, [&] { return Service(supervisor)["restarts"] == death; });
+    StepUntil(supervisor, [&] { return Service(supervisor)["restarts"].asInt() == death; });
     EXPECT_EQ(Service(supervisor)["last_end"].asString(), "signal 9");
     now_ += milliseconds(200);
     StepUntil(supervisor, [&] { return Service(supervisor)["state"] == "running"; });
@@ -148,7 +148,7 @@ TEST_F(SupervisorTest, RemovesTheSocketThatADeadServiceLeaves) {
   supervisor.Step();
   std::ofstream(spec.socket_path) << "";
   kill(Service(supervisor)["pid"].asInt(), SIGKILL);
-  StepUntil(supervisor, [&] { return Service(supervisor)["restarts"] == 1; });
+  StepUntil(supervisor, [&] { return Service(supervisor)["restarts"].asInt() == 1; });
   EXPECT_FALSE(std::filesystem::exists(spec.socket_path));
 }
 

@@ -28,7 +28,8 @@ class FirstLightTest : public testing::Test {
     std::vector<std::string> arguments{"search"};
     arguments.insert(arguments.end(), words.begin(), words.end());
     std::vector<std::string> names;
-    for (const Json::Value& hit : system_.QuarryJson(arguments)["hits"]) {
+    const Json::Value found = system_.QuarryJson(arguments);
+    for (const Json::Value& hit : found["hits"]) {
       names.push_back(Basename(hit["path"].asString()));
     }
     return names;
