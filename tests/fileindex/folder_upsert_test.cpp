@@ -72,7 +72,7 @@ class FolderUpsertTest : public fake::FakePlatformTest {
   void OnCommand(const Json::Value& command) {
     effects_->OnDaemonCommand(command);
     const int fd = open(kLock.c_str(), O_RDONLY | O_CLOEXEC);
-    EXPECT_NE(flock(fd, LOCK_EX | LOCK_NB), 0) << "the daemon is told under the lock";
+    EXPECT_NE(flock(fd, LOCK_SH | LOCK_NB), 0) << "the daemon is told under the exclusive lock";
     close(fd);
     if (vanish_after_command_) unlink(test::IndexDaemon::Path().c_str());
   }

@@ -183,7 +183,7 @@ TEST_F(StatusMgrTest, TheDaemonIsToldUnderTheLockAfterTheSave) {
   test::IndexDaemon daemon([&](const Json::Value&) {
     seen = Stored();
     const int fd = open(kLock.c_str(), O_RDONLY | O_CLOEXEC);
-    locked = fd >= 0 && flock(fd, LOCK_EX | LOCK_NB) != 0;
+    locked = fd >= 0 && flock(fd, LOCK_SH | LOCK_NB) != 0;
     close(fd);
   });
   StatusMgr().Pause(0);
