@@ -62,7 +62,8 @@ void Catalog::Create(const IndexRecord& record) {
   if (known == nullptr) {
     CreateNew(record);
   } else {
-    const IndexRecord old = *known;
+    if (!known->moving_from.empty()) FinishMove(*known);
+    const IndexRecord old = *registry_.Find(record.id);
     Refresh(old, record);
   }
 }
@@ -85,6 +86,7 @@ void Catalog::Refresh(const IndexRecord& old, IndexRecord record) {
   record.moving_from = old.moving_from;
   if (record.path != old.path) Move(old, record);
   const std::shared_ptr<Index> index = Find(record.id);
+  index->Open();
   if (!index->IsSound()) {
     index->Recreate(schema);
   } else if (Index::Access(index.get()).schema()->mappings() != schema.mappings()) {

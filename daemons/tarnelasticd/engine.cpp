@@ -86,7 +86,9 @@ auto NotingDamage(Index* index, Action action) {
 class OpenIndex {
  public:
   OpenIndex(std::shared_ptr<Index> index, std::chrono::steady_clock::time_point deadline)
-      : index_(std::move(index)), access_(index_.get()), reader_(access_.TakeReader()) {
+      : index_(std::move(index)),
+        access_(index_.get(), /*wait=*/false),
+        reader_(access_.TakeReader()) {
     reader_->Begin(deadline);
   }
   SearchedIndex Searched(const std::string& id) const { return {id, access_.schema(), &*reader_}; }
@@ -96,6 +98,10 @@ class OpenIndex {
   Index::Access access_;
   ReaderPool::Lease reader_;
 };
+
+bool IsOutOfUse(const Error& error) {
+  return error.code() == ErrorCode{kDamagedIndex} || error.code() == ErrorCode{kMovingIndex};
+}
 
 Json::Value SkippedJson(const std::string& id, int code, const std::string& message) {
   Json::Value json;
@@ -336,7 +342,7 @@ Json::Value Engine::Search(const Json::Value& data) {
         searched.push_back(open.back()->Searched(id));
       });
     } catch (const Error& error) {
-      if (error.code() != ErrorCode{kDamagedIndex}) throw;
+      if (!IsOutOfUse(error)) throw;
       skipped.append(SkippedJson(id, error.code(), error.reason()));
     }
   }

@@ -23,6 +23,7 @@ enum EngineCode : int {
   kBadMappings = 1412,
   kInternalFailure = 1413,
   kOutOfMemory = 1414,  // where a command must not answer busy
+  kMovingIndex = 1415,  // its database is being replaced or moved
 };
 
 }  // namespace quarry::engine

@@ -15,7 +15,13 @@ Index::Index(std::string directory, bool paused, WriterLimits limits, std::funct
       paused_(paused),
       directory_(std::move(directory)) {}
 
-Index::Access::Access(Index* index) : index_(index), lock_(index->gate_) {
+Index::Access::Access(Index* index, bool wait)
+    : index_(index), lock_(index->gate_, std::defer_lock) {
+  if (wait) {
+    lock_.lock();
+  } else if (!lock_.try_lock()) {
+    throw Error(kMovingIndex, "The index is being moved");
+  }
   if (!index_->store_) throw Error(kDamagedIndex, index_->Problem());
 }
 
@@ -127,6 +133,10 @@ void Index::Remap(const Schema& schema) {
 void Index::Remove() {
   const std::unique_lock<std::shared_mutex> lock(gate_);
   store_.reset();
+  {
+    const std::lock_guard<std::mutex> problem_lock(problem_mutex_);
+    problem_ = "The index has been deleted";
+  }
   RemoveDatabase(directory_);
 }
 

@@ -32,8 +32,9 @@ class Index {
   // Keeps the database open as long as it lives: replacing or moving it waits.
   class Access {
    public:
-    // Throws Error kDamagedIndex, saying why, when there is no sound database.
-    explicit Access(Index* index);
+    // Throws Error kDamagedIndex, saying why, when there is no sound database. One that is being
+    // replaced or moved is waited for, or, without `wait`, Error kMovingIndex.
+    explicit Access(Index* index, bool wait = true);
 
     const std::shared_ptr<const Schema>& schema() const;
     ReaderPool::Lease TakeReader();

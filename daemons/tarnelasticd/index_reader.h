@@ -38,7 +38,7 @@ class IndexReader {
   Database db_;
   TextTokenizer tokenizer_;
   RankContext* rank_context_ = nullptr;
-  std::chrono::steady_clock::time_point deadline_{};
+  std::chrono::steady_clock::time_point deadline_ = std::chrono::steady_clock::time_point::max();
 };
 
 // Readers to be used again. Any thread.

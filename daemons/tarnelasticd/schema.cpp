@@ -116,7 +116,8 @@ std::vector<double> Schema::Weights() const {
 std::string Schema::ColumnOf(const std::string& field) const {
   const Field* found = Find(field);
   if (found == nullptr || found->storage == Storage::kText) return "";
-  return found->storage == Storage::kPath ? "path" : "c" + std::to_string(found->column);
+  if (found->storage == Storage::kPath) return "path";
+  return std::string("c").append(std::to_string(found->column));
 }
 
 std::string Schema::ColumnList(std::string_view prefix, std::size_t count) {
@@ -144,8 +145,9 @@ std::string Schema::CreateStatements() const {
   if (!changed.empty()) add_index("docs_changed", changed);
   const std::string extension = ColumnOf(kFieldExtension);
   const std::string is_dir = ColumnOf(kFieldIsDir);
-  if (!extension.empty())
-    add_index("docs_extension", extension + (is_dir.empty() ? "" : ',' + is_dir));
+  std::string files = extension;
+  if (!is_dir.empty()) files.append(",").append(is_dir);
+  if (!extension.empty()) add_index("docs_extension", files);
   const auto add_words = [&](const std::string& name, const std::string& columns,
                              const std::string& tokenizer) {
     sql += "CREATE VIRTUAL TABLE " + name + " USING fts5(" + columns +
