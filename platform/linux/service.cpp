@@ -79,10 +79,11 @@ bool UsesSystemd() {
   return Root().empty() && lstat("/run/systemd/system", &info) == 0 && S_ISDIR(info.st_mode);
 }
 
-int AskSupervisor(const std::string& command, const std::string& service) {
+int AskSupervisor(const std::string& command, const std::string& service, bool force) {
   Json::Value request;
   request["command"] = command;
   request["data"]["service"] = service;
+  if (force) request["data"]["force"] = true;
   SupervisorConnection connection;
   std::string reply;
   if (!connection.ConnectWithTimeout() || !connection.Send(toString(request)) ||
@@ -116,7 +117,7 @@ int HLIBServiceStart(const char* name, int wait) {
 
 int HLIBServiceStop(const char* name, int force) {
   if (!IsServiceName(name)) return QUARRY_PLATFORM_FAIL(kErrBadParameter);
-  if (!UsesSystemd()) return AskSupervisor("stop", name);
+  if (!UsesSystemd()) return AskSupervisor("stop", name, force != 0);
   if (force != 0) {
     HLIBCExec(kSystemctl, "--quiet", "kill", "--signal=SIGKILL", UnitOf(name).c_str(), nullptr);
   }
