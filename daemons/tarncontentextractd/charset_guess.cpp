@@ -87,17 +87,23 @@ bool BelongsInText(std::int32_t c) {
          type != U_CONTROL_CHAR;
 }
 
-// The characters below 128 of bytes that are text of this width and order, plus one; 0 for others.
-std::size_t WideScore(std::string_view bytes, std::size_t width, bool little) {
+// What bytes consist of if they are text of this width and order.
+struct WideCounts {
+  std::size_t all = 0;
   std::size_t ascii = 0;
-  std::size_t odd = 0;
-  std::size_t count = 0;
-  for (std::size_t at = 0; at + width <= bytes.size(); ++count) {
+  std::size_t odd = 0;  // characters that text does not hold
+
+  bool IsText() const { return all > 0 && odd * 100 <= all; }
+};
+
+WideCounts CountWide(std::string_view bytes, std::size_t width, bool little) {
+  WideCounts counts;
+  for (std::size_t at = 0; at + width <= bytes.size(); ++counts.all) {
     const std::int32_t c = WideCharacter(bytes, &at, width, little);
-    if (!BelongsInText(c)) ++odd;
-    if (c > 0 && c < 0x80) ++ascii;
+    if (!BelongsInText(c)) ++counts.odd;
+    if (c > 0 && c < 0x80) ++counts.ascii;
   }
-  return count == 0 || odd * 100 > count ? 0 : ascii + 1;
+  return counts;
 }
 
 struct Wide {
@@ -107,6 +113,14 @@ struct Wide {
 };
 constexpr std::array<Wide, 4> kWides{
     {{"UTF-32LE", 4, true}, {"UTF-32BE", 4, false}, {"UTF-16LE", 2, true}, {"UTF-16BE", 2, false}}};
+
+// Whether nearly all bytes are ASCII by themselves. Wide text never has more than three in four;
+// ASCII with a stray NUL byte could be read as Chinese.
+bool IsMostlyAscii(std::string_view bytes) {
+  const auto ascii = std::count_if(bytes.begin(), bytes.end(),
+                                   [](char c) { return (c >= ' ' && c <= '~') || c == '\n'; });
+  return static_cast<std::size_t>(ascii) * 100 > bytes.size() * 85;
+}
 
 // The part with the first characters above 127: the beginning may be a licence in plain English.
 std::string_view Sample(std::string_view bytes) {
@@ -164,12 +178,16 @@ ByteCounts CountBytes(std::string_view bytes) {
 
 std::string GuessWideCharset(std::string_view bytes) {
   const std::string_view sample = bytes.substr(0, kSampleBytes);
-  std::size_t best_score = 0;
+  std::size_t most_ascii = 0;
   std::string best;
+  if (IsMostlyAscii(sample)) return best;
   for (const Wide& wide : kWides) {
-    const std::size_t score = WideScore(sample, wide.width, wide.little);
-    if (score > best_score) {
-      best_score = score;
+    const WideCounts counts = CountWide(sample, wide.width, wide.little);
+    // In any language there are blanks, digits or line ends now and then. (Tables of small numbers
+    // can be read as letters, too.)
+    const bool likely = counts.IsText() && counts.ascii * 200 >= counts.all;
+    if (likely && counts.ascii > most_ascii) {
+      most_ascii = counts.ascii;
       best = wide.charset;
     }
   }
@@ -180,7 +198,7 @@ bool IsWideText(std::string_view bytes, const std::string& charset) {
   const auto wide = std::find_if(kWides.begin(), kWides.end(),
                                  [&](const Wide& each) { return charset == each.charset; });
   if (wide == kWides.end() || bytes.size() < wide->width) return bytes.empty();
-  return WideScore(bytes.substr(0, kSampleBytes), wide->width, wide->little) > 0;
+  return CountWide(bytes.substr(0, kSampleBytes), wide->width, wide->little).IsText();
 }
 
 std::vector<std::string> GuessCharsets(std::string_view bytes) {
@@ -193,9 +211,14 @@ std::vector<std::string> GuessCharsets(std::string_view bytes) {
 
 bool IsWideCharset(const std::string& charset) {
   UErrorCode status = U_ZERO_ERROR;
-  const char* name = ucnv_getCanonicalName(charset.c_str(), "MIME", &status);
-  if (U_FAILURE(status) || name == nullptr) return true;
-  return std::strncmp(name, "UTF-", 4) == 0;
+  UConverter* converter = ucnv_open(charset.c_str(), &status);
+  if (U_FAILURE(status)) return false;
+  static constexpr std::array<UConverterType, 8> kWideTypes{
+      UCNV_UTF8,  UCNV_UTF16,           UCNV_UTF16_BigEndian,    UCNV_UTF16_LittleEndian,
+      UCNV_UTF32, UCNV_UTF32_BigEndian, UCNV_UTF32_LittleEndian, UCNV_CESU8};
+  const bool wide = std::count(kWideTypes.begin(), kWideTypes.end(), ucnv_getType(converter)) > 0;
+  ucnv_close(converter);
+  return wide;
 }
 
 }  // namespace quarry::extract

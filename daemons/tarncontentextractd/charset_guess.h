@@ -18,8 +18,9 @@ struct ByteCounts {
   std::size_t invalid = 0;    // bytes that are not part of UTF-8, but for a cut at the end
   bool shift = false;         // an escape sequence that changes the character set (ISO 2022)
 
-  // Whether the bytes are no text in any encoding without NUL bytes.
-  bool IsBinary() const { return control > (size < 100 ? 1 : size / 50); }
+  // Whether the bytes are no text in any encoding without NUL bytes. Of what is UTF-8 throughout
+  // more is believed: some texts are about control characters.
+  bool IsBinary() const { return control > 1 && control > size / (invalid == 0 ? 10 : 50); }
   // Whether they are UTF-8 that was damaged here and there.
   bool IsMostlyUtf8() const { return sequences > 0 && invalid * 10 <= sequences; }
 };

@@ -114,6 +114,21 @@ std::string DecodeEntity(std::string_view name) {
   return entity == nullptr ? std::string() : Utf8Of(entity->value);
 }
 
+std::string DecodeReferences(std::string_view utf8) {
+  std::string out;
+  while (!utf8.empty()) {
+    const std::size_t start = std::min(utf8.find('&'), utf8.size());
+    out.append(utf8.substr(0, start));
+    utf8.remove_prefix(start);
+    const std::size_t end = utf8.substr(0, kMaxEntityName).find(';');
+    const std::string decoded =
+        end == std::string_view::npos ? std::string() : DecodeEntity(utf8.substr(1, end - 1));
+    out.append(decoded.empty() ? utf8.substr(0, 1) : std::string_view(decoded));
+    utf8.remove_prefix(std::min(decoded.empty() ? 1 : end + 1, utf8.size()));
+  }
+  return out;
+}
+
 void PrepareXmlLibrary() {
   xmlInitParser();
   xmlSetExternalEntityLoader(RefuseToLoad);

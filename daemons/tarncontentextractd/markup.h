@@ -37,6 +37,9 @@ std::string DeclaredCharset(std::string_view bytes);
 // The UTF-8 of a named ("amp") or numeric ("#38", "#x26") character reference; empty for others.
 std::string DecodeEntity(std::string_view name);
 
+// `utf8` with its character references ("&amp;", "&#38;") decoded; others stand as they are.
+std::string DecodeReferences(std::string_view utf8);
+
 // Adds the text of an HTML document or fragment, in UTF-8, without scripts, styles and titles.
 void AppendHtmlText(std::string_view utf8, TextSink& sink);
 

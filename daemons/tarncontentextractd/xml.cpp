@@ -17,6 +17,11 @@ namespace quarry::extract {
 namespace {
 
 constexpr std::string_view kDublinCore = "http://purl.org/dc/elements/1.1/";
+// Its attributes are coordinates and colours.
+constexpr std::string_view kDrawing = "http://www.w3.org/2000/svg";
+
+// The parser gives an attribute as so many pointers, the last two around its value.
+constexpr int kAttributePointers = 5;
 
 std::string_view View(const xmlChar* text) {
   return text == nullptr ? std::string_view() : reinterpret_cast<const char*>(text);
@@ -27,8 +32,11 @@ class XmlReader {
  public:
   explicit XmlReader(Extraction& out) : out_(out) {}
 
-  void Start(std::string_view name, std::string_view space) {
+  void Start(std::string_view name, std::string_view space, const xmlChar** attributes,
+             int attribute_count) {
     out_.text().Break();
+    // Only where elements hold no words are they looked for in attributes.
+    if (out_.text().empty() && space != kDrawing) TakeAttributes(attributes, attribute_count);
     ++depth_;
     if (field_ != nullptr) return;
     field_ = FieldOf(name, space);
@@ -51,7 +59,22 @@ class XmlReader {
 
   bool full() { return out_.text().full(); }
 
+  void Finish() {
+    if (out_.text().empty()) out_.text().Append(attributes_.text());
+  }
+
  private:
+  void TakeAttributes(const xmlChar** attributes, int count) {
+    attributes_.Break();
+    for (int i = 0; i < count; ++i, attributes += kAttributePointers) {
+      const char* value = reinterpret_cast<const char*>(attributes[3]);
+      const char* end = reinterpret_cast<const char*>(attributes[4]);
+      attributes_.Append(
+          DecodeReferences(std::string_view(value, static_cast<std::size_t>(end - value))));
+      attributes_.Space();
+    }
+  }
+
   static const char* FieldOf(std::string_view name, std::string_view space) {
     if (name == "title") return kTitleField;
     if (space != kDublinCore) return nullptr;
@@ -71,14 +94,18 @@ class XmlReader {
 
   Extraction& out_;
   TextSink value_{kMaxFieldBytes};
+  TextSink attributes_{kMaxTextBytes};
   const char* field_ = nullptr;
   std::size_t depth_ = 0;
   std::size_t field_depth_ = 0;
 };
 
+// What the parser calls back with.
 struct Session {
   XmlReader* reader;
   xmlParserCtxtPtr context;
+  xmlEntity entity{};
+  std::string character;
 };
 
 XmlReader& ReaderOf(void* session) {
@@ -86,8 +113,8 @@ XmlReader& ReaderOf(void* session) {
 }
 
 void OnStart(void* session, const xmlChar* name, const xmlChar*, const xmlChar* space, int,
-             const xmlChar**, int, int, const xmlChar**) {
-  ReaderOf(session).Start(View(name), View(space));
+             const xmlChar**, int attribute_count, int, const xmlChar** attributes) {
+  ReaderOf(session).Start(View(name), View(space), attributes, attribute_count);
 }
 
 void OnEnd(void* session, const xmlChar*, const xmlChar*, const xmlChar*) {
@@ -99,8 +126,20 @@ void OnText(void* session, const xmlChar* text, int size) {
   if (ReaderOf(session).full()) xmlStopParser(static_cast<Session*>(session)->context);
 }
 
-void OnReference(void* session, const xmlChar* name) {
-  ReaderOf(session).Text(DecodeEntity(View(name)));
+// The characters that HTML names are used without being declared. As a predefined entity one is
+// handed on as text; in an attribute the parser would take its first byte only.
+xmlEntityPtr NamedCharacter(void* session, const xmlChar* name) {
+  if (static_cast<Session*>(session)->context->instate == XML_PARSER_ATTRIBUTE_VALUE) {
+    return nullptr;
+  }
+  Session& current = *static_cast<Session*>(session);
+  current.character = DecodeEntity(View(name));
+  if (current.character.empty()) return nullptr;
+  current.entity = xmlEntity{};
+  current.entity.type = XML_ENTITY_DECL;
+  current.entity.etype = XML_INTERNAL_PREDEFINED_ENTITY;
+  current.entity.content = reinterpret_cast<xmlChar*>(current.character.data());
+  return &current.entity;
 }
 
 xmlEntityPtr NoEntity(void*, const xmlChar*) {
@@ -115,8 +154,7 @@ xmlSAXHandler Handler() {
   handler.characters = OnText;
   handler.cdataBlock = OnText;
   handler.ignorableWhitespace = OnText;
-  handler.reference = OnReference;
-  handler.getEntity = NoEntity;
+  handler.getEntity = NamedCharacter;
   handler.getParameterEntity = NoEntity;
   return handler;
 }
@@ -134,12 +172,13 @@ void Parse(std::string_view utf8, XmlReader& reader) {
   PrepareXmlLibrary();
   const Context context(xmlNewParserCtxt());
   if (!context) throw std::bad_alloc();
-  Session session{&reader, context.get()};
+  Session session{&reader, context.get(), {}, {}};
   *context->sax = Handler();
   context->userData = &session;
   xmlCtxtReadMemory(context.get(), utf8.data(), static_cast<int>(utf8.size()), nullptr, "UTF-8",
                     XML_PARSE_RECOVER | XML_PARSE_NOERROR | XML_PARSE_NOWARNING | XML_PARSE_NONET |
                         XML_PARSE_IGNORE_ENC | XML_PARSE_HUGE);
+  reader.Finish();
 }
 
 class XmlExtractor : public Extractor {

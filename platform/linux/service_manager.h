@@ -11,8 +11,9 @@ namespace quarry::platform {
 // have the supervisor, `quarry run`.
 bool UsesSystemd();
 
-// Asks the supervisor to "start" or "stop" a service, with `force` without letting it finish. 0, or negative, with the platform's last
-// error set, when it does not run, refuses, or does not answer within a minute.
+// Asks the supervisor to "start" or "stop" a service, with `force` without letting it finish. 0, or
+// negative, with the platform's last error set, when it does not run, refuses, or does not answer
+// within a minute.
 int AskSupervisor(const std::string& command, const std::string& service, bool force = false);
 
 // The service behind a job: "pkg-Quarry-fileindexd" is "fileindexd".

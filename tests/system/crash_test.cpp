@@ -10,7 +10,7 @@
 #include "common/error.h"
 #include "daemons/common/client.h"
 #include "tests/support/files.h"
-#include "tests/system/system_under_test.h"
+#include "tests/system/running_system.h"
 
 namespace quarry::test {
 namespace {
@@ -34,7 +34,7 @@ class CrashTest : public testing::Test {
     EXPECT_EQ(system_.Documents(docs_), Listing(docs_));
   }
 
-  SystemUnderTest system_;
+  RunningSystem system_;
   std::string docs_ = system_.Files() + "/docs";
 };
 

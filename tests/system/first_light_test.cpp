@@ -6,7 +6,7 @@
 
 #include "common/file_util.h"
 #include "tests/support/files.h"
-#include "tests/system/system_under_test.h"
+#include "tests/system/running_system.h"
 
 namespace quarry::test {
 namespace {
@@ -44,7 +44,7 @@ class FirstLightTest : public testing::Test {
   }
 
   using Names = std::vector<std::string>;
-  SystemUnderTest system_;
+  RunningSystem system_;
   std::string docs_ = system_.Files() + "/docs";
 };
 

@@ -1,7 +1,7 @@
 // A whole private system for one test: the real programs below the test's own root.
 
-#ifndef QUARRY_TESTS_SYSTEM_SYSTEM_UNDER_TEST_H_
-#define QUARRY_TESTS_SYSTEM_SYSTEM_UNDER_TEST_H_
+#ifndef QUARRY_TESTS_SYSTEM_RUNNING_SYSTEM_H_
+#define QUARRY_TESTS_SYSTEM_RUNNING_SYSTEM_H_
 
 #include <json/json.h>
 
@@ -20,10 +20,10 @@ struct Ran {
   std::string end;     // "exit code 0"
 };
 
-class SystemUnderTest {
+class RunningSystem {
  public:
   // An empty root; nothing runs yet.
-  SystemUnderTest();
+  RunningSystem();
 
   // Starts "quarry run" and waits until the engine listens.
   void Start();
@@ -59,4 +59,4 @@ std::multiset<std::string> Listing(const std::string& top);
 
 }  // namespace quarry::test
 
-#endif  // QUARRY_TESTS_SYSTEM_SYSTEM_UNDER_TEST_H_
+#endif  // QUARRY_TESTS_SYSTEM_RUNNING_SYSTEM_H_

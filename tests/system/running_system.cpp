@@ -1,4 +1,4 @@
-#include "tests/system/system_under_test.h"
+#include "tests/system/running_system.h"
 
 #include <gtest/gtest.h>
 
@@ -23,31 +23,31 @@ std::string Program() {
 
 }  // namespace
 
-SystemUnderTest::SystemUnderTest() {
+RunningSystem::RunningSystem() {
   ResetTestRoot();
 }
 
-void SystemUnderTest::Start() {
+void RunningSystem::Start() {
   supervisor_.emplace(Program(), std::vector<std::string>{"run"}, scratch_ / "run.log");
   ASSERT_TRUE(WaitUntil([] {
     return daemon::IsListening(cli::SupervisorSocket()) && daemon::IsListening(cli::EngineSocket());
   })) << ReadFile(scratch_ / "run.log");
 }
 
-void SystemUnderTest::Stop() {
+void RunningSystem::Stop() {
   supervisor_->Signal(SIGTERM);
   EXPECT_TRUE(supervisor_->WaitEnded(kPatience));
   EXPECT_EQ(supervisor_->Ended().value_or("still running"), "exit code 0");
   supervisor_.reset();
 }
 
-void SystemUnderTest::Kill() {
+void RunningSystem::Kill() {
   supervisor_->Signal(SIGKILL);
   EXPECT_TRUE(supervisor_->WaitEnded(kPatience));
   supervisor_.reset();
 }
 
-Ran SystemUnderTest::Quarry(const std::vector<std::string>& arguments) const {
+Ran RunningSystem::Quarry(const std::vector<std::string>& arguments) const {
   const std::string output = scratch_ / "output";
   Unlink(output);
   cli::Child child(Program(), arguments, output);
@@ -55,7 +55,7 @@ Ran SystemUnderTest::Quarry(const std::vector<std::string>& arguments) const {
   return {ReadFile(output), *child.Ended()};
 }
 
-Json::Value SystemUnderTest::QuarryJson(std::vector<std::string> arguments) const {
+Json::Value RunningSystem::QuarryJson(std::vector<std::string> arguments) const {
   arguments.emplace_back("--json");
   const Ran ran = Quarry(arguments);
   EXPECT_EQ(ran.end, "exit code 0") << ran.output;
@@ -64,7 +64,7 @@ Json::Value SystemUnderTest::QuarryJson(std::vector<std::string> arguments) cons
   return value;
 }
 
-bool SystemUnderTest::WaitUntilIdle() const {
+bool RunningSystem::WaitUntilIdle() const {
   return WaitUntil(
       [this] {
         const Ran ran = Quarry({"folder", "list", "--status", "--json"});
@@ -78,7 +78,7 @@ bool SystemUnderTest::WaitUntilIdle() const {
       std::chrono::milliseconds(kPatience));
 }
 
-std::multiset<std::string> SystemUnderTest::Documents(const std::string& share_path) const {
+std::multiset<std::string> RunningSystem::Documents(const std::string& share_path) const {
   Json::Value data;
   data["id"] = "fileindex_" + Basename(share_path);
   data["query"]["qsl"]["prefix"]["TARNMDPath"] = Dirname(share_path) + "/";
@@ -90,7 +90,7 @@ std::multiset<std::string> SystemUnderTest::Documents(const std::string& share_p
   return paths;
 }
 
-pid_t SystemUnderTest::Pid(const std::string& service) const {
+pid_t RunningSystem::Pid(const std::string& service) const {
   const Json::Value status = cli::AskSupervisor("status", Json::Value(Json::objectValue));
   for (const Json::Value& entry : status["services"]) {
     if (entry["name"] == service) return entry["pid"].asInt();

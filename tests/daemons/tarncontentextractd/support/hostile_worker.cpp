@@ -1,0 +1,122 @@
+// A worker whose formats do what a parser must never be able to do. The file's extension says what
+// it tries; what came of it is reported as the file's title. The first argument says how it starts.
+
+#include <fcntl.h>
+#include <signal.h>
+#include <sys/mman.h>
+#include <sys/ptrace.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdint>
+#include <cstdlib>
+#include <cstring>
+#include <memory>
+#include <stdexcept>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "daemons/tarncontentextractd/markup.h"
+#include "daemons/tarncontentextractd/sandbox.h"
+#include "daemons/tarncontentextractd/worker.h"
+#include "daemons/tarncontentextractd/worker_protocol.h"
+
+namespace quarry::extract {
+namespace {
+
+std::string Result(long result) {
+  return result < 0 ? std::string("refused: ") + strerrorname_np(errno) : "possible";
+}
+
+std::string Try(const std::string& what, Source& source) {
+  char* const none[] = {nullptr};
+  if (what == "socket") return Result(socket(AF_INET, SOCK_STREAM, 0));
+  if (what == "localsocket") return Result(socket(AF_UNIX, SOCK_DGRAM, 0));
+  if (what == "create") return Result(open("/tmp/planted", O_CREAT | O_WRONLY, 0600));
+  if (what == "read") return Result(open("/etc/passwd", O_RDONLY));
+  if (what == "write") return Result(write(source.fd(), "x", 1));
+  if (what == "truncate") return Result(ftruncate(source.fd(), 0));
+  if (what == "chmod") return Result(fchmod(source.fd(), 0777));
+  if (what == "exec") return Result(execve("/bin/true", none, none));
+  if (what == "fork") return Result(fork());
+  if (what == "kill") return Result(kill(getppid(), SIGTERM));
+  if (what == "trace") return Result(ptrace(PTRACE_ATTACH, getppid(), nullptr, nullptr));
+  if (what == "root") return Result(setuid(0));
+  if (what == "limit") return Result(nice(-1));
+  return "unknown";
+}
+
+[[noreturn]] void Stall() {
+  for (;;) pause();
+}
+
+// All the memory there is, touched.
+void Devour() {
+  std::vector<std::unique_ptr<char[]>> held;
+  for (;;) {
+    held.push_back(std::make_unique<char[]>(std::size_t{16} << 20));
+    std::memset(held.back().get(), 1, std::size_t{16} << 20);
+  }
+}
+
+int files_seen = 0;
+
+class HostileExtractor : public Extractor {
+ public:
+  const char* Name() const override { return "hostile"; }
+  bool Recognizes(std::string_view) const override { return false; }
+  bool Claims(std::string_view) const override { return true; }
+
+  void Extract(Source& source, Extraction& out) const override {
+    const std::string& what = source.extension();
+    ++files_seen;
+    if (what == "crash") raise(SIGSEGV);
+    if (what == "abort") std::abort();
+    if (what == "leave") _exit(0);
+    if (what == "stall") Stall();
+    if (what == "spin") Spin();
+    if (what == "memory") Devour();
+    if (what == "throw") Throw(out);
+    if (what == "garbage") SendAnswer(kWorkerChannel, "no fields at all");
+    if (what == "endless") ClaimMuch();
+    if (what == "usedcrash" && files_seen > 1) raise(SIGKILL);
+    if (what == "good" || what == "usedcrash") out.text().Append(source.Bytes());
+    out.Set(kTitleField, Try(what, source));
+  }
+
+ private:
+  [[noreturn]] static void Spin() {
+    for (volatile unsigned counter = 0;;) counter = counter + 1;
+  }
+  static void Throw(Extraction& out) {
+    out.text().Append("what was found before");
+    throw std::runtime_error("broken file");
+  }
+  // Claims an answer of 4 GiB.
+  [[noreturn]] static void ClaimMuch() {
+    const std::uint32_t size = 0xFFFFFFFF;
+    if (write(kWorkerChannel, &size, sizeof(size)) < 0) _exit(1);
+    Stall();
+  }
+};
+
+int Main(const std::string& mode) {
+  const int channel = kWorkerChannel;
+  if (mode == "dies") return 7;
+  if (mode == "silent") Stall();
+  if (mode == "talks") return SendAnswer(channel, "nonsense") ? 0 : 1;
+  if (mode == "open") return Announce(channel, FindGap()) ? 0 : kExitNotClosed;
+  Registry registry;
+  registry.Add(std::make_unique<HostileExtractor>());
+  return RunWorker(registry, channel);
+}
+
+}  // namespace
+}  // namespace quarry::extract
+
+int main(int argc, char** argv) {
+  return quarry::extract::Main(argc > 1 ? argv[1] : "");
+}
