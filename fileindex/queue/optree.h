@@ -118,8 +118,9 @@ class QUARRY_EXPORT OPTree {
   // constructor.
   void BuildTree();
 
-  // Folds one event into the tree. Throws Error 120 when one of its paths holds a NUL byte, and when
-  // a configuration change cannot be merged because one of the two is neither an object nor null.
+  // Folds one event into the tree. Throws Error 120 when one of its paths holds a NUL byte, and
+  // when a configuration change cannot be merged because one of the two is neither an object nor
+  // null.
   void InsertEvent(std::shared_ptr<Event> event);
 
   // The node of a path, created with all nodes above it as needed; empty components do not count.
