@@ -1,4 +1,4 @@
-R"bash(# Completion of quarry's commands, options and shares for bash.
+# Completion of quarry's commands, options and shares for bash.
 _quarry() {
   local current=${COMP_WORDS[COMP_CWORD]} previous=${COMP_WORDS[COMP_CWORD-1]}
   local command=${COMP_WORDS[1]} below=${COMP_WORDS[2]} words=""
@@ -28,4 +28,3 @@ _quarry() {
   fi
 }
 complete -o filenames -F _quarry quarry
-)bash"
