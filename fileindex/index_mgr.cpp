@@ -99,7 +99,8 @@ void LogSharingFailure(const char* call) {
 // cannot tell what is set, it is left as it is.
 void SetupSearchOfSharingService(bool enable) {
   const int enabled = TARNSMBIsEnableSpotlight();
-  if (enabled < 0 || (enabled != 0) == enable) return;
+  if (0 > enabled) LogServiceFailure("0 > TARNSMBIsEnableSpotlight()");
+  if (0 > enabled || (enabled != 0) == enable) return;
   if (0 > TARNSMBSetSpotlight(enable ? 1 : 0)) {
     LogSharingFailure("TARNSMBSetSpotlight");
   } else if (0 > HLIBServiceRestart("samba")) {

@@ -132,8 +132,9 @@ bool FolderMgr::IsFullPathIndexed(const std::string& full_path) const {
 }
 
 bool FolderMgr::IsShareIndexed(const std::string& share) const {
-  return std::any_of(folders_.begin(), folders_.end(),
-                     [&](const FolderPtr& folder) { return folder->Share() == share; });
+  return std::any_of(folders_.begin(), folders_.end(), [&](const FolderPtr& folder) {
+    return GetShareNameByPath(folder->GetPath()) == share;
+  });
 }
 
 std::set<std::string> FolderMgr::GetIndexedShares() const {

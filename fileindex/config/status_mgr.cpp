@@ -38,7 +38,7 @@ long long PauseEnd(int hours) {
 
 const std::string kFileIndexStatusCfgPath = RootedPath("/var/packages/Quarry/etc/fileindex.status");
 
-StatusMgr::StatusMgr() : data_(Json::objectValue) {
+StatusMgr::StatusMgr() {
   if (IsAnythingAt(kFileIndexStatusCfgPath) && !fromFile(data_, kFileIndexStatusCfgPath)) {
     Fail(QUARRY_SITE_AT("status_mgr", 20),
          "IsFileExist(kFileIndexStatusCfgPath) && !data_.fromFile(kFileIndexStatusCfgPath)",
@@ -48,7 +48,6 @@ StatusMgr::StatusMgr() : data_(Json::objectValue) {
     Fail(QUARRY_SITE("status_mgr"), "!data_.isObject()", kErrorBadParameter,
          "Not an object" + AppendData(data_));
   }
-  if (data_.isNull()) data_ = Json::Value(Json::objectValue);
 }
 
 void StatusMgr::Save() const {
@@ -103,9 +102,9 @@ void StatusMgr::UnsetShareStatus(const std::string& share, int bits) {
 
 void StatusMgr::ClearShareStatus(const std::string& share) {
   const LockFile lock(kStatusLockPath, true);
-  const Json::Value& shares = Shares();
+  Json::Value& shares = data_[kShare];
   if (!isObject(shares)) throw Error(kErrorBadParameter, "Not an object" + AppendData(shares));
-  if (!shares.isNull()) data_[kShare].removeMember(share);
+  shares.removeMember(share);
   Save();
 }
 

@@ -81,8 +81,8 @@ class FolderUpsertTest : public fake::FakePlatformTest {
     return fake::QueuePath(volume_ + "/" + share);
   }
 
-  // The failure of an operation, as "code reason"; "" when it does not fail. The lock is free and
-  // no privilege is kept in either case.
+  // The failure of an operation, as "code reason"; "" when it does not fail. The lock is free in
+  // either case.
   static std::string FailureOf(const std::function<void()>& operation) {
     std::string failure;
     try {

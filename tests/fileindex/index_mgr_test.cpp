@@ -241,9 +241,13 @@ TEST_F(ServicesTest, LeavesTheSharingServiceAloneWhereNothingChanges) {
 
 TEST_F(ServicesTest, LeavesTheSharingServiceAloneWhereItsSettingIsNotKnown) {
   for (bool enable : {true, false}) {
-    fake::FailCall("TARNSMBIsEnableSpotlight");
+    fake::FailCall("TARNSMBIsEnableSpotlight", 1, {-1, enable ? EACCES : 0, 0});
     fake::ClearCalls();
+    fake::ClearLogs();
     SetupRelatedServices(enable);
+    EXPECT_THAT(Logs(),
+                ElementsAre(Logged("Failed [0 > TARNSMBIsEnableSpotlight()]" +
+                                   std::string(enable ? " [err: Permission denied]" : ""))));
     EXPECT_THAT(fake::CallsOf("TARNSMBSetSpotlight"), IsEmpty());
     EXPECT_THAT(fake::CallsOf("HLIBServiceRestart"), IsEmpty());
     EXPECT_EQ(Calls().size(), 3U);
@@ -276,6 +280,19 @@ TEST_F(ServicesTest, AFailedRestartIsLogged) {
                 ElementsAre(Logged("HLIBServiceRestart failed: err=[0x12345 service.c:7]")));
     EXPECT_EQ(Calls().size(), 5U);
   }
+}
+
+TEST_F(ServicesTest, FailuresOfTheSharingServiceAreLoggedWithErrno) {
+  fake::FailCall("TARNSMBSetSpotlight", 1, {-1, EROFS, 0x400});
+  SetupRelatedServices(true);
+  EXPECT_THAT(Logs(), ElementsAre(Logged("TARNSMBSetSpotlight failed: err=[0x0400 :0] "
+                                         "[err: Read-only file system]")));
+  fake::ClearLogs();
+  fake::FailCall("HLIBServiceRestart", 1, {-2, ENOENT, 0});
+  SetupRelatedServices(true);
+  EXPECT_THAT(Logs(), ElementsAre(Logged("HLIBServiceRestart failed: err=[0x0400 :0] "
+                                         "[err: No such file or directory]")));
+  EXPECT_EQ(errno, 0);
 }
 
 TEST_F(ServicesTest, EveryFailureIsLoggedAndTheRestIsDone) {

@@ -5,93 +5,23 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cerrno>
-#include <functional>
 #include <memory>
 #include <random>
 #include <string>
+#include <utility>
 #include <vector>
 
-#include "common/error.h"
 #include "common/file_util.h"
 #include "common/json.h"
 #include "common/paths.h"
-#include "tests/fake_platform/fixture.h"
-#include "tests/support/files.h"
+#include "tests/fileindex/config/folder_mgr_fixture.h"
 
 namespace quarry::fileindex {
 namespace {
 
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
-
-using FolderPtr = std::shared_ptr<Folder>;
-
-// A folder whose kinds are given by letters: "davp" is all four.
-FolderPtr Make(const std::string& path, const std::string& kinds, const std::string& name = "n") {
-  const auto has = [&](char kind) { return kinds.find(kind) != std::string::npos; };
-  return std::make_shared<Folder>(path, name, has('d'), has('a'), has('v'), has('p'), false, false);
-}
-
-std::string Kinds(const FolderPtr& folder) {
-  if (!folder) return "none";
-  return std::string(folder->IsDocument() ? "d" : "") + (folder->IsAudio() ? "a" : "") +
-         (folder->IsVideo() ? "v" : "") + (folder->IsPhoto() ? "p" : "");
-}
-
-std::string PathOf(const FolderPtr& folder) {
-  return folder ? folder->GetPath() : "none";
-}
-
-std::vector<std::string> Paths(const std::vector<FolderPtr>& folders) {
-  std::vector<std::string> paths;
-  for (const FolderPtr& folder : folders) paths.push_back(folder->GetPath());
-  return paths;
-}
-
-class FolderMgrTest : public fake::FakePlatformTest {
- protected:
-  FolderMgrTest() {
-    fake::AddShare("s", volume_ + "/s");
-    fake::AddShare("t", volume_ + "/t");
-  }
-
-  static void Store(const std::string& text) { test::WriteFile(kFileIndexFoldersCfgPath, text); }
-  static std::string Stored() { return test::ReadFile(kFileIndexFoldersCfgPath); }
-
-  // A list of folders of all kinds, in this order.
-  static FolderMgr ListOf(const std::vector<std::string>& paths) {
-    FolderMgr folders;
-    for (const std::string& path : paths) Upsert(folders, Make(path, "davp"));
-    return folders;
-  }
-  static FolderPtr Upsert(FolderMgr& folders, const FolderPtr& folder) {
-    FolderPtr diff;
-    folders.Upsert(diff, folder);
-    return diff;
-  }
-  static FolderPtr Delete(FolderMgr& folders, const std::string& path) {
-    FolderPtr diff;
-    folders.Delete(diff, path);
-    return diff;
-  }
-
-  // The failure of `action`, as "code reason"; "" when it does not fail.
-  static std::string FailureOf(const std::function<void()>& action) {
-    try {
-      action();
-    } catch (const Error& error) {
-      return std::to_string(error.code()) + " " + error.reason();
-    }
-    return "";
-  }
-  static std::string LoadFailure() {
-    return FailureOf([] { FolderMgr folders; });
-  }
-
-  const std::string volume_ = test::TestRoot() + "/volume1";
-};
 
 // ---- The file
 
@@ -366,6 +296,14 @@ TEST_F(FolderMgrTest, SharesThatHaveFoldersAreIndexed) {
   EXPECT_THAT(FolderMgr().GetIndexedShares(), IsEmpty());
 }
 
+TEST_F(FolderMgrTest, AFolderOfARenamedShareIsIndexedUnderTheNewName) {
+  const FolderMgr folders = ListOf({"/s/a"});
+  folders.GetFolders()[0]->SetShare("t");
+  EXPECT_FALSE(folders.IsShareIndexed("s"));
+  EXPECT_TRUE(folders.IsShareIndexed("t"));
+  EXPECT_THAT(folders.GetIndexedShares(), ElementsAre("t"));
+}
+
 TEST_F(FolderMgrTest, AVanishedShareFailsTheQuestionsAboutFullPathsOnly) {
   const FolderMgr folders = ListOf({"/s/a"});
   folders.Save();
@@ -529,103 +467,6 @@ TEST_F(FolderMgrTest, DeleteByShareRemovesItsFoldersAlone) {
   EXPECT_THAT(Paths(folders.GetFolders()), ElementsAre("/t/s", "/t"));
   folders.DeleteByShare("gone");
   EXPECT_THAT(Paths(folders.GetFolders()), ElementsAre("/t/s", "/t"));
-}
-
-// ---- Pages
-
-class FolderMgrListTest : public FolderMgrTest {
- protected:
-  FolderMgrListTest() {
-    Upsert(folders_, Make("/s/B", "dv", "zebra"));
-    Upsert(folders_, Make("/s/a", "ap", "Apple"));
-    Upsert(folders_, Make("/s/C", "d", "mango"));
-    Upsert(folders_, Make("/s/d", "v", "banana"));
-  }
-
-  std::vector<std::string> Page(unsigned int offset, unsigned int limit, const std::string& sort_by,
-                                const std::string& direction) {
-    std::vector<FolderPtr> out = {Make("/old", "")};
-    folders_.List(out, total_, offset, limit, sort_by, direction);
-    return Paths(out);
-  }
-
-  FolderMgr folders_;
-  unsigned int total_ = 0;
-};
-
-TEST_F(FolderMgrListTest, SortsByTextWithoutRegardToCase) {
-  EXPECT_THAT(Page(0, 9, "path", "asc"), ElementsAre("/s/a", "/s/B", "/s/C", "/s/d"));
-  EXPECT_THAT(Page(0, 9, "path", "desc"), ElementsAre("/s/d", "/s/C", "/s/B", "/s/a"));
-  for (const char* key : {"name", "", "size", "Path", "Photo"}) {
-    EXPECT_THAT(Page(0, 9, key, "asc"), ElementsAre("/s/a", "/s/d", "/s/C", "/s/B")) << key;
-    EXPECT_THAT(Page(0, 9, key, "desc"), ElementsAre("/s/B", "/s/C", "/s/d", "/s/a")) << key;
-  }
-  EXPECT_EQ(total_, 4U);
-}
-
-TEST_F(FolderMgrListTest, OnlyTheExactWordTurnsTheOrderRound) {
-  for (const char* direction : {"", "asc", "DESC", "desc ", "descending"}) {
-    EXPECT_THAT(Page(0, 1, "path", direction), ElementsAre("/s/a")) << direction;
-  }
-}
-
-TEST_F(FolderMgrListTest, SortsByKindFalseFirst) {
-  const std::vector<std::pair<std::string, char>> rows = {
-      {"document", 'd'}, {"audio", 'a'}, {"video", 'v'}, {"photo", 'p'}};
-  for (const auto& [key, kind] : rows) {
-    for (const char* direction : {"asc", "desc"}) {
-      std::vector<FolderPtr> out;
-      folders_.List(out, total_, 0, 9, key, direction);
-      std::string order;
-      for (const FolderPtr& folder : out) {
-        order += Kinds(folder).find(kind) == std::string::npos ? '0' : '1';
-      }
-      std::string expected = order;
-      std::sort(expected.begin(), expected.end());
-      if (direction == std::string("desc")) std::reverse(expected.begin(), expected.end());
-      EXPECT_EQ(order, expected) << key << " " << direction;
-    }
-  }
-  EXPECT_THAT(Page(0, 1, "photo", "desc"), ElementsAre("/s/a"));
-}
-
-TEST_F(FolderMgrListTest, APageIsCutFromTheSortedList) {
-  EXPECT_THAT(Page(1, 2, "path", ""), ElementsAre("/s/B", "/s/C"));
-  EXPECT_THAT(Page(3, 2, "path", ""), ElementsAre("/s/d"));
-  EXPECT_THAT(Page(1, 2, "path", "desc"), ElementsAre("/s/C", "/s/B"));
-  EXPECT_THAT(Page(0, 0, "path", ""), IsEmpty());
-  EXPECT_THAT(Page(4, 1, "path", ""), IsEmpty());
-  EXPECT_THAT(Page(~0U, ~0U, "path", ""), IsEmpty());
-  EXPECT_THAT(Page(2, ~0U, "path", ""), ElementsAre("/s/C", "/s/d"));
-  EXPECT_EQ(total_, 4U);
-}
-
-TEST_F(FolderMgrListTest, TheListItselfKeepsItsOrder) {
-  Page(0, 9, "path", "desc");
-  EXPECT_THAT(Paths(folders_.GetFolders()), ElementsAre("/s/B", "/s/a", "/s/C", "/s/d"));
-}
-
-TEST_F(FolderMgrListTest, AnEmptyListHasEmptyPages) {
-  std::vector<FolderPtr> out = {Make("/old", "")};
-  FolderMgr().List(out, total_, 0, 5, "name", "asc");
-  EXPECT_THAT(out, IsEmpty());
-  EXPECT_EQ(total_, 0U);
-}
-
-TEST_F(FolderMgrListTest, ManyEqualKeysAreSortedWithoutLoss) {
-  FolderMgr folders;
-  for (int i = 0; i < 500; ++i) {
-    Upsert(folders, Make("/s/" + std::to_string(i), i % 2 == 0 ? "d" : "", "same"));
-  }
-  std::vector<FolderPtr> out;
-  for (const char* key : {"name", "document", "audio"}) {
-    folders.List(out, total_, 0, 1000, key, "desc");
-    std::vector<std::string> listed = Paths(out);
-    std::vector<std::string> all = Paths(folders.GetFolders());
-    std::sort(listed.begin(), listed.end());
-    std::sort(all.begin(), all.end());
-    EXPECT_EQ(listed, all);
-  }
 }
 
 }  // namespace

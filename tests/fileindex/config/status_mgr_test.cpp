@@ -63,7 +63,9 @@ TEST_F(StatusMgrTest, NullIsAnObjectWithoutMembers) {
   EXPECT_EQ(status.GetPauseInfo(), -1);
   EXPECT_EQ(status.GetShareStatus("a"), 0);
   status.Save();
-  EXPECT_EQ(Stored(), "{}");
+  EXPECT_EQ(Stored(), "null");
+  status.SetShareStatus("a", 1);
+  EXPECT_EQ(Stored(), R"({"share":{"a":1}})");
 }
 
 TEST_F(StatusMgrTest, AFileThatIsNotJsonIsRefused) {
@@ -228,7 +230,11 @@ TEST_F(StatusMgrTest, TakingAwayFromAShareWithoutBitsStoresNone) {
 
 TEST_F(StatusMgrTest, ForgettingAnUnknownShareIsNoError) {
   StatusMgr().ClearShareStatus("a");
-  EXPECT_EQ(Stored(), "{}");
+  EXPECT_EQ(Stored(), R"({"share":null})");
+  EXPECT_EQ(StatusMgr().GetShareStatus("a"), 0);
+  StatusMgr().SetShareStatus("b", 2);
+  StatusMgr().ClearShareStatus("a");
+  EXPECT_EQ(Stored(), R"({"share":{"b":2}})");
   Store(R"({"resume_time":7,"share":null})");
   StatusMgr().ClearShareStatus("a");
   EXPECT_EQ(Stored(), R"({"resume_time":7,"share":null})");
