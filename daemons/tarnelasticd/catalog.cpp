@@ -68,13 +68,20 @@ void Catalog::Create(const IndexRecord& record) {
   }
 }
 
+// What is sound stays, with these mappings; what is missing or damaged is made anew, empty.
+void Catalog::MakeUsable(Index* index, const Schema& schema) {
+  const bool exists = HasDatabase(index->directory());
+  if (exists) index->Open();
+  if (!exists || index->IsDamaged()) index->Recreate(schema);
+  if (Index::Access(index).schema()->mappings() != schema.mappings()) index->Remap(schema);
+}
+
 // The database first: a list that names an index without one would call it damaged after a crash.
 // One that is there already is what such a crash has left, and is taken over.
 void Catalog::CreateNew(const IndexRecord& record) {
   const Schema schema(record.mappings);
   std::shared_ptr<Index> index = MakeIndex(record);
-  if (!HasDatabase(record.path) || !index->Open()) index->Recreate(schema);
-  if (Index::Access(index.get()).schema()->mappings() != schema.mappings()) index->Remap(schema);
+  MakeUsable(index.get(), schema);
   registry_.Put(record);
   const std::unique_lock<std::shared_mutex> lock(map_mutex_);
   indexes_[record.id] = std::move(index);
@@ -85,13 +92,7 @@ void Catalog::Refresh(const IndexRecord& old, IndexRecord record) {
   record.paused = old.paused;
   record.moving_from = old.moving_from;
   if (record.path != old.path) Move(old, record);
-  const std::shared_ptr<Index> index = Find(record.id);
-  index->Open();
-  if (!index->IsSound()) {
-    index->Recreate(schema);
-  } else if (Index::Access(index.get()).schema()->mappings() != schema.mappings()) {
-    index->Remap(schema);
-  }
+  MakeUsable(Find(record.id).get(), schema);
   record.moving_from.clear();
   registry_.Put(record);
 }
@@ -112,6 +113,7 @@ void Catalog::SetPaused(const std::string& id, bool paused) {
   const std::lock_guard<std::mutex> lock(change_mutex_);
   const std::shared_ptr<Index> index = Find(id);
   IndexRecord record = *registry_.Find(id);
+  // Writes stop before the list says so, and begin after it.
   if (paused) index->Pause();
   if (record.paused != paused) {
     record.paused = paused;

@@ -51,6 +51,7 @@ class Catalog {
   std::shared_ptr<Index> FindOrNull(const std::string& id) const;
   void FinishMove(IndexRecord record);
   std::shared_ptr<Index> MakeIndex(const IndexRecord& record) const;
+  static void MakeUsable(Index* index, const Schema& schema);
   void CreateNew(const IndexRecord& record);
   void Refresh(const IndexRecord& old, IndexRecord record);
   void Move(const IndexRecord& old, IndexRecord record);

@@ -22,7 +22,8 @@ struct FreeContext {
 // Setting up a context costs more than compressing a short text, so each thread keeps its own.
 template <typename Context, Context* (*create)()>
 Context* ThreadContext() {
-  thread_local std::unique_ptr<Context, FreeContext> context(create());
+  thread_local std::unique_ptr<Context, FreeContext> context;
+  if (!context) context.reset(create());
   if (!context) throw Error(kErrorEngineBusyMemory, "Out of memory");
   return context.get();
 }

@@ -18,31 +18,28 @@ bool IsDiskFull(sqlite3* db, int result) {
   return (result & 0xff) == SQLITE_IOERR && (system_error == ENOSPC || system_error == EDQUOT);
 }
 
+bool IsMissing(sqlite3* db, int result) {
+  if ((result & 0xff) != SQLITE_CANTOPEN || db == nullptr) return false;
+  const int system_error = sqlite3_system_errno(db);
+  return system_error == ENOENT || system_error == ENOTDIR;
+}
+
+// Damage makes people lose their index, so only what is wrong with the file itself counts as such:
+// a want of descriptors or of memory passes.
 int CodeOf(sqlite3* db, int result) {
   if (IsDiskFull(db, result)) return kDiskFull;
+  if (IsMissing(db, result)) return kDamagedIndex;
   if (result == SQLITE_IOERR_NOMEM) return kErrorEngineBusyMemory;
   switch (result & 0xff) {
     case SQLITE_NOMEM:
       return kErrorEngineBusyMemory;
     case SQLITE_CORRUPT:
     case SQLITE_NOTADB:
-    case SQLITE_CANTOPEN:
       return kDamagedIndex;
     case SQLITE_INTERRUPT:
       return kSearchTooLong;
     default:
       return kStorageFailed;
-  }
-}
-
-int OpenFlags(Database::Mode mode) {
-  switch (mode) {
-    case Database::Mode::kReadOnly:
-      return SQLITE_OPEN_READONLY | SQLITE_OPEN_NOMUTEX;
-    case Database::Mode::kReadWrite:
-      return SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX;
-    default:
-      return SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE | SQLITE_OPEN_NOMUTEX;
   }
 }
 
@@ -147,20 +144,28 @@ void Statement::Reset() {
 }
 
 std::string_view Statement::Text(int column) const {
-  const auto* text = reinterpret_cast<const char*>(sqlite3_column_text(stmt_, column));
-  if (text == nullptr) return {};
-  return {text, static_cast<std::size_t>(sqlite3_column_bytes(stmt_, column))};
+  return View(reinterpret_cast<const char*>(sqlite3_column_text(stmt_, column)), column);
 }
 
 std::string_view Statement::Blob(int column) const {
-  const auto* bytes = static_cast<const char*>(sqlite3_column_blob(stmt_, column));
-  if (bytes == nullptr) return {};
-  return {bytes, static_cast<std::size_t>(sqlite3_column_bytes(stmt_, column))};
+  return View(static_cast<const char*>(sqlite3_column_blob(stmt_, column)), column);
 }
 
-Database::Database(const std::string& path, Mode mode) {
+// SQLite gives null for NULL, for what is empty, and also when it has no memory for a copy: what
+// could not be read must not be taken for nothing, and written back so.
+std::string_view Statement::View(const char* bytes, int column) const {
+  if (bytes != nullptr) {
+    return {bytes, static_cast<std::size_t>(sqlite3_column_bytes(stmt_, column))};
+  }
+  const int result = sqlite3_errcode(db_);
+  if ((result & 0xff) == SQLITE_NOMEM) ThrowSqlite(db_, result, "A value cannot be read");
+  return {};
+}
+
+Database::Database(const std::string& path) {
   sqlite3* db = nullptr;
-  const int result = sqlite3_open_v2(path.c_str(), &db, OpenFlags(mode), nullptr);
+  constexpr int kFlags = SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX;
+  const int result = sqlite3_open_v2(path.c_str(), &db, kFlags, nullptr);
   db_.reset(db);
   if (result != SQLITE_OK) ThrowSqlite(db, result, "Cannot open " + path);
   sqlite3_extended_result_codes(db, 1);

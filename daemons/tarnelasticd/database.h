@@ -52,6 +52,7 @@ class Statement {
 
  private:
   void Check(int result);
+  std::string_view View(const char* bytes, int column) const;
 
   sqlite3* db_;
   sqlite3_stmt* stmt_ = nullptr;
@@ -59,12 +60,12 @@ class Statement {
 };
 
 // One connection. One thread at a time. Failures are thrown as Error: kDamagedIndex for a file that
-// is missing or no sound database, kDiskFull, kErrorEngineBusyMemory without memory, kSearchTooLong
-// when interrupted, else kStorageFailed.
+// is missing or is no sound database, kDiskFull, kErrorEngineBusyMemory without memory,
+// kSearchTooLong when interrupted, else kStorageFailed.
 class Database {
  public:
-  enum class Mode { kReadOnly, kReadWrite, kCreate };
-  Database(const std::string& path, Mode mode);
+  // Opens a file that exists, for reading and writing; an empty one is an empty database.
+  explicit Database(const std::string& path);
   ~Database();
   Database(const Database&) = delete;
   Database& operator=(const Database&) = delete;

@@ -14,6 +14,7 @@
 #include "daemons/tarnelasticd/index_files.h"
 #include "daemons/tarnelasticd/request.h"
 #include "daemons/tarnelasticd/search.h"
+#include "daemons/tarnelasticd/search_session.h"
 #include "daemons/tarnelasticd/selection.h"
 
 namespace quarry::engine {
@@ -77,38 +78,9 @@ auto NotingDamage(Index* index, Action action) {
   try {
     return action();
   } catch (const Error& error) {
-    if (error.code() == ErrorCode{kDamagedIndex}) index->NoteDamage(error);
+    index->NoteDamage(error);
     throw;
   }
-}
-
-// An index and its reader for one search.
-class OpenIndex {
- public:
-  OpenIndex(std::shared_ptr<Index> index, std::chrono::steady_clock::time_point deadline)
-      : index_(std::move(index)),
-        access_(index_.get(), /*wait=*/false),
-        reader_(access_.TakeReader()) {
-    reader_->Begin(deadline);
-  }
-  SearchedIndex Searched(const std::string& id) const { return {id, access_.schema(), &*reader_}; }
-
- private:
-  std::shared_ptr<Index> index_;
-  Index::Access access_;
-  ReaderPool::Lease reader_;
-};
-
-bool IsOutOfUse(const Error& error) {
-  return error.code() == ErrorCode{kDamagedIndex} || error.code() == ErrorCode{kMovingIndex};
-}
-
-Json::Value SkippedJson(const std::string& id, int code, const std::string& message) {
-  Json::Value json;
-  json["id"] = id;
-  json["code"] = code;
-  json["msg"] = message;
-  return json;
 }
 
 }  // namespace
@@ -116,7 +88,7 @@ Json::Value SkippedJson(const std::string& id, int code, const std::string& mess
 Engine::Engine(const EngineOptions& options)
     : options_(options),
       life_(RandomId()),
-      memory_(options.memory_bytes),
+      memory_(options.memory_bytes, options.memory_wait),
       catalog_(options.registry_path, options.writer, [this] { ++losses_; }) {}
 
 Engine::~Engine() {
@@ -144,11 +116,14 @@ const std::map<std::string, Engine::Command>& Engine::Commands() {
 }
 
 std::string Engine::HandleText(const std::string& text) {
-  Json::Value request;
-  if (!fromString(request, text)) {
+  try {
+    Json::Value request;
+    if (fromString(request, text)) return toString(Handle(request));
     return toString(Failure(kMalformedRequest, "The request is no JSON"));
+  } catch (const std::bad_alloc&) {
+    // Which command it was is not known, and some must never be answered as busy.
+    return toString(Failure(kOutOfMemory, "Out of memory"));
   }
-  return toString(Handle(request));
 }
 
 Json::Value Engine::Handle(const Json::Value& request) {
@@ -312,47 +287,26 @@ Json::Value Engine::UpdateTermSuggestion(const Json::Value& data) {
   return {};
 }
 
-std::map<std::string, std::shared_ptr<Index>> Engine::SearchedIndexes(const Json::Value& data,
-                                                                      Json::Value* skipped) const {
-  if (!data.isMember("ids")) return catalog_.All();
-  if (!data["ids"].isArray()) FailMalformed("Not an array: ids");
-  std::map<std::string, std::shared_ptr<Index>> indexes;
-  for (const Json::Value& id : data["ids"]) {
-    if (!id.isString()) FailMalformed("Not a string: ids");
+void Engine::AddIndexes(const Json::Value& data, SearchSession* session) const {
+  if (!data.isMember("ids")) {
+    for (const auto& [id, index] : catalog_.All()) session->Add(id, index);
+    return;
+  }
+  for (const std::string& id : NamesProperty(data, "ids")) {
     try {
-      indexes[id.asString()] = catalog_.Find(id.asString());
+      session->Add(id, catalog_.Find(id));
     } catch (const Error& error) {
-      skipped->append(SkippedJson(id.asString(), error.code(), error.reason()));
+      session->Skip(id, error);
     }
   }
-  return indexes;
 }
 
 Json::Value Engine::Search(const Json::Value& data) {
   const SearchRequest request = ParseSearchRequest(data);
   ParseQuery(request.query);
-  const auto deadline = std::chrono::steady_clock::now() + options_.search_time;
-  Json::Value skipped(Json::arrayValue);
-  std::vector<std::unique_ptr<OpenIndex>> open;
-  std::vector<SearchedIndex> searched;
-  for (const auto& [id, index] : SearchedIndexes(data, &skipped)) {
-    try {
-      NotingDamage(index.get(), [&] {
-        open.push_back(std::make_unique<OpenIndex>(index, deadline));
-        searched.push_back(open.back()->Searched(id));
-      });
-    } catch (const Error& error) {
-      if (!IsOutOfUse(error)) throw;
-      skipped.append(SkippedJson(id, error.code(), error.reason()));
-    }
-  }
-  // One index that is gone must not hide what the others hold; but all gone is a failure.
-  if (searched.empty() && !skipped.empty()) {
-    throw Error(skipped[0]["code"].asInt(), skipped[0]["msg"].asString());
-  }
-  Json::Value found = engine::Search(request, searched);
-  if (!skipped.empty()) found["skipped"] = std::move(skipped);
-  return found;
+  SearchSession session(std::chrono::steady_clock::now() + options_.search_time);
+  AddIndexes(data, &session);
+  return session.Run(request);
 }
 
 Json::Value Engine::Status(const Json::Value& /*data*/) {
@@ -364,8 +318,7 @@ Json::Value Engine::Status(const Json::Value& /*data*/) {
     entry["id"] = id;
     entry["documents"] = Json::Int64{index->documents()};
     entry["paused"] = index->paused();
-    const std::string problem = index->Problem();
-    if (!problem.empty()) entry["problem"] = problem;
+    if (const auto problem = index->Problem()) entry["problem"] = problem->reason();
     status["indexes"].append(std::move(entry));
   }
   return status;
@@ -385,7 +338,7 @@ void Engine::CommitAll() {
     try {
       index->Commit();
     } catch (const Error& error) {
-      if (index->Problem().empty()) daemon::LogError("Commit failed: " + error.reason());
+      if (!index->Problem()) daemon::LogError("Commit failed: " + error.reason());
     }
   }
 }

@@ -17,6 +17,8 @@
 
 namespace quarry::engine {
 
+class SearchSession;
+
 struct EngineOptions {
   // The list of indexes.
   std::string registry_path;
@@ -25,6 +27,8 @@ struct EngineOptions {
   std::chrono::steady_clock::duration search_time = std::chrono::seconds(30);
   // What the documents in requests at work may take in memory together.
   std::size_t memory_bytes = std::size_t{512} << 20;
+  // How long a request waits for others to free memory before it is answered as busy.
+  std::chrono::steady_clock::duration memory_wait = std::chrono::seconds(30);
 };
 
 // Knows nothing of sockets. Any thread; requests that change one index wait for each other,
@@ -76,8 +80,7 @@ class Engine {
   Json::Value Status(const Json::Value& data);
 
   std::string Epoch() const;
-  std::map<std::string, std::shared_ptr<Index>> SearchedIndexes(const Json::Value& data,
-                                                                Json::Value* skipped) const;
+  void AddIndexes(const Json::Value& data, SearchSession* session) const;
 
   const EngineOptions options_;
   const std::string life_;

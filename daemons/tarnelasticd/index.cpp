@@ -1,5 +1,6 @@
 #include "daemons/tarnelasticd/index.h"
 
+#include <new>
 #include <utility>
 
 #include "daemons/common/log.h"
@@ -17,12 +18,22 @@ Index::Index(std::string directory, bool paused, WriterLimits limits, std::funct
 
 Index::Access::Access(Index* index, bool wait)
     : index_(index), lock_(index->gate_, std::defer_lock) {
+  Lock(wait);
+  if (index_->store_) return;
+  if (index_->ProblemOr(kStorageFailed).code() != ErrorCode{kDamagedIndex}) {
+    lock_.unlock();
+    index_->Open();
+    Lock(wait);
+  }
+  if (!index_->store_) throw index_->ProblemOr(kDamagedIndex);
+}
+
+void Index::Access::Lock(bool wait) {
   if (wait) {
     lock_.lock();
   } else if (!lock_.try_lock()) {
     throw Error(kMovingIndex, "The index is being moved");
   }
-  if (!index_->store_) throw Error(kDamagedIndex, index_->Problem());
 }
 
 const std::shared_ptr<const Schema>& Index::Access::schema() const {
@@ -43,46 +54,54 @@ struct Index::Reopen {
   ~Reopen() { index->OpenLocked(); }
 };
 
-bool Index::OpenLocked() {
-  if (store_) return true;
+void Index::OpenLocked() {
+  if (store_) return;
   try {
     auto store = std::make_unique<Store>();
     store->schema = LoadSchema(directory_);
     store->writer = std::make_unique<IndexWriter>(DatabasePath(directory_), store->schema, limits_);
     store->readers = std::make_unique<ReaderPool>(DatabasePath(directory_));
     store_ = std::move(store);
-    const std::lock_guard<std::mutex> lock(problem_mutex_);
-    problem_.clear();
-    return true;
+    SetProblem(std::nullopt);
   } catch (const Error& error) {
-    NoteDamage(error);
-    return false;
+    SetProblem(error);
+  } catch (const std::bad_alloc&) {
+    SetProblem(Error(kErrorEngineBusyMemory, "Out of memory"));
   }
 }
 
-bool Index::Open() {
+void Index::Open() {
   const std::unique_lock<std::shared_mutex> lock(gate_);
-  return OpenLocked();
+  OpenLocked();
 }
 
-bool Index::IsSound() {
-  if (!Problem().empty()) return false;
+bool Index::IsDamaged() {
+  const std::optional<Error> problem = Problem();
+  if (problem) return problem->code() == ErrorCode{kDamagedIndex};
   const std::shared_lock<std::shared_mutex> lock(gate_);
   if (!store_) return false;
   const std::lock_guard<std::mutex> writer_lock(writer_mutex_);
-  return store_->writer->IsInPlace();
+  return !store_->writer->IsInPlace();
 }
 
 void Index::NoteDamage(const Error& error) {
-  const std::lock_guard<std::mutex> lock(problem_mutex_);
-  if (problem_ == error.reason()) return;
-  problem_ = error.reason();
-  daemon::LogError("An index cannot be used: " + problem_);
+  if (error.code() == ErrorCode{kDamagedIndex}) SetProblem(error);
 }
 
-std::string Index::Problem() {
+void Index::SetProblem(std::optional<Error> problem) {
+  const std::lock_guard<std::mutex> lock(problem_mutex_);
+  const bool is_news = problem && (!problem_ || problem_->reason() != problem->reason());
+  problem_ = std::move(problem);
+  if (is_news) daemon::LogError("An index cannot be used: " + problem_->reason());
+}
+
+std::optional<Error> Index::Problem() {
   const std::lock_guard<std::mutex> lock(problem_mutex_);
   return problem_;
+}
+
+Error Index::ProblemOr(int code) {
+  return Problem().value_or(Error(code, "The index has not been opened"));
 }
 
 std::string Index::directory() {
@@ -122,10 +141,16 @@ void Index::CopyDocuments(const Schema& schema, const std::string& database_path
 
 void Index::Remap(const Schema& schema) {
   const std::unique_lock<std::shared_mutex> lock(gate_);
-  if (!store_) throw Error(kDamagedIndex, Problem());
+  if (!store_) throw ProblemOr(kDamagedIndex);
   const Reopen reopen{this};
   store_->writer->Commit();
-  CopyDocuments(schema, CreateSpareDatabase(directory_, schema));
+  try {
+    CopyDocuments(schema, CreateSpareDatabase(directory_, schema));
+  } catch (...) {
+    // A full disk must not stay full of what could not be finished.
+    RemoveSpareDatabase(directory_);
+    throw;
+  }
   store_.reset();
   PlaceSpareDatabase(directory_);
 }
@@ -135,7 +160,7 @@ void Index::Remove() {
   store_.reset();
   {
     const std::lock_guard<std::mutex> problem_lock(problem_mutex_);
-    problem_ = "The index has been deleted";
+    problem_ = Error(kDamagedIndex, "The index has been deleted");
   }
   RemoveDatabase(directory_);
 }
@@ -186,12 +211,18 @@ void Index::CommitIfOld() {
     store_->writer->CommitIfOld();
   } catch (const Error& error) {
     daemon::LogError("An index lost uncommitted work: " + error.reason());
+    NoteDamage(error);
   }
   CheckLost();
 }
 
 void Index::Pause() {
-  Access(this).UseWriter([this](IndexWriter& writer) {
+  const std::shared_lock<std::shared_mutex> lock(gate_);
+  if (!store_) {
+    paused_ = true;
+    return;
+  }
+  UseWriter(/*paused_too=*/true, [this](IndexWriter& writer) {
     writer.Commit();
     paused_ = true;
   });

@@ -32,8 +32,10 @@ class Index {
   // Keeps the database open as long as it lives: replacing or moving it waits.
   class Access {
    public:
-    // Throws Error kDamagedIndex, saying why, when there is no sound database. One that is being
-    // replaced or moved is waited for, or, without `wait`, Error kMovingIndex.
+    // Throws the Error that keeps the database from being open: kDamagedIndex when it is not
+    // sound. What may have passed since the last try, as a want of memory, is tried again. A
+    // database that is being replaced or moved is waited for, or, without `wait`, Error
+    // kMovingIndex.
     explicit Access(Index* index, bool wait = true);
 
     const std::shared_ptr<const Schema>& schema() const;
@@ -52,16 +54,19 @@ class Index {
     }
 
    private:
+    void Lock(bool wait);
+
     Index* index_;
     std::shared_lock<std::shared_mutex> lock_;
   };
 
-  // Opens the database. Returns whether it is sound; if it is not, says why in the log, and every
-  // Access does. Opening what is open already does nothing.
-  bool Open();
-  // Whether the database is open, nothing was found wrong with it and its file is in its place.
-  bool IsSound();
-  // Remembers that the database turned out to be damaged. Logs it.
+  // Opens the database. Where that fails the log says why, and every Access. Opening what is open
+  // already does nothing.
+  void Open();
+  // Whether the database is unsound or missing, as far as is known; the other reasons for which it
+  // may not be open can pass.
+  bool IsDamaged();
+  // Remembers that the database turned out to be damaged. Logs it. Other errors are ignored.
   void NoteDamage(const Error& error);
 
   // Replaces the database, sound or not, by an empty one.
@@ -84,15 +89,16 @@ class Index {
   void Commit();
   // Commits what has been open for too long. Does not wait for a writer that is at work.
   void CommitIfOld();
-  // Commits, then refuses writes until Resume().
+  // Commits, then refuses writes until Resume(). Where no database is open there is nothing to
+  // commit.
   void Pause();
   void Resume() { paused_ = false; }
 
   bool paused() const { return paused_; }
   // Documents, uncommitted ones included; 0 while there is no sound database.
   std::int64_t documents();
-  // Why there is no sound database, or "".
-  std::string Problem();
+  // Why the database cannot be used, or nothing.
+  std::optional<Error> Problem();
   std::string directory();
 
  private:
@@ -108,7 +114,10 @@ class Index {
   auto UseWriter(bool paused_too, Action action);
   void CheckLost();
   void CloseCommitted();
-  bool OpenLocked();
+  void OpenLocked();
+  void SetProblem(std::optional<Error> problem);
+  // The problem, or one of that code where the database has not been opened yet.
+  Error ProblemOr(int code);
   void CopyDocuments(const Schema& schema, const std::string& database_path);
 
   const WriterLimits limits_;
@@ -122,7 +131,7 @@ class Index {
   std::string directory_;         // guarded by gate_
   std::unique_ptr<Store> store_;  // guarded by gate_; its writer by writer_mutex_
   std::mutex problem_mutex_;
-  std::string problem_;  // guarded by problem_mutex_
+  std::optional<Error> problem_;  // guarded by problem_mutex_
 };
 
 template <typename Action>

@@ -63,6 +63,12 @@ void RenameFile(const std::string& from, const std::string& to) {
   if (rename(from.c_str(), to.c_str()) != 0) FailSystem("Cannot rename " + from);
 }
 
+// The database's other files get the same mode from SQLite.
+void MakePrivateFile(const std::string& path) {
+  const UniqueFd fd(open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600));
+  if (!fd.valid()) FailSystem("Cannot make " + path);
+}
+
 void WriteAll(int fd, const char* bytes, std::size_t size) {
   while (size > 0) {
     const ssize_t written = write(fd, bytes, size);
@@ -97,6 +103,17 @@ void CopyFile(const std::string& from, const std::string& to) {
   if (fsync(target.get()) != 0) FailSystem("Cannot sync " + to);
 }
 
+// To another file system, where a rename cannot go.
+void CopyDatabase(const std::string& from, const std::string& to) {
+  try {
+    CopyFile(DatabasePath(from), SparePath(to));
+    RenameFile(SparePath(to), DatabasePath(to));
+  } catch (const Error&) {
+    RemoveSpareDatabase(to);
+    throw;
+  }
+}
+
 bool HasLog(const std::string& database) {
   struct stat info {};
   return lstat((database + "-wal").c_str(), &info) == 0 && info.st_size > 0;
@@ -105,7 +122,7 @@ bool HasLog(const std::string& database) {
 // Brings what a database's log holds into the database itself, so that this file is all there is.
 void FoldLog(const std::string& database) {
   if (!HasLog(database)) return;
-  Database(database, Database::Mode::kReadWrite).Execute("PRAGMA wal_checkpoint(TRUNCATE)");
+  Database(database).Execute("PRAGMA wal_checkpoint(TRUNCATE)");
   if (HasLog(database)) throw Error(kStorageFailed, "Cannot write back the log of " + database);
 }
 
@@ -129,13 +146,17 @@ std::string ReadMeta(Database* db, const char* key) {
   return std::string(row.Text(0));
 }
 
-std::shared_ptr<const Schema> ReadSchema(const std::string& path) {
-  Database db(path, Database::Mode::kReadWrite);
-  if (ReadMeta(&db, "layout") != std::to_string(kLayoutVersion)) {
+bool HasMeta(Database* db) {
+  Statement row = db->Prepare("SELECT 1 FROM sqlite_master WHERE name='meta' AND type='table'");
+  return row.Step();
+}
+
+std::shared_ptr<const Schema> ReadSchema(Database* db) {
+  if (ReadMeta(db, "layout") != std::to_string(kLayoutVersion)) {
     throw Error(kDamagedIndex, "The index's database is of another version");
   }
   Json::Value mappings;
-  if (!fromString(mappings, ReadMeta(&db, "mappings"))) {
+  if (!fromString(mappings, ReadMeta(db, "mappings"))) {
     throw Error(kDamagedIndex, "The index's mappings cannot be read");
   }
   return std::make_shared<const Schema>(mappings);
@@ -172,7 +193,8 @@ std::string CreateSpareDatabase(const std::string& directory, const Schema& sche
   MakeDirectory(directory);
   const std::string path = SparePath(directory);
   RemoveFiles(path);
-  Database db(path, Database::Mode::kCreate);
+  MakePrivateFile(path);
+  Database db(path);
   FillDatabase(&db, schema);
   return path;
 }
@@ -196,10 +218,12 @@ std::shared_ptr<const Schema> LoadSchema(const std::string& directory) {
   if (!HasDatabase(directory)) {
     throw Error(kDamagedIndex, "The index's database is missing: " + DatabasePath(directory));
   }
+  Database db(DatabasePath(directory));
+  if (!HasMeta(&db)) throw Error(kDamagedIndex, "The database is not one of this engine");
   try {
-    return ReadSchema(DatabasePath(directory));
+    return ReadSchema(&db);
   } catch (const Error& error) {
-    // Whatever is wrong with what was read, the file is not what this engine has written.
+    // Whatever is wrong with what can be read, the file is not what this engine has written.
     if (error.code() == ErrorCode{kBadMappings} || error.code() == ErrorCode{kStorageFailed}) {
       throw Error(kDamagedIndex, error.reason());
     }
@@ -213,6 +237,14 @@ void RemoveDatabase(const std::string& directory) {
   rmdir(directory.c_str());
 }
 
+void RemoveSpareDatabase(const std::string& directory) noexcept {
+  try {
+    RemoveFiles(SparePath(directory));
+  } catch (const Error&) {
+    // Whoever makes the next one tries again.
+  }
+}
+
 void MoveDatabase(const std::string& from, const std::string& to) {
   if (!HasDatabase(to)) {
     FoldLog(DatabasePath(from));
@@ -220,8 +252,7 @@ void MoveDatabase(const std::string& from, const std::string& to) {
     RemoveFiles(SparePath(to));
     if (rename(DatabasePath(from).c_str(), DatabasePath(to).c_str()) != 0) {
       if (errno != EXDEV) FailSystem("Cannot move " + DatabasePath(from));
-      CopyFile(DatabasePath(from), SparePath(to));
-      RenameFile(SparePath(to), DatabasePath(to));
+      CopyDatabase(from, to);
     }
     SyncDirectory(to);
   }

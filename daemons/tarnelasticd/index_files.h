@@ -28,6 +28,8 @@ void CreateDatabase(const std::string& directory, const Schema& schema);
 // The same under a name of its own, to be put in place with PlaceDatabase when it has been filled.
 // Returns its path.
 std::string CreateSpareDatabase(const std::string& directory, const Schema& schema);
+// Removes what there is of one. Never throws: it is called when something has failed already.
+void RemoveSpareDatabase(const std::string& directory) noexcept;
 // Puts it in the place of the one that was there. No connection may be open on either.
 void PlaceSpareDatabase(const std::string& directory);
 

@@ -2,6 +2,8 @@
 
 #include <utility>
 
+#include "daemons/tarnelasticd/engine_error.h"
+
 namespace quarry::engine {
 namespace {
 
@@ -12,19 +14,27 @@ constexpr int kProgressSteps = 20000;
 
 // Opened for writing although it never writes: a reader must be able to tend the log's index.
 IndexReader::IndexReader(const std::string& database_path)
-    : db_(database_path, Database::Mode::kReadWrite), tokenizer_(db_.handle()) {
+    : db_(database_path), tokenizer_(db_.handle()) {
   db_.Execute("PRAGMA query_only=ON;PRAGMA cache_size=-8192;");
   RegisterRanking(db_.handle(), &rank_context_);
   sqlite3_progress_handler(db_.handle(), kProgressSteps, &OnProgress, this);
 }
 
 int IndexReader::OnProgress(void* self) {
-  return std::chrono::steady_clock::now() > static_cast<IndexReader*>(self)->deadline_ ? 1 : 0;
+  return static_cast<const IndexReader*>(self)->IsLate() ? 1 : 0;
+}
+
+bool IndexReader::IsLate() const {
+  return std::chrono::steady_clock::now() > deadline_;
 }
 
 void IndexReader::Begin(std::chrono::steady_clock::time_point deadline) {
   deadline_ = deadline;
   db_.Execute("BEGIN");
+}
+
+void IndexReader::CheckDeadline() const {
+  if (IsLate()) throw Error(kSearchTooLong, "The search took too long");
 }
 
 void IndexReader::End() noexcept {

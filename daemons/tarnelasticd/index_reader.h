@@ -26,6 +26,8 @@ class IndexReader {
   // deadline fails with Error kSearchTooLong.
   void Begin(std::chrono::steady_clock::time_point deadline);
   void End() noexcept;
+  // Throws that error when the deadline is over: for work between statements.
+  void CheckDeadline() const;
 
   Database& db() { return db_; }
   const TextTokenizer& tokenizer() const { return tokenizer_; }
@@ -34,6 +36,7 @@ class IndexReader {
 
  private:
   static int OnProgress(void* self);
+  bool IsLate() const;
 
   Database db_;
   TextTokenizer tokenizer_;

@@ -89,7 +89,7 @@ IndexWriter::IndexWriter(const std::string& database_path, std::shared_ptr<const
                          const WriterLimits& limits)
     : schema_(std::move(schema)),
       limits_(limits),
-      db_(database_path, Database::Mode::kReadWrite),
+      db_(database_path),
       tokenizer_(db_.handle()),
       insert_sql_(InsertSql(*schema_)),
       update_sql_(UpdateSql(*schema_)),
@@ -116,7 +116,7 @@ auto IndexWriter::Change(Action action) {
   try {
     Begin();
     auto result = action();
-    FlushIfLarge();
+    KeepWithinLimits();
     return result;
   } catch (...) {
     Rollback();
@@ -146,11 +146,17 @@ void IndexWriter::Rollback() noexcept {
   }
 }
 
-void IndexWriter::FlushIfLarge() {
-  if (buffer_.bytes() < limits_.flush_bytes) return;
-  transaction_bytes_ += buffer_.bytes();
-  buffer_.Flush(*schema_, &db_, tokenizer_);
-  if (transaction_bytes_ >= limits_.commit_bytes) CommitNow();
+// Checked with each change, since a writer that is never idle leaves CommitIfOld() no turn.
+void IndexWriter::KeepWithinLimits() {
+  if (buffer_.bytes() >= limits_.flush_bytes) {
+    transaction_bytes_ += buffer_.bytes();
+    buffer_.Flush(*schema_, &db_, tokenizer_);
+  }
+  if (transaction_bytes_ >= limits_.commit_bytes || IsOld()) CommitNow();
+}
+
+bool IndexWriter::IsOld() const {
+  return std::chrono::steady_clock::now() - transaction_start_ >= limits_.commit_age;
 }
 
 void IndexWriter::CommitNow() {
@@ -177,8 +183,7 @@ void IndexWriter::Commit() {
 }
 
 void IndexWriter::CommitIfOld() {
-  if (!uncommitted_) return;
-  if (std::chrono::steady_clock::now() - transaction_start_ >= limits_.commit_age) Commit();
+  if (uncommitted_ && IsOld()) Commit();
 }
 
 bool IndexWriter::TakeLost() {
@@ -209,6 +214,11 @@ std::optional<std::string> IndexWriter::ReadPacked(std::int64_t id) {
   row.Bind(1, id);
   if (!row.Step()) return std::nullopt;
   return std::string(row.Blob(0));
+}
+
+std::string IndexWriter::ReadBody(std::int64_t id) {
+  const std::optional<std::string> packed = ReadPacked(id);
+  return packed ? Decompress(*packed) : std::string();
 }
 
 void IndexWriter::WriteRow(const std::string& sql, std::int64_t id,
@@ -302,10 +312,7 @@ bool IndexWriter::SetLocked(std::string_view path, const Json::Value& changes) {
     document = ReadRow(*schema_, row, nullptr);
   }
   const bool touches_text = TouchesText(*schema_, changes);
-  if (touches_text) {
-    const std::optional<std::string> packed = ReadPacked(found.id);
-    if (packed) AddTexts(*schema_, Decompress(*packed), nullptr, &document);
-  }
+  if (touches_text) AddTexts(*schema_, ReadBody(found.id), nullptr, &document);
   ApplyChanges(changes, &document);
   const std::string new_path = document[schema_->path_field()].asString();
   if (new_path != path) {
@@ -354,14 +361,19 @@ Json::Value IndexWriter::Find(const Selection& selection) {
   const bool wants_text = WantsText(*schema_, selection);
   const std::set<std::string>* only = selection.load_fields ? &*selection.load_fields : nullptr;
   Json::Value found(Json::arrayValue);
+  std::size_t text_bytes = 0;
   const std::int64_t limit = std::min(selection.limit.value_or(kMaxFound + 1), kMaxFound + 1);
   Statement rows = SelectRows(*schema_, selection, RowColumns(*schema_), limit, &db_);
   while (rows.Step()) {
     if (found.size() >= kMaxFound) FailMalformed("Too many documents: ask with a limit");
     Json::Value document = ReadRow(*schema_, rows, only);
     if (wants_text) {
-      const std::optional<std::string> packed = ReadPacked(rows.Int(0));
-      if (packed) AddTexts(*schema_, Decompress(*packed), only, &document);
+      const std::string body = ReadBody(rows.Int(0));
+      text_bytes += body.size();
+      if (text_bytes > kMaxFoundText && !found.empty()) {
+        FailMalformed("Too much text: ask with a limit");
+      }
+      AddTexts(*schema_, body, only, &document);
     }
     found.append(std::move(document));
   }

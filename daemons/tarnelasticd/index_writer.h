@@ -63,7 +63,7 @@ class IndexWriter {
   // Returns how many documents there were.
   std::int64_t DeleteSelected(const Selection& selection);
   // The selected documents, as an array of objects. Throws kMalformedRequest when these would be
-  // more than kMaxFound.
+  // more than kMaxFound, or more than one with more text than kMaxFoundText together.
   Json::Value Find(const Selection& selection);
 
   // Makes the words to suggest anew with the next commit.
@@ -82,6 +82,7 @@ class IndexWriter {
   bool TakeLost();
 
   static constexpr std::int64_t kMaxFound = 1000000;
+  static constexpr std::size_t kMaxFoundText = std::size_t{64} << 20;
 
  private:
   struct Found {
@@ -96,10 +97,12 @@ class IndexWriter {
   void CommitNow();
   void LoadCounters();
   void RebuildTerms();
-  void FlushIfLarge();
+  void KeepWithinLimits();
+  bool IsOld() const;
 
   std::optional<Found> FindByPath(std::string_view path);
   std::optional<std::string> ReadPacked(std::int64_t id);
+  std::string ReadBody(std::int64_t id);
   void Insert(const PreparedDocument& document);
   void Replace(const Found& old, const PreparedDocument& document);
   void Remove(const Found& old);

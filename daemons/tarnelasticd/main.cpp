@@ -1,6 +1,7 @@
 // tarnelasticd: the search engine's process.
 
 #include <sqlite3.h>
+#include <sys/resource.h>
 
 #include <CLI/CLI.hpp>
 #include <condition_variable>
@@ -86,11 +87,20 @@ void BoundMemory(std::size_t bytes) {
   sqlite3_hard_heap_limit64(static_cast<sqlite3_int64>(bytes));
 }
 
+// Each index keeps a handful of files open, and there is one per share.
+void AllowManyFiles() {
+  struct rlimit limit {};
+  if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
+  limit.rlim_cur = limit.rlim_max;
+  setrlimit(RLIMIT_NOFILE, &limit);
+}
+
 void Serve(const Settings& settings) {
   daemon::StopSignal stop;
   const daemon::SingleInstance instance(kName);
   const std::size_t memory = settings.memory_mib << 20;
   BoundMemory(memory);
+  AllowManyFiles();
   EngineOptions options;
   options.registry_path = RootedPath("/var/lib/quarry/engine/indexes.json");
   options.memory_bytes = memory;

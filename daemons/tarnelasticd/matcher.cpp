@@ -44,21 +44,9 @@ class Finder {
 
   // A name: filter for several parts takes them all: "name:*report*.pdf".
   DocSet ByName(const QueryTerm& term) {
-    DocSet found;
-    bool first = true;
-    std::size_t begin = 0;
-    while (begin <= term.part.size()) {
-      const std::size_t end = std::min(term.part.find('*', begin), term.part.size());
-      const std::string part = term.part.substr(begin, end - begin);
-      begin = end + 1;
-      if (part.empty()) continue;
-      DocSet matching = MatchRows(db_, "names", NameExpression(part));
-      if (first) {
-        found = std::move(matching);
-      } else {
-        found.Intersect(matching);
-      }
-      first = false;
+    DocSet found = MatchRows(db_, "names", NameExpression(term.values.front()));
+    for (std::size_t i = 1; i < term.values.size(); ++i) {
+      found.Intersect(MatchRows(db_, "names", NameExpression(term.values[i])));
     }
     return found;
   }

@@ -7,16 +7,23 @@ namespace quarry::engine {
 
 MemoryBudget::Share::Share(MemoryBudget* budget, std::size_t bytes)
     : budget_(budget), bytes_(bytes) {
-  const std::lock_guard<std::mutex> lock(budget_->mutex_);
-  if (budget_->used_ > 0 && budget_->used_ + bytes_ > budget_->limit_) {
+  std::unique_lock<std::mutex> lock(budget_->mutex_);
+  const auto fits = [this] {
+    return budget_->used_ == 0 || budget_->used_ + bytes_ <= budget_->limit_;
+  };
+  // A busy answer sends the asker away for a quarter of an hour; most documents take milliseconds.
+  if (!budget_->freed_.wait_for(lock, budget_->patience_, fits)) {
     throw Error(kErrorEngineBusy, "Too many documents at once");
   }
   budget_->used_ += bytes_;
 }
 
 MemoryBudget::Share::~Share() {
-  const std::lock_guard<std::mutex> lock(budget_->mutex_);
-  budget_->used_ -= bytes_;
+  {
+    const std::lock_guard<std::mutex> lock(budget_->mutex_);
+    budget_->used_ -= bytes_;
+  }
+  budget_->freed_.notify_all();
 }
 
 std::size_t EstimateMemory(const Json::Value& document) {

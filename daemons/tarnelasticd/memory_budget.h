@@ -5,6 +5,8 @@
 
 #include <json/json.h>
 
+#include <chrono>
+#include <condition_variable>
 #include <cstddef>
 #include <mutex>
 
@@ -13,13 +15,15 @@ namespace quarry::engine {
 // Any thread.
 class MemoryBudget {
  public:
-  explicit MemoryBudget(std::size_t bytes) : limit_(bytes) {}
+  // Who would exceed `bytes` waits up to `patience` for others to end.
+  MemoryBudget(std::size_t bytes, std::chrono::steady_clock::duration patience)
+      : limit_(bytes), patience_(patience) {}
 
   // Takes its share as long as it lives.
   class Share {
    public:
-    // Throws Error kErrorEngineBusy when others hold so much that `bytes` more would be too much.
-    // Who asks while nobody else holds any is never refused: waiting would not help.
+    // Throws Error kErrorEngineBusy when others keep holding so much that `bytes` more would be
+    // too much. Who asks while nobody else holds any is never refused: waiting would not help.
     Share(MemoryBudget* budget, std::size_t bytes);
     ~Share();
     Share(const Share&) = delete;
@@ -32,8 +36,10 @@ class MemoryBudget {
 
  private:
   const std::size_t limit_;
+  const std::chrono::steady_clock::duration patience_;
   std::mutex mutex_;
-  std::size_t used_ = 0;
+  std::condition_variable freed_;
+  std::size_t used_ = 0;  // guarded by mutex_
 };
 
 // Roughly what storing `document` takes: its text is held as it came, packed and compressed.

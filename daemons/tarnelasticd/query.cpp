@@ -26,12 +26,13 @@ std::string LowerAscii(std::string_view text) {
   return lower;
 }
 
-std::vector<std::string> SplitValues(const std::string& text) {
+// What stands between the separators, without what is empty.
+std::vector<std::string> Split(const std::string& text, char separator) {
   std::vector<std::string> values;
   std::size_t begin = 0;
   while (begin <= text.size()) {
-    const std::size_t end = std::min(text.find(',', begin), text.size());
-    if (end > begin) values.push_back(LowerAscii(text.substr(begin, end - begin)));
+    const std::size_t end = std::min(text.find(separator, begin), text.size());
+    if (end > begin) values.push_back(text.substr(begin, end - begin));
     begin = end + 1;
   }
   return values;
@@ -142,7 +143,7 @@ class Parser {
     if (term->kind == QueryTerm::Kind::kInside) {
       CheckInside(term);
     } else if (term->kind != QueryTerm::Kind::kName) {
-      term->values = SplitValues(term->text);
+      term->values = Split(LowerAscii(term->text), ',');
       if (term->values.empty()) FailSyntax("A filter needs a value behind its colon.");
       if (term->kind == QueryTerm::Kind::kType) CheckTypes(*term);
       if (term->kind == QueryTerm::Kind::kExtension) StripDots(term);
@@ -177,6 +178,7 @@ class Parser {
 
 bool IsSearchable(const QueryTerm& term) {
   if (term.kind != QueryTerm::Kind::kWords && term.kind != QueryTerm::Kind::kName) return true;
+  if (term.kind == QueryTerm::Kind::kName && term.values.empty()) return false;
   return !term.words.empty() || CountCharacters(term.part) >= kMinPart;
 }
 
@@ -195,6 +197,7 @@ void Resolve(const TextTokenizer& tokenizer, Query* query) {
     for (QueryTerm& term : group) {
       term.words = tokenizer.Words(term.text);
       term.part = tokenizer.Fold(term.text);
+      if (term.kind == QueryTerm::Kind::kName) term.values = Split(term.part, '*');
     }
     group.erase(std::remove_if(group.begin(), group.end(),
                                [](const QueryTerm& term) { return !IsSearchable(term); }),

@@ -30,7 +30,8 @@ struct QueryTerm {
   bool negated = false;
   bool prefix = false;  // the last word may go on
   std::string text;     // as typed, without quotes and signs
-  // For kType and kExtension: the single values, lower case.
+  // The single values in `text`: for kType and kExtension in lower case, for kName folded and set
+  // by Resolve().
   std::vector<std::string> values;
 
   // Set by Resolve() for kWords and kName.

@@ -28,12 +28,20 @@ Json::Value ToJson(const IndexRecord& record) {
   return json;
 }
 
-IndexRecord FromJson(const Json::Value& json) {
+[[noreturn]] void FailLoad(const std::string& path) {
+  throw Error(kErrorLoadFile, "The list of indexes cannot be read: " + path);
+}
+
+IndexRecord FromJson(const Json::Value& json, const std::string& path) {
   IndexRecord record;
-  GetJsonValue<std::string>(record.id, json, "id", true);
-  GetJsonValue<std::string>(record.path, json, "path", true);
-  GetJsonValue<std::string>(record.moving_from, json, "moving_from", false);
-  GetJsonValue<bool>(record.paused, json, "paused", true);
+  try {
+    GetJsonValue<std::string>(record.id, json, "id", true);
+    GetJsonValue<std::string>(record.path, json, "path", true);
+    GetJsonValue<std::string>(record.moving_from, json, "moving_from", false);
+    GetJsonValue<bool>(record.paused, json, "paused", true);
+  } catch (const Error&) {
+    FailLoad(path);
+  }
   record.settings = json["settings"];
   record.mappings = json["mappings"];
   record.event_handler = json["event_handler"];
@@ -53,10 +61,10 @@ Registry::Registry(std::string path) : path_(std::move(path)) {
   // Starting with an empty list instead would make all indexes unknown for good.
   if (!fromFile(root, path_) || !root.isObject() || !root["indexes"].isArray() ||
       root["version"] != Json::Value(kVersion)) {
-    throw Error(kErrorLoadFile, "The list of indexes cannot be read: " + path_);
+    FailLoad(path_);
   }
   for (const Json::Value& json : root["indexes"]) {
-    IndexRecord record = FromJson(json);
+    IndexRecord record = FromJson(json, path_);
     records_[record.id] = std::move(record);
   }
 }

@@ -37,6 +37,17 @@ std::string NameProperty(const Json::Value& object, const char* key) {
   return value;
 }
 
+std::set<std::string> NamesProperty(const Json::Value& object, const char* key) {
+  const Json::Value& values = Property(object, key);
+  if (!values.isArray()) FailMalformed(std::string("Not an array: ") + key);
+  std::set<std::string> names;
+  for (const Json::Value& value : values) {
+    if (!value.isString()) FailMalformed(std::string("Not a string: ") + key);
+    names.insert(value.asString());
+  }
+  return names;
+}
+
 std::optional<std::int64_t> OptionalNumber(const Json::Value& object, const char* key,
                                            std::int64_t least, std::int64_t most) {
   if (!object.isObject() || !object.isMember(key)) return std::nullopt;

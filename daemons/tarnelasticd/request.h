@@ -7,6 +7,7 @@
 
 #include <cstdint>
 #include <optional>
+#include <set>
 #include <string>
 
 namespace quarry::engine {
@@ -17,6 +18,8 @@ const Json::Value& ObjectProperty(const Json::Value& object, const char* key);
 std::string StringProperty(const Json::Value& object, const char* key);
 // The same for a string that names something: not empty, without NUL bytes.
 std::string NameProperty(const Json::Value& object, const char* key);
+// An array of strings, each once.
+std::set<std::string> NamesProperty(const Json::Value& object, const char* key);
 std::optional<std::int64_t> OptionalNumber(const Json::Value& object, const char* key,
                                            std::int64_t least, std::int64_t most);
 

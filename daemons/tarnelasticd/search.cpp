@@ -164,6 +164,7 @@ Json::Value Search(const SearchRequest& request, const std::vector<SearchedIndex
   found["total"] = Json::UInt64{total};
   found["hits"] = Json::Value(Json::arrayValue);
   for (const Ranked& ranked : MakePage(request, query, indexes, matches, order)) {
+    indexes[ranked.index].reader->CheckDeadline();
     found["hits"].append(HitJson(indexes[ranked.index], ranked, terms, request.snippet_length));
   }
   return found;

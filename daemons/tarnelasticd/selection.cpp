@@ -30,16 +30,6 @@ void ParseTerm(const Schema& schema, const Json::Value& term, Selection* selecti
   selection->value = StringProperty(term, field.c_str());
 }
 
-std::set<std::string> ParseFields(const Json::Value& names) {
-  if (!names.isArray()) FailMalformed("Not an array: load_field");
-  std::set<std::string> fields;
-  for (const Json::Value& name : names) {
-    if (!name.isString()) FailMalformed("Not a string: load_field");
-    fields.insert(name.asString());
-  }
-  return fields;
-}
-
 std::string Condition(const Schema& schema, const Selection& selection) {
   std::string condition;
   switch (selection.kind) {
@@ -76,7 +66,7 @@ Selection ParseSelection(const Schema& schema, const Json::Value& query) {
   } else {
     FailMalformed("There is no query of this kind: " + qsl.begin().name());
   }
-  if (query.isMember("load_field")) selection.load_fields = ParseFields(query["load_field"]);
+  if (query.isMember("load_field")) selection.load_fields = NamesProperty(query, "load_field");
   selection.limit = OptionalNumber(query, "limit", 0, std::numeric_limits<std::int64_t>::max());
   if (query.isMember("after")) selection.after = StringProperty(query, "after");
   return selection;

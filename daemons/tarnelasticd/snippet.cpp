@@ -86,13 +86,14 @@ bool IsContinuation(char c) {
   return (static_cast<unsigned char>(c) & 0xc0) == 0x80;
 }
 
-// Moves `at` back to the nearest beginning of a word, but not by more than `most` bytes.
-std::size_t CutBefore(std::string_view text, std::size_t at, std::size_t most) {
-  const std::size_t least = at - std::min(at, most);
+constexpr std::size_t kWordReach = 40;
+
+// Moves `at` back to the nearest beginning of a word, or of a character where words are long.
+std::size_t CutBefore(std::string_view text, std::size_t at) {
+  const std::size_t least = at - std::min(at, kWordReach);
   for (std::size_t i = at; i > least; --i) {
     if (IsBlank(text[i - 1])) return i;
   }
-  if (least == 0) return 0;
   while (at > 0 && at < text.size() && IsContinuation(text[at])) --at;
   return at;
 }
@@ -100,11 +101,11 @@ std::size_t CutBefore(std::string_view text, std::size_t at, std::size_t most) {
 // The window of about `length` bytes around [begin, end).
 std::pair<std::size_t, std::size_t> Window(std::string_view text, std::size_t begin,
                                            std::size_t end, std::size_t length) {
-  constexpr std::size_t kWordReach = 40;
   const std::size_t room = length > end - begin ? length - (end - begin) : 0;
-  const std::size_t start = CutBefore(text, begin - std::min(begin, room / 3), kWordReach);
+  const std::size_t wished = begin - std::min(begin, room / 3);
+  const std::size_t start = wished <= kWordReach ? 0 : CutBefore(text, wished);
   std::size_t stop = std::min(text.size(), std::max(end, start + length));
-  if (stop < text.size()) stop = std::max(end, CutBefore(text, stop, kWordReach));
+  if (stop < text.size()) stop = std::max(end, CutBefore(text, stop));
   return {start, stop};
 }
 
