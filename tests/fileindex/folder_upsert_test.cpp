@@ -1,28 +1,18 @@
 // FolderAdd and FolderSet, by the whole sequence of what they do.
 
-#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <sys/file.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
-#include <functional>
-#include <memory>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "common/error.h"
 #include "common/json.h"
-#include "common/paths.h"
-#include "fileindex/config/folder_mgr.h"
-#include "fileindex/config/status_mgr.h"
 #include "fileindex/index_mgr.h"
-#include "tests/fake_platform/fixture.h"
-#include "tests/fileindex/effects.h"
-#include "tests/fileindex/index_daemon.h"
-#include "tests/support/files.h"
+#include "tests/fileindex/operation_fixture.h"
 
 namespace quarry::fileindex {
 namespace {
@@ -30,133 +20,7 @@ namespace {
 using ::testing::ElementsAreArray;
 using ::testing::IsEmpty;
 
-using Texts = std::vector<std::string>;
-
-const char kDaemonCommand[] = R"(daemon {"data":{"is_upsert":true,"share_name":")";
-const std::string kLock = RootedPath("/tmp/quarry_cfg_folder.lock");
-
-// The record of a folder whose kinds are given by letters, as a caller hands it in.
-Json::Value Record(const std::string& path, const std::string& kinds = "davp") {
-  const auto has = [&](char kind) { return kinds.find(kind) != std::string::npos; };
-  return Folder(path, "n", has('d'), has('a'), has('v'), has('p'), false, false).GetData();
-}
-
-Json::Value Array(const std::vector<Json::Value>& elements) {
-  Json::Value array(Json::arrayValue);
-  for (const Json::Value& element : elements) array.append(element);
-  return array;
-}
-
-class FolderUpsertTest : public fake::FakePlatformTest {
- protected:
-  FolderUpsertTest() {
-    for (const char* share : {"music", "photo"}) fake::AddShare(share, volume_ + "/" + share);
-    for (const char* place : {"/music", "/photo/a", "/photo/b", "/photo/a/deep"}) {
-      test::MakeDirs(volume_ + place);
-    }
-    test::WriteFile(RootedPath("/var/run/tarnelasticd.sock"), "");
-  }
-
-  // Starts the daemon and records from here on.
-  void Begin() {
-    effects_ = std::make_unique<test::Effects>();
-    effects_->Watch("list", kFileIndexFoldersCfgPath);
-    effects_->Watch("status", kFileIndexStatusCfgPath);
-    for (const char* share : {"music", "photo"}) {
-      effects_->Watch(std::string("queue ") + share, QueueOf(share));
-    }
-    daemon_ = std::make_unique<test::IndexDaemon>(
-        [this](const Json::Value& command) { OnCommand(command); });
-  }
-
-  void OnCommand(const Json::Value& command) {
-    effects_->OnDaemonCommand(command);
-    const int fd = open(kLock.c_str(), O_RDONLY | O_CLOEXEC);
-    EXPECT_NE(flock(fd, LOCK_SH | LOCK_NB), 0) << "the daemon is told under the exclusive lock";
-    close(fd);
-    if (vanish_after_command_) unlink(test::IndexDaemon::Path().c_str());
-  }
-
-  std::string QueueOf(const std::string& share) const {
-    return fake::QueuePath(volume_ + "/" + share);
-  }
-
-  // The failure of an operation, as "code reason"; "" when it does not fail. The lock is free in
-  // either case.
-  static std::string FailureOf(const std::function<void()>& operation) {
-    std::string failure;
-    try {
-      operation();
-    } catch (const Error& error) {
-      failure = std::to_string(error.code()) + " " + error.reason();
-    }
-    const int fd = open(kLock.c_str(), O_RDONLY | O_CLOEXEC);
-    if (fd >= 0) {
-      EXPECT_EQ(flock(fd, LOCK_EX | LOCK_NB), 0);
-      close(fd);
-    }
-    return failure;
-  }
-
-  static void SaveList(const std::vector<Json::Value>& records) {
-    test::WriteFile(kFileIndexFoldersCfgPath, toString(Array(records)));
-  }
-  static std::string StoredList() {
-    return access(kFileIndexFoldersCfgPath.c_str(), F_OK) == 0
-               ? test::ReadFile(kFileIndexFoldersCfgPath)
-               : "";
-  }
-
-  // Single effects, as they are recorded.
-  static Texts ServicesOn() {
-    return {"call TARNSMBSetSpotlight(1)", "call HLIBServiceRestart(samba)",
-            "call HLIBServiceStart(tarncontentextractd, 1)",
-            "call HLIBServicectlStart(pkg-Quarry-fileindexd, 1)"};
-  }
-  std::string Monitored(const std::string& share, const Texts& folders) const {
-    Json::Value config;
-    config["queue"] = QueueOf(share);
-    config["config"] = Json::Value(Json::arrayValue);
-    for (const std::string& folder : folders) {
-      Json::Value entry;
-      entry["path"] = volume_ + folder;
-      entry["mask"] = 65478;
-      entry["ignore"].append("@eaDir");
-      config["config"].append(entry);
-    }
-    return "call MonitorQueue::Upsert(" + toString(config) + ", fileindex, 1)";
-  }
-  static std::string Saved(const std::vector<Json::Value>& records) {
-    return "list = " + toString(Array(records));
-  }
-  static std::string Told(const std::string& share) {
-    return kDaemonCommand + share + R"("},"type":"notify_setting_changed"})";
-  }
-  // One line of a queue: all that is in the configuration of `kinds` is to be looked at anew.
-  std::string Line(const std::string& path, const std::string& kinds) const {
-    Json::Value line;
-    line["event"] = 0x20000;
-    line["path"] = volume_ + path;
-    line["path_old"] = "";
-    const Json::Value record = Record("", kinds);
-    for (const char* kind : {"document", "audio", "video", "photo"}) {
-      line["data"][kind] = record[kind];
-    }
-    return toString(line) + "\n";
-  }
-
-  const std::string volume_ = test::TestRoot() + "/volume1";
-  bool vanish_after_command_ = false;
-  std::unique_ptr<test::Effects> effects_;
-  std::unique_ptr<test::IndexDaemon> daemon_;
-};
-
-Texts operator+(Texts a, const Texts& b) {
-  a.insert(a.end(), b.begin(), b.end());
-  return a;
-}
-
-const char kBecomeRoot[] = "call ResetCredentialsByName(root, true)";
+class FolderUpsertTest : public OperationTest {};
 
 // ---- What is done when all goes well
 
@@ -337,8 +201,6 @@ class FolderRefusalTest : public FolderUpsertTest {
                      const Texts& logs) {
     Begin();
     const std::string before = StoredList();
-    fake::ClearLogs();
-    errno = 0;
     EXPECT_EQ(FailureOf([&] { create ? FolderAdd(list, false) : FolderSet(list, false); }),
               failure);
     EXPECT_THAT(effects_->All(), IsEmpty());
@@ -348,8 +210,7 @@ class FolderRefusalTest : public FolderUpsertTest {
       const std::string log = fake::Logs()[i];
       EXPECT_EQ(fake::AnyLine(log.substr(0, log.find(" [err: "))), logs[i]);
     }
-    daemon_.reset();
-    effects_.reset();
+    End();
   }
   static std::string Logged(const std::string& text) {
     return fake::AnyLine(fake::LogHead("index_mgr", 1, "FolderUpsert")) + text;
@@ -458,13 +319,12 @@ TEST_F(FolderRefusalTest, AListThatCannotBeLoaded) {
     EXPECT_EQ(FailureOf([] { FolderAdd(Array({Record("/photo/a")}), false); }), failure);
     EXPECT_THAT(effects_->All(), IsEmpty());
     EXPECT_EQ(StoredList(), text);
-    daemon_.reset();
-    effects_.reset();
+    End();
   }
 }
 
 TEST_F(FolderRefusalTest, ALockThatCannotBeHad) {
-  test::MakeDirs(kLock);
+  test::MakeDirs(kFolderLock);
   Begin();
   std::string failure;
   try {
@@ -565,6 +425,21 @@ TEST_F(FolderAddFailureTest, AnEventCannotBeQueued) {
   EXPECT_THAT(effects_->All(),
               ElementsAreArray(Until("queue photo", true) +
                                Texts{kBecomeRoot, R"(status = {"share":{"music":1}})"}));
+}
+
+TEST_F(FolderAddFailureTest, EverySingleFailureEndsIt) {
+  ExpectEveryFailureToEndIt(
+      [] { SaveList({Record("/photo/b", "d")}); },
+      [] {
+        FolderAdd(Array({Record("/photo/a", "dp"), Record("/music", "a")}), false);
+      });
+}
+
+class FolderSetFailureTest : public FolderUpsertTest {};
+
+TEST_F(FolderSetFailureTest, EverySingleFailureEndsIt) {
+  ExpectEveryFailureToEndIt([] { SaveList({Record("/photo/a", "d")}); },
+                            [] { FolderSet(Array({Record("/photo/a", "dp")}), false); });
 }
 
 }  // namespace
