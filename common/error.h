@@ -30,9 +30,9 @@ enum ErrorCode : std::int32_t {
   kErrorMalformedEvent = 906,     // a queue line is not JSON
   kErrorEngineRequest = 913,      // the exchange with the search engine failed
   kErrorParseDocument = 914,      // a document could not be read
-  kErrorEngineQuery = 916,        // the search engine's answer to a query is malformed
+  kErrorEngineQuery = 916,        // a rename or a look-up in an index failed
   kErrorEngineBusy = 1400,        // the search engine is busy
-  kErrorEngineBusyMemory = 1401,  // the search engine is busy
+  kErrorEngineBusyMemory = 1401,  // the search engine is busy, and short of memory
   kErrorNoSpace = 1003,           // the volume of an index is full
   kErrorTreePath = 9999,          // a path has no node in the operation tree
 };

@@ -1,6 +1,7 @@
 // Simple questions about paths, and the few changes to files that the library makes. Paths are byte
-// strings. Unless said otherwise a function reports failure by its result alone, logs nothing and
-// throws nothing.
+// strings; no file answers to one with a NUL byte. Unless said otherwise a function reports failure
+// by its result alone, logs nothing and throws nothing. All may be called from any thread, and
+// block as long as the file system does.
 
 #ifndef QUARRY_COMMON_FILE_UTIL_H_
 #define QUARRY_COMMON_FILE_UTIL_H_
@@ -48,17 +49,19 @@ QUARRY_EXPORT std::string GetFileExtension(const std::string& path, bool lower);
 // The path without links, "." and "..", or "" when it cannot be resolved.
 QUARRY_EXPORT std::string RealPath(const std::string& path);
 
-// Removes a file. True also when there was none.
+// Removes a file or a link, no directory. True also when there was none; false with errno set.
 QUARRY_EXPORT bool Unlink(const std::string& path);
 
-// Copies through the platform with its options record, which stays the caller's.
+// Copies the file or directory `from` to `to` as the platform does (TARNFileCopy), with its options
+// record, which stays the caller's. True when all was copied, else false with errno set.
 QUARRY_EXPORT bool MVFileImpl(const std::string& from, const std::string& to, TARNCOPYARGS* args);
-// Copies, then removes the source.
+// The same with owner, mode and times kept; MVFile then removes the source.
 QUARRY_EXPORT bool MVFile(const std::string& from, const std::string& to);
 QUARRY_EXPORT bool CPFile(const std::string& from, const std::string& to);
 
-// Gives `path` to the package's account; a symbolic link is followed. False when the owner cannot
-// be changed. Throws Error 801 when there is no such account.
+// Gives `path` to the package's account and its group; a symbolic link is followed, the mode kept.
+// False, with errno set, when the owner cannot be changed. Throws Error 801 when there is no such
+// account. Waits for the platform lock.
 QUARRY_EXPORT bool ChownQuarry(const std::string& path);
 
 }  // namespace quarry

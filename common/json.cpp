@@ -170,7 +170,8 @@ void JsonApplyChanges(Json::Value& target, const Json::Value& changes) {
     const Json::Value& value = *level.next;
     ++level.next;
     if (value.isNull()) {
-      level.target->removeMember(key);
+      // The overloads that take the key alone stop at a NUL byte in it.
+      level.target->removeMember(key.data(), key.data() + key.size(), nullptr);
     } else if (value.isObject()) {
       PushLevel(levels, (*level.target)[key], value);
     } else {

@@ -1,5 +1,6 @@
-// Typed reading, merging, parsing and writing of JSON documents. None of these functions keeps
-// state; all may be called from any thread, on documents that no other thread changes.
+// Typed reading, merging, parsing and writing of JSON documents. Texts are bytes, UTF-8 by custom.
+// None of these functions keeps state or logs; all may be called from any thread, on documents that
+// no other thread changes. What they throw is Error 120, where it is said.
 
 #ifndef QUARRY_COMMON_JSON_H_
 #define QUARRY_COMMON_JSON_H_
@@ -22,15 +23,16 @@ QUARRY_EXPORT bool fromString(Json::Value& out, const std::string& text);
 QUARRY_EXPORT std::string toString(const Json::Value& value);
 
 // Parses the whole file as fromString does. Returns false, and leaves `out` null, when the file is
-// not a regular file (after links), is larger than 256 MiB, cannot be read or is not JSON. Errno is
+// not a regular file (after links), is larger than 64 MiB, cannot be read or is not JSON. Errno is
 // set unless the text is the reason.
 QUARRY_EXPORT bool fromFile(Json::Value& out, const std::string& path);
 
 // Replaces the file by the text of `value`, whole and durably: readers see the old or the new text,
-// also after a power failure. The file keeps its permissions, a symbolic link is followed; a new
-// file gets mode 0666 less the process's umask. Returns false, with errno set and the old file
-// untouched, on failure; only when the directory could not be synced at the end the new text is
-// there already.
+// also after a power failure. The file keeps its permissions; a symbolic link is followed, but
+// replaced where it leads to nothing; a new file gets mode 0666 less the process's umask. Blocks
+// until the disk has it. Returns true with errno as it was, or false, with errno set and the old
+// file untouched, on failure; only when the directory could not be synced at the end the new text
+// is there already.
 QUARRY_EXPORT bool toFile(const Json::Value& value, const std::string& path);
 
 // Whether `value` has members to ask for: an object, or null, which is an object without members.
@@ -41,7 +43,8 @@ QUARRY_EXPORT bool isObject(const Json::Value& value);
 template <typename T>
 bool isJsonType(const Json::Value& value);
 
-// `value` as T. What it holds must satisfy isJsonType<T>; a number out of T's range is Error 120.
+// `value` as T. Throws Error 120, "Not a string" + AppendData(value), when the library cannot
+// convert it, as it can where isJsonType<T> holds and the number is in T's range.
 template <typename T>
 T asJsonType(const Json::Value& value);
 
@@ -52,9 +55,10 @@ T asJsonType(const Json::Value& value);
 template <typename T>
 void GetJsonValue(T& out, const Json::Value& json, const std::string& key, bool required);
 
-// Merges `changes` into `target`: null removes a key, objects are merged, all else replaces.
-// Changes that are no object change nothing. Throws Error 120 when `target`, or a member that
-// changes are to be merged into, is neither an object nor null.
+// Merges `changes`, which is no part of `target`, into `target`: null removes a key, objects are
+// merged, all else replaces. Changes that are no object change nothing. Throws Error 120 when
+// `target`, or a member that changes are to be merged into, is neither an object nor null; what was
+// merged before stays.
 QUARRY_EXPORT void JsonApplyChanges(Json::Value& target, const Json::Value& changes);
 
 // ", data=" + the text of `json`, to end a reason with.

@@ -17,7 +17,7 @@ namespace quarry {
 namespace {
 
 // Far above any state file; below what could exhaust memory.
-constexpr off_t kMaxFileSize = 256LL << 20;
+constexpr off_t kMaxFileSize = 64LL << 20;
 
 bool HasNul(const std::string& path) {
   if (path.find('\0') == std::string::npos) return false;
@@ -93,8 +93,8 @@ class Replacement {
   }
 
  private:
-  // Short, whatever the replaced file is called; unique among the writers alive at one time. What a
-  // killed process left behind under the same name is nobody's any more.
+  // Short, whatever the replaced file is called; unique among the writers alive at one time. With
+  // the time in it what a killed process of the same id left behind is not in the way.
   static std::string UniqueName() {
     static std::atomic<unsigned int> counter{0};
     timespec now{};

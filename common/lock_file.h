@@ -17,9 +17,10 @@ class QUARRY_EXPORT LockFile {
  public:
   // Opens `path`, creating it with mode 0644 if it is missing, and locks it: exclusively, or shared
   // with other shared holders. Blocks for up to about a minute, in at most 64 attempts with pauses
-  // of 0 to 0.9 seconds. Throws Error 506 when the file cannot be opened or locked. Leaves errno as
-  // it was when it succeeds.
+  // of 0 to 0.9 seconds. Throws Error 506 when the file cannot be opened, which is logged, or
+  // locked. Leaves errno as it was when it succeeds. The descriptor is not inherited by programs.
   LockFile(const std::string& path, bool exclusive);
+  // Gives the lock up; the file stays. Leaves errno as it was.
   ~LockFile();
   LockFile(const LockFile&) = delete;
   LockFile& operator=(const LockFile&) = delete;
@@ -38,7 +39,7 @@ class QUARRY_EXPORT Mutex {
   Mutex& operator=(const Mutex&) = delete;
 
   // Each returns whether the call succeeded. Lock() blocks until the mutex is free, TryLock() does
-  // not and returns false when it is taken.
+  // not and returns false when it is taken. Unlock() is for the thread that has locked.
   bool Lock();
   bool TryLock();
   bool Unlock();

@@ -1,5 +1,5 @@
 // How the library writes to the system log, and the one way in which a failed check is logged and
-// thrown. Every line has priority LOG_ERR.
+// thrown. Every line has priority LOG_ERR. May be used from any thread.
 
 #ifndef QUARRY_COMMON_LOG_H_
 #define QUARRY_COMMON_LOG_H_

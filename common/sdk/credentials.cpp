@@ -31,11 +31,13 @@ bool Become(const std::string& user) {
 bool NameOf(uid_t uid, std::string& name, int& error) {
   LockMutex lock(SDKMutex());
   TARNUSER* user_info = nullptr;
-  const bool found = TARNUserGetByUID(uid, &user_info) >= 0 && user_info != nullptr;
-  if (!found) error = HLIBCErrGet();
-  if (found) name = user_info->szName;
-  if (user_info != nullptr) TARNUserFree(user_info);
-  return found;
+  if (TARNUserGetByUID(uid, &user_info) < 0 || user_info == nullptr) {
+    error = HLIBCErrGet();
+    return false;
+  }
+  name = user_info->szName;
+  TARNUserFree(user_info);
+  return true;
 }
 
 bool IsAdministrator(const std::string& user) {
@@ -57,7 +59,7 @@ SDKCredentials::SDKCredentials(const std::string& user)
     : euid_(geteuid()), egid_(getegid()), groups_(CurrentGroups()), username_(user) {
   try {
     AsUser(user);
-  } catch (const Error&) {
+  } catch (...) {
     // No destructor follows, and the switch may have been made by half.
     RestoreIds();
     throw;
@@ -67,15 +69,12 @@ SDKCredentials::SDKCredentials(const std::string& user)
 SDKCredentials::~SDKCredentials() {
   if (AreIdsRestored()) return;
   const int saved_errno = errno;
-  errno = 0;
-  if (!Become(username_)) {
-    LogFailure(QUARRY_SITE_AT("credentials", 39), "!ResetCredentialsByName(username_)",
-               Error(kErrorCredentials).reason());
+  if (Become(username_)) {
+    errno = saved_errno;
+  } else {
+    LogFailure(QUARRY_SITE_AT("credentials", 39), "!ResetCredentialsByName(username_)", "");
   }
-  if (!RestoreIds()) {
-    LogFailure(QUARRY_SITE("credentials"), "!RestoreIds()", Error(kErrorCredentials).reason());
-  }
-  errno = saved_errno;
+  if (!RestoreIds()) LogFailure(QUARRY_SITE("credentials"), "!RestoreIds()", "");
 }
 
 void SDKCredentials::AsUser(const std::string& user) {
@@ -96,13 +95,16 @@ bool SDKCredentials::AreIdsRestored() const {
 
 bool SDKCredentials::RestoreIds() {
   if (AreIdsRestored()) return true;
+  const int saved_errno = errno;
   // Groups can be changed by root only, so root is the way from one account to another. Where that
   // is not to be had, each id is still set as far as it goes.
-  if (geteuid() != 0 && seteuid(0) != 0) errno = 0;
-  if (geteuid() == 0 && setgroups(groups_.size(), groups_.data()) != 0) errno = 0;
+  const bool is_root = geteuid() == 0 || seteuid(0) == 0;
+  const bool groups_restored = !is_root || setgroups(groups_.size(), groups_.data()) == 0;
   const bool group_restored = setegid(egid_) == 0;
   const bool user_restored = seteuid(euid_) == 0;
-  return group_restored && user_restored;
+  if (!groups_restored || !group_restored || !user_restored) return false;
+  errno = saved_errno;
+  return true;
 }
 
 }  // namespace quarry::sdk

@@ -1,6 +1,7 @@
 #include "common/sdk/share.h"
 
 #include <array>
+#include <cerrno>
 #include <cstdio>
 #include <memory>
 
@@ -36,12 +37,15 @@ bool Compose(int (*compose)(const char*, char*, size_t), const char* subject, st
   return true;
 }
 
-// A list of strings, released under the lock that its user holds.
+// A list of strings, released under the lock that its user holds. Leaves errno to whom it tells why
+// the list could not be filled.
 class NameList {
  public:
   NameList() : list_(HLIBCSzListAlloc(BUFSIZ)) {}
   ~NameList() {
+    const int saved_errno = errno;
     if (list_ != nullptr) HLIBCSzListFree(list_);
+    errno = saved_errno;
   }
   NameList(const NameList&) = delete;
   NameList& operator=(const NameList&) = delete;
@@ -73,7 +77,6 @@ SDKShare::SDKShare(const std::string& share_name) : name_(share_name) {
   if (share_name.find('\0') == std::string::npos) {
     LockMutex lock(SDKMutex());
     found = TARNShareGet(share_name.c_str(), &share_info_) >= 0 && share_info_ != nullptr;
-    if (!found && share_info_ != nullptr) TARNShareFree(share_info_);
   }
   if (!found) {
     Fail(QUARRY_SITE("share"), "0 > TARNShareGet(share_name.c_str(), &share_info_) || !share_info_",

@@ -20,16 +20,18 @@ namespace sdk {
 // taken innermost and never held across a call to a daemon.
 QUARRY_EXPORT Mutex& SDKMutex();
 
-// Owns the platform's record of one share. All members ask the platform under SDKMutex() and may be
-// called from any thread; failures are logged and thrown as Error with the lock released.
+// Owns the platform's record of one share. All members ask the platform under SDKMutex(), wait for
+// it, and may be called from any thread; failures are logged and thrown as Error with the lock
+// released. Names and paths are UTF-8.
 class QUARRY_EXPORT SDKShare {
  public:
-  // Throws Error 800 when there is no such share.
+  // Looks the share up by its exact name. Throws Error 800 when there is none.
   explicit SDKShare(const std::string& share_name);
   ~SDKShare();
   SDKShare(const SDKShare&) = delete;
   SDKShare& operator=(const SDKShare&) = delete;
 
+  // The name given to the constructor. Valid as long as this object.
   const std::string& GetName() const { return name_; }
   // The share's full path: the directory in which it lives, "/" and its name.
   std::string GetPath() const;
@@ -38,14 +40,15 @@ class QUARRY_EXPORT SDKShare {
   bool IsHideUnReadable() const;
   // Whether 100 MiB can still be written to the share's volume; true unless it is known to be full.
   bool IsSpaceEnough() const;
-  // The platform's privilege values, compared with the platform's constants only.
+  // The share's FTP privilege, and the privilege of the account named `user`: values of the
+  // platform, compared with its constants only.
   int GetFTPPrivilege() const;
   int GetPrivilege(const std::string& user) const;
   // Whether the share may have an index: neither encrypted nor read-only. Throws Error 502.
   bool CanBeIndexed() const;
   // Whether the share can be encrypted at all. Throws Error 502.
   bool IsEncryption() const;
-  // Throws Error 502.
+  // Whether the share's recycle bin is on. Throws Error 502.
   bool IsEnableRecycleBin() const;
 
   // The share's event queue file. Throws Error 502.

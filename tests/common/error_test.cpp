@@ -47,6 +47,19 @@ TEST(ErrorTest, CopyKeepsMessageCodeAndReason) {
   EXPECT_STREQ(copy.what(), "Quarry error, code=506, reason=[taken]");
 }
 
+TEST(ErrorTest, IsThrownAndCaughtAsACopyThatOutlivesIt) {
+  const auto caught = [] {
+    try {
+      throw Error(kErrorMalformedEvent, "line");
+    } catch (const Error& error) {
+      return Error(error);
+    }
+  }();
+  EXPECT_EQ(caught.code(), 906);
+  EXPECT_EQ(caught.reason(), "line");
+  EXPECT_STREQ(caught.what(), "Quarry error, code=906, reason=[line]");
+}
+
 TEST(ErrorTest, IsARuntimeErrorWithA32BitCode) {
   EXPECT_TRUE((std::is_base_of_v<std::runtime_error, Error>));
   EXPECT_TRUE((std::is_same_v<std::underlying_type_t<ErrorCode>, std::int32_t>));

@@ -116,6 +116,36 @@ TEST_F(JsonFileTest, HugeFileIsRefusedWithoutReadingIt) {
   EXPECT_TRUE(read.isNull());
 }
 
+TEST_F(JsonFileTest, FileThatGrowsBeyondTheBoundWhileItIsReadIsRefused) {
+  WriteFile(path_, "1");
+  fake::OnSystemCall("read", [&] { EXPECT_EQ(truncate(path_.c_str(), (64LL << 20) + 65536), 0); });
+  Json::Value read(1);
+  EXPECT_FALSE(fromFile(read, path_));
+  EXPECT_EQ(errno, EFBIG);
+  EXPECT_TRUE(read.isNull());
+}
+
+TEST_F(JsonFileTest, FailedReadIsNull) {
+  WriteFile(path_, "1");
+  fake::FailSystemCall("read", 2, EIO);
+  Json::Value read(1);
+  EXPECT_FALSE(fromFile(read, path_));
+  EXPECT_EQ(errno, EIO);
+  EXPECT_TRUE(read.isNull());
+  fake::FailSystemCall("open", 1, EACCES);
+  EXPECT_FALSE(fromFile(read, path_));
+  EXPECT_EQ(errno, EACCES);
+}
+
+TEST_F(JsonFileTest, InterruptedReadGoesOn) {
+  WriteFile(path_, "[1,2]");
+  fake::FailSystemCall("read", 1, EINTR);
+  fake::FailSystemCall("read", 3, EINTR);
+  Json::Value read;
+  EXPECT_TRUE(fromFile(read, path_));
+  EXPECT_EQ(read.size(), 2u);
+}
+
 TEST_F(JsonFileTest, FileLongerThanOneReadIsWhole) {
   Json::Value value;
   for (int i = 0; i < 50000; ++i) value.append(i);
@@ -283,6 +313,14 @@ TEST_F(JsonFileTest, LinkIsKeptAndItsTargetReplaced) {
   EXPECT_TRUE(std::filesystem::is_symlink(path_));
   EXPECT_EQ(ReadFile(dir_ / "target/real"), toString(new_));
   EXPECT_EQ(ListDir(dir_ / "target"), std::vector<std::string>({"real"}));
+}
+
+TEST_F(JsonFileTest, LinkThatLeadsToNothingIsReplaced) {
+  std::filesystem::create_symlink(dir_ / "none", path_);
+  ASSERT_TRUE(toFile(new_, path_));
+  EXPECT_FALSE(std::filesystem::is_symlink(path_));
+  EXPECT_EQ(ReadFile(path_), toString(new_));
+  EXPECT_EQ(ListDir(dir_.path()), std::vector<std::string>({"state"}));
 }
 
 TEST_F(JsonFileTest, LongestNameCanBeReplaced) {

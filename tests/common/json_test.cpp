@@ -424,6 +424,11 @@ TEST_F(JsonTest, RemovingAMissingKeyIsNoError) {
   EXPECT_EQ(Merged("null", "{\"b\":null}"), "null");
 }
 
+TEST_F(JsonTest, KeysAreRemovedWhole) {
+  EXPECT_EQ(Merged(R"({"a":1,"a\u0000b":2})", R"({"a\u0000b":null})"), R"({"a":1})");
+  EXPECT_EQ(Merged(R"({"a":1})", R"({"a\u0000b":null})"), R"({"a":1})");
+}
+
 TEST_F(JsonTest, MissingObjectsAreMade) {
   EXPECT_EQ(Merged("null", "{\"a\":{\"b\":{\"c\":1}}}"), "{\"a\":{\"b\":{\"c\":1}}}");
   EXPECT_EQ(Merged("{}", "{\"a\":{}}"), "{\"a\":null}");
@@ -523,6 +528,8 @@ TEST_F(JsonTest, ArrayBecomesStringsAndSkipsWhatIsNone) {
   EXPECT_EQ(JsonArr2Vec<std::string>(Doc("[]")), Strings());
   EXPECT_EQ(JsonArr2Vec<std::string>(Doc("null")), Strings());
   EXPECT_EQ(JsonArr2Vec<std::string>(Doc("\"x\"")), Strings());
+  EXPECT_EQ(JsonArr2Vec<std::string>(Doc("{\"b\":\"x\",\"a\":[],\"c\":\"y\"}")),
+            Strings({"x", "y"}));
 }
 
 TEST_F(JsonTest, ListsSurviveBothWays) {

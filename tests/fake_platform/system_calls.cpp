@@ -20,8 +20,8 @@
 namespace quarry::fake {
 namespace {
 
-constexpr std::array<const char*, 14> kCallNames = {
-    "open",   "rename", "write",  "fsync",  "flock",   "close",   "chmod",
+constexpr std::array<const char*, 15> kCallNames = {
+    "open",   "rename", "read",   "write",  "fsync",   "flock",   "close",    "chmod",
     "fchmod", "chown",  "fchown", "unlink", "seteuid", "setegid", "setgroups"};
 
 size_t CallIndex(const char* name) {
@@ -333,6 +333,11 @@ int open64(const char* path, int flags, ...) {
 int rename(const char* from, const char* to) noexcept {
   static const auto real = Real<int (*)(const char*, const char*)>("rename");
   return Enter("rename").fails ? -1 : real(from, to);
+}
+
+ssize_t read(int fd, void* data, size_t size) {
+  static const auto real = Real<ssize_t (*)(int, void*, size_t)>("read");
+  return Enter("read").fails ? -1 : real(fd, data, size);
 }
 
 ssize_t write(int fd, const void* data, size_t size) {

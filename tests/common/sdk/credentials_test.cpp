@@ -206,19 +206,59 @@ TEST_F(CredentialsTest, IdsThatCannotBeRestoredAreLogged) {
                 "Failed [!RestoreIds()], reason:  [err: Operation not permitted]");
 }
 
-TEST_F(CredentialsTest, GroupsThatCannotBeSetDoNotStopTheReturn) {
+TEST_F(CredentialsTest, GroupsThatCannotBeSetAreLoggedAndDoNotStopTheReturn) {
   auto credentials = std::make_unique<SDKCredentials>("root");
   fake::FailEverySystemCall("setgroups", EPERM);
   credentials.reset();
   EXPECT_EQ(Now(), alice_);
+  ASSERT_EQ(fake::Logs().size(), 1u);
+  EXPECT_EQ(fake::AnyLine(fake::Logs()[0]),
+            fake::AnyLine(fake::LogHead("credentials", 1, "~SDKCredentials")) +
+                "Failed [!RestoreIds()], reason:  [err: Operation not permitted]");
+}
+
+TEST_F(CredentialsTest, GroupThatCannotBeSetDoesNotStopTheReturn) {
+  auto credentials = std::make_unique<SDKCredentials>("root");
+  fake::FailEverySystemCall("setegid", EPERM);
+  credentials.reset();
+  EXPECT_EQ(Now(), Ids(1001, 0));
+  EXPECT_EQ(
+      fake::LogsWith("Failed [!RestoreIds()], reason:  [err: Operation not permitted]").size(), 1u);
+}
+
+TEST_F(CredentialsTest, IdsAreRestoredAsFarAsTheyGoWithoutTheWayThroughRoot) {
+  // The platform became another account and gave the way back up.
+  auto credentials = std::make_unique<SDKCredentials>("bob");
+  fake::FailCall("ResetCredentialsByName", 1, {0, EPERM});
+  fake::FailSystemCall("seteuid", 1, EPERM);
+  credentials.reset();
+  EXPECT_EQ(Now(), alice_);
+  EXPECT_EQ(fake::SystemCallCount("setgroups"), 0);
+  EXPECT_EQ(fake::Logs().size(), 1u);
 }
 
 TEST_F(CredentialsTest, ReturnLeavesErrnoAlone) {
   auto credentials = std::make_unique<SDKCredentials>("root");
-  fake::FailCall("ResetCredentialsByName", 1, {0, EPERM});
   errno = ENOSPC;
   credentials.reset();
   EXPECT_EQ(errno, ENOSPC);
+  EXPECT_TRUE(fake::Logs().empty());
+}
+
+TEST_F(CredentialsTest, FailedReturnIsLoggedByTheErrnoThatStandsAndClearsIt) {
+  for (const bool is_set : {true, false}) {
+    auto credentials = std::make_unique<SDKCredentials>("bob");
+    fake::ClearLogs();
+    fake::FailCall("ResetCredentialsByName", 1, {0});
+    const std::string head = fake::LogHead("credentials", 39, "~SDKCredentials");
+    errno = is_set ? ENOSPC : 0;
+    credentials.reset();
+    EXPECT_EQ(errno, 0);
+    EXPECT_EQ(fake::Logs(),
+              Strings({head + "Failed [!ResetCredentialsByName(username_)], reason: " +
+                       (is_set ? " [err: No space left on device]" : "")}));
+    EXPECT_EQ(Now(), alice_);
+  }
 }
 
 TEST_F(CredentialsTest, ScopesNest) {

@@ -282,6 +282,14 @@ TEST_F(ShareTest, FailedEnumerationIsAnErrorAndReleasesTheList) {
   EXPECT_EQ(Thrown([] { SDKShare::Enum(); }), "121 HLIBShareEnum failed");
   ExpectLogged("Enum", "0 > HLIBShareEnum(&share_list, &enum_func)", "HLIBShareEnum failed");
   EXPECT_EQ(fake::Outstanding(), 0);
+  fake::ClearLogs();
+  // The list is released before the line is written, which tells the errno of the enumeration.
+  fake::FailCall("HLIBShareEnum", 1, {-1, EIO});
+  fake::FailCall("HLIBCSzListFree", 1, {0, EBADF});
+  EXPECT_EQ(Thrown([] { SDKShare::Enum(); }), "121 HLIBShareEnum failed");
+  ExpectLogged("Enum", "0 > HLIBShareEnum(&share_list, &enum_func)",
+               "HLIBShareEnum failed [err: Input/output error]");
+  EXPECT_EQ(errno, 0);
   fake::FailCall("HLIBCSzListPush");
   EXPECT_EQ(Thrown([] { SDKShare::Enum(); }), "121 HLIBShareEnum failed");
 }
