@@ -27,14 +27,15 @@ bool IsBusy(int code) {
 }
 
 // The engine may have been started a moment ago. Whether it is there in the end is for the connect
-// to say; what the waiting left in errno would be logged with some later failure.
+// to say; a later failure must not be logged with what the waiting left in errno.
 void WaitForSocket() {
+  const int saved_errno = errno;
   for (int wait = 1; wait <= kSocketWaits && access(kSocketPath.c_str(), F_OK) != 0; ++wait) {
     LogLine({"comm.cpp", 14, "SendRequestImpl"},
             "elastic socket is not ready, retry ... " + std::to_string(wait));
     sleep(1);
   }
-  errno = 0;
+  errno = saved_errno;
 }
 
 bool IsResponse(const Json::Value& response) {

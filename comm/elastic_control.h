@@ -1,9 +1,10 @@
 // The commands of the search engine: one index per share, one document per file or directory, keyed
 // by its full path.
 //
-// All functions send through SendRequest (comm/comm.h): they block while the engine is busy, throw
-// its errors unchanged, keep no state and may be called from several threads at once. Shares are
-// given by name, places by absolute path, without a trailing "/".
+// All commands go through SendRequest (comm/comm.h): they block while the engine is busy and throw
+// what it throws, the engine's own codes unchanged. No function keeps state; all may be called from
+// several threads at once. Shares are given by name, places by absolute path without a trailing
+// "/", both as byte strings in UTF-8.
 
 #ifndef QUARRY_COMM_ELASTIC_CONTROL_H_
 #define QUARRY_COMM_ELASTIC_CONTROL_H_
@@ -43,9 +44,10 @@ QUARRY_EXPORT Json::Value GetFileIndexSettings();
 QUARRY_EXPORT Json::Value GetFileIndexMappings();
 QUARRY_EXPORT Json::Value GetFileIndexEventHandler();
 
-// Creates the share's index in the directory that the platform gives it. Throws Error 800 for an
-// unknown share.
+// Creates the share's index in the directory that the platform gives it. Throws also Error 800 for
+// an unknown share, and Error 502 when the platform gives no directory.
 QUARRY_EXPORT void ShareIndexCreate(const std::string& share);
+// Each needs no share of that name any more, only the engine's index.
 QUARRY_EXPORT void ShareIndexDelete(const std::string& share);
 QUARRY_EXPORT void ShareIndexPause(const std::string& share);
 QUARRY_EXPORT void ShareIndexResume(const std::string& share);
@@ -61,15 +63,17 @@ QUARRY_EXPORT void IndexDel(const std::string& share, const std::string& path);
 // Deletes what lies below `dir`, but not the document of `dir` itself.
 QUARRY_EXPORT void IndexDelDir(const std::string& share, const std::string& dir);
 
-// Reads the file and replaces its whole document; its content is read only with `need_meta`. Throws
-// Error 914 when the extractor cannot tell anything about the file.
+// Reads the file and replaces its whole document; its content is read only with `need_meta`. Blocks
+// while the extractor reads. Throws also Error 914 when the extractor cannot tell anything about
+// the file; nothing is sent then.
 QUARRY_EXPORT void IndexUpsert(const std::string& share, const std::string& path, bool need_meta);
-// Reads the file's attributes and merges them into its document. Throws Error 914 as above.
+// Reads the file's attributes and merges them into its document. Blocks and throws as above.
 QUARRY_EXPORT void IndexAttr(const std::string& share, const std::string& path);
 
 // Moves the document of `old_path`, and all documents below it, to `new_path`; note the order of
-// the arguments. Throws Error 916 when the engine's list of documents is malformed, Error 120 when
-// one of the documents is. Documents that the engine cannot move are logged and left.
+// the arguments. Throws also Error 916 when the engine's list of what lies below is malformed, and
+// Error 120 when one of its documents is; only the document of `old_path` has been moved then.
+// Documents that the engine cannot move are logged and left.
 QUARRY_EXPORT void IndexRename(const std::string& share, const std::string& new_path,
                                const std::string& old_path);
 
@@ -79,8 +83,10 @@ QUARRY_EXPORT void IndexRename(const std::string& share, const std::string& new_
 QUARRY_EXPORT void IndexGetByPrefixPath(const std::string& id, const std::string& prefix,
                                         std::vector<std::string>& out);
 
-// Makes durable what was sent for the share. Throws Error 1003, and marks the share as needing a
-// reindex, when that failed because its volume is full.
+// Makes durable what was sent for the share. When that fails and the share's volume is full, the
+// share is marked as needing a reindex and Error 1003 is thrown instead of the engine's. Throws
+// Error 800 when it fails for a share that is gone, and what StatusMgr throws when the share cannot
+// be marked.
 QUARRY_EXPORT void IndexCommit(const std::string& share);
 
 // Refreshes the term suggestions of the index named `db_name` from the documents `fields`. Sends

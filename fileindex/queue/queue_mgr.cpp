@@ -9,6 +9,7 @@
 
 #include "common/error.h"
 #include "common/file_util.h"
+#include "common/json.h"
 #include "common/lock_file.h"
 #include "common/log.h"
 #include "fileindex/queue/queue_reader.h"
@@ -27,6 +28,11 @@ const std::string& CheckedQueuePath(const std::string& path) {
 // Whether `path` is `directory` or lies below it. The "/" keeps /s/a from holding /s/ab.
 bool IsAtOrBelow(const std::string& path, const std::string& directory) {
   return StringStartWith(path + "/", directory + "/");
+}
+
+bool IsJson(const std::string& text) {
+  Json::Value ignored;
+  return fromString(ignored, text);
 }
 
 }  // namespace
@@ -64,13 +70,14 @@ std::int32_t QueueMgr::ProcessOP(std::function<void(std::shared_ptr<OP>)> fn, bo
   return (use_tmp ? GetOPTreeTmp() : GetOPTree())->ProcessOP(std::move(fn));
 }
 
-bool QueueMgr::FindQueue(const std::string& path, const Predicate& predicate) {
+bool QueueMgr::FindQueue(TornLine torn, const std::string& path, const Predicate& predicate) {
   if (!IsFileExist(path)) return false;
   QueueReader input(path);
   // The live queue may be renamed at any moment; then it is the snapshot that has its events.
   if (input.failed() && errno == ENOENT) return false;
   std::string line;
   while (input.Next(line)) {
+    if (torn == TornLine::kIsNone && !input.line_ended() && !IsJson(line)) break;
     if (predicate(std::make_shared<Event>(line))) return true;
   }
   if (input.failed()) {
@@ -80,12 +87,12 @@ bool QueueMgr::FindQueue(const std::string& path, const Predicate& predicate) {
   return false;
 }
 
-bool QueueMgr::FindInQueues(const Predicate& predicate) const {
-  return FindQueue(queue_path_, predicate) || FindQueue(queue_path_tmp_, predicate);
+bool QueueMgr::FindInQueues(TornLine torn, const Predicate& predicate) const {
+  return FindQueue(torn, queue_path_, predicate) || FindQueue(torn, queue_path_tmp_, predicate);
 }
 
 bool QueueMgr::IsFullPathProcessing(const std::string& full_path) {
-  return FindInQueues([&full_path](const std::shared_ptr<Event>& event) {
+  return FindInQueues(TornLine::kIsMalformed, [&full_path](const std::shared_ptr<Event>& event) {
     if (IsAtOrBelow(event->path, full_path)) return true;
     // What is moved away is still indexed under its old path until the rename has been applied.
     return (event->op & EVENT_RENAME) != 0 && !event->path_old.empty() &&
@@ -94,13 +101,13 @@ bool QueueMgr::IsFullPathProcessing(const std::string& full_path) {
 }
 
 bool QueueMgr::IsFullPathHasReindex(const std::string& full_path) {
-  return FindInQueues([&full_path](const std::shared_ptr<Event>& event) {
+  return FindInQueues(TornLine::kIsMalformed, [&full_path](const std::shared_ptr<Event>& event) {
     return event->op == EVENT_REINDEX && IsAtOrBelow(event->path, full_path);
   });
 }
 
 bool QueueMgr::IsReindexWaitingFor(const std::string& full_path) {
-  return FindInQueues([&full_path](const std::shared_ptr<Event>& event) {
+  return FindInQueues(TornLine::kIsNone, [&full_path](const std::shared_ptr<Event>& event) {
     return event->op == EVENT_REINDEX && IsAtOrBelow(full_path, event->path);
   });
 }

@@ -56,14 +56,17 @@ class QUARRY_EXPORT QueueMgr {
   bool IsFullPathHasReindex(const std::string& full_path);
 
   // Whether a reindex, and nothing else in the same line, is waiting on `full_path` or above it:
-  // one that will cover the path.
+  // one that will cover the path. A last line that is not ended and no event is none yet: it is
+  // being written, or its writer was killed.
   bool IsReindexWaitingFor(const std::string& full_path);
 
  private:
   using Predicate = std::function<bool(std::shared_ptr<Event>)>;
 
-  static bool FindQueue(const std::string& path, const Predicate& predicate);
-  bool FindInQueues(const Predicate& predicate) const;
+  enum class TornLine { kIsMalformed, kIsNone };
+
+  static bool FindQueue(TornLine torn, const std::string& path, const Predicate& predicate);
+  bool FindInQueues(TornLine torn, const Predicate& predicate) const;
 
   std::string queue_path_;
   std::string queue_path_tmp_;

@@ -18,6 +18,7 @@ QueueReader::QueueReader(const std::string& path)
 
 bool QueueReader::Next(std::string& line) {
   line.clear();
+  line_ended_ = false;
   while (begin_ != end_ || Fill()) {
     const char* const start = buffer_.data() + begin_;
     const void* const newline = std::memchr(start, '\n', end_ - begin_);
@@ -25,6 +26,7 @@ bool QueueReader::Next(std::string& line) {
       const auto length = static_cast<size_t>(static_cast<const char*>(newline) - start);
       line.append(start, length);
       begin_ += length + 1;
+      line_ended_ = true;
       return true;
     }
     line.append(start, end_ - begin_);

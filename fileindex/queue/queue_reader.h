@@ -21,11 +21,15 @@ class QueueReader {
 
   bool failed() const { return failed_; }
 
+  // Whether the line that Next handed out last had its newline.
+  bool line_ended() const { return line_ended_; }
+
  private:
   bool Fill();
 
   UniqueFd fd_;
   bool failed_;
+  bool line_ended_ = false;
   std::vector<char> buffer_;
   size_t begin_ = 0;  // what has not been handed out yet is buffer_[begin_, end_)
   size_t end_ = 0;

@@ -57,9 +57,8 @@ bool WriteAll(int fd, const std::string& text) {
 void AppendLine(const std::string& queue_path, const std::string& text) {
   // A queue that cannot be opened loses the event without a word: callers count on that.
   const UniqueFd fd(open(queue_path.c_str(), O_RDWR | O_APPEND | O_CREAT | O_CLOEXEC, 0644));
-  if (!fd.valid()) return;
   struct stat before {};
-  if (fstat(fd.get(), &before) < 0) return;
+  if (!fd.valid() || fstat(fd.get(), &before) < 0) return;
   const std::string lead = IsLastLineTorn(fd.get(), before.st_size) ? "\n" : "";
   if (WriteAll(fd.get(), lead + text + "\n")) return;
   const std::string reason = strerror(errno);
@@ -71,6 +70,10 @@ void AppendLine(const std::string& queue_path, const std::string& text) {
 
 void QueueEvent(int event, const std::string& share_name, const std::string& full_path,
                 const std::string& old_path, const Json::Value& data) {
+  // Readers of the queue drop such an event.
+  if (old_path.find('\0') != std::string::npos) {
+    throw Error(kErrorBadParameter, "NUL byte in path: " + old_path);
+  }
   const std::string queue_path = sdk::SDKShare(share_name).GetQueuePath();
   // The reindex will find all that the event is about.
   if (QueueMgr(queue_path).IsReindexWaitingFor(full_path)) return;

@@ -14,7 +14,7 @@ using quarry::GetFileExtension;
 
 // The categories. The first four answer to the folder switches "document", "audio", "video" and
 // "photo"; no switch covers kOther.
-enum FileType {
+enum FileType : int {
   kDocument = 0,
   kAudio = 1,
   kVideo = 2,

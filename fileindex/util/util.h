@@ -25,12 +25,12 @@ QUARRY_EXPORT void GetShareNameByPath(std::string& share_name, const std::string
 QUARRY_EXPORT std::string GetShareNameByPath(const std::string& share_path);
 
 // The full path of a share path. Nothing is normalised. Throws as GetShareNameByPath does, and
-// Error 800 when there is no such share.
+// Error 800 when there is no such share. The out parameter is untouched then.
 QUARRY_EXPORT void GetFullPath(std::string& full_path, const std::string& share_path);
 QUARRY_EXPORT std::string GetFullPath(const std::string& share_path);
 
 // The share that holds `full_path`: its name, and its own full path (not a share path). The path
-// need not exist. Throws Error 502 when no share holds it.
+// need not exist. Throws Error 502 when no share holds it; the out parameters are untouched then.
 QUARRY_EXPORT void GetShareNamePathByFullPath(std::string& share_name, std::string& share_path,
                                               const std::string& full_path);
 
@@ -40,7 +40,9 @@ QUARRY_EXPORT bool IsFullPathInRecycleBin(const std::string& full_path);
 
 // Whether the place may hold an indexed folder: it exists on a local file system in a share that
 // may be indexed, is written canonically, and is neither a snapshot, a recycle bin nor a mount
-// point. Throws Error 502 when no share holds it.
+// point. Never says why not. Throws Error 502 when no share holds a path that has passed the tests
+// of its file system, or the platform cannot tell a property of the share, and Error 800 when the
+// share has vanished meanwhile.
 QUARRY_EXPORT bool CanFullPathBeIndexed(const std::string& full_path);
 // The same of a share path. Throws also as GetFullPath does.
 QUARRY_EXPORT bool CanPathBeIndexed(const std::string& share_path);

@@ -118,6 +118,14 @@ TEST_F(CommWaitTest, ALaterFailureDoesNotBlameTheMissingFile) {
   EXPECT_EQ(fake::Logs().back(), Site(29) + kRecvCondition + "{}");
 }
 
+TEST_F(CommWaitTest, NeitherDoesItForgetWhatErrnoHeld) {
+  fake::OnSleep([](std::chrono::microseconds) { test::WriteFile(SocketPath(), ""); });
+  errno = EIO;
+  Refusal("{}");
+  EXPECT_EQ(fake::Logs().back(), Site(29) + kRecvCondition + "{} [err: " + strerror(EIO) + "]");
+  EXPECT_EQ(errno, 0);
+}
+
 // ---- Failures of the exchange
 
 TEST_F(CommTest, ConnectFailure) {
@@ -280,6 +288,15 @@ TEST_F(CommTest, ABusyElementFailsTheBatch) {
     EXPECT_THAT(fake::Logs(),
                 ElementsAre(Site(49) + R"(Compound failed: {"command":"a"} (500) x)"));
   }
+}
+
+TEST_F(CommTest, ARefusedBatchIsARefusal) {
+  const Error error = Refusal(R"({"success":false,"error":{"code":7,"msg":"no"},"has_fail":true,)"
+                              R"("data":[{"success":false,"error":{"code":1400,"msg":"busy"}}]})",
+                              kBatch);
+  EXPECT_EQ(error.code(), 7);
+  EXPECT_EQ(error.reason(), "Request failed, msg=no");
+  EXPECT_THAT(fake::Logs(), IsEmpty());
 }
 
 TEST_F(CommTest, NeighboursOfTheBusyCodesAreOrdinary) {

@@ -14,7 +14,10 @@
 #include <cstdint>
 #include <cstring>
 #include <functional>
+#include <memory>
+#include <string>
 #include <thread>
+#include <vector>
 
 #include "common/error.h"
 #include "common/json.h"
@@ -27,27 +30,16 @@
 namespace {
 
 std::atomic<bool> fail_setsockopt{false};
-// How many of the next calls of read are interrupted.
-std::atomic<int> interrupted_reads{0};
 
 }  // namespace
 
-// Take the C library's place in this program, so that their failures can be watched.
+// Takes the C library's place in this program, so that its failure can be watched.
 extern "C" int setsockopt(int fd, int level, int name, const void* value, socklen_t size) noexcept {
   if (fail_setsockopt) {
     errno = ENOPROTOOPT;
     return -1;
   }
   return static_cast<int>(syscall(SYS_setsockopt, fd, level, name, value, size));
-}
-
-extern "C" ssize_t read(int fd, void* buffer, size_t size) {
-  if (interrupted_reads > 0) {
-    --interrupted_reads;
-    errno = EINTR;
-    return -1;
-  }
-  return syscall(SYS_read, fd, buffer, size);
 }
 
 namespace quarry::fileindex {
@@ -73,21 +65,9 @@ std::string Reason(const char* call, int error_number) {
   return std::string(call) + " failed, reason=" + strerror(error_number);
 }
 
-int OpenDescriptors() {
-  return static_cast<int>(test::ListDir("/proc/self/fd").size());
-}
-
 class CommunicationTest : public fake::FakePlatformTest {
  protected:
-  CommunicationTest() : descriptors_(OpenDescriptors()) {}
-  ~CommunicationTest() override {
-    fail_setsockopt = false;
-    interrupted_reads = 0;
-    EXPECT_EQ(OpenDescriptors(), descriptors_) << "a descriptor was left open";
-  }
-
- private:
-  int descriptors_;
+  ~CommunicationTest() override { fail_setsockopt = false; }
 };
 
 // ---- Buffers
@@ -137,10 +117,17 @@ TEST_F(CommunicationTest, BuffersLargerThanThePipe) {
   writer.join();
 }
 
-TEST_F(CommunicationTest, PiecesAreAtMost1024Bytes) {
+TEST_F(CommunicationTest, PiecesOfAWriteAreAtMost1024Bytes) {
   const Pipe pipe;
   Write(pipe.writer.get(), Pattern(2049));
   EXPECT_EQ(fake::SystemCallCount("write"), 3);
+}
+
+TEST_F(CommunicationTest, PiecesOfAReadAreAtMost1024Bytes) {
+  const Pipe pipe;
+  Write(pipe.writer.get(), Pattern(2049));
+  EXPECT_EQ(Read(pipe.reader.get(), 2049), Pattern(2049));
+  EXPECT_EQ(fake::SystemCallCount("read"), 3);
 }
 
 TEST_F(CommunicationTest, NothingToDoTouchesNoDescriptor) {
@@ -179,30 +166,30 @@ TEST_F(CommunicationTest, ShortWritesAreContinued) {
 TEST_F(CommunicationTest, TenInterruptionsOfAReadAreBorne) {
   const Pipe pipe;
   Write(pipe.writer.get(), "ab");
-  interrupted_reads = 10;
+  for (int i = 1; i <= 10; ++i) fake::FailSystemCall("read", i, EINTR);
   EXPECT_EQ(Read(pipe.reader.get(), 2), "ab");
 }
 
 TEST_F(CommunicationTest, TheEleventhInterruptionOfAReadFails) {
   const Pipe pipe;
   Write(pipe.writer.get(), "ab");
-  interrupted_reads = 11;
+  fake::FailEverySystemCall("read", EINTR);
   const Error error = Thrown([&] { Read(pipe.reader.get(), 2); });
   EXPECT_EQ(error.code(), 502);
   EXPECT_EQ(error.reason(), Reason("read", EINTR));
-  EXPECT_EQ(interrupted_reads, 0);
+  EXPECT_EQ(fake::SystemCallCount("read"), 11);
 }
 
 TEST_F(CommunicationTest, InterruptionsOfAReadAreCountedOverTheWholeCall) {
   Pipe pipe;
   Write(pipe.writer.get(), "a");
   pipe.writer.Reset();
-  // Six before the byte that is there, six more once the end of the stream was met.
-  interrupted_reads = 6;
-  fake::OnSleep([](std::chrono::microseconds) { interrupted_reads = 6; });
+  // Six before the byte that is there, and more once the end of the stream was met.
+  for (int i = 1; i <= 6; ++i) fake::FailSystemCall("read", i, EINTR);
+  fake::OnSleep([](std::chrono::microseconds) { fake::FailEverySystemCall("read", EINTR); });
   const Error error = Thrown([&] { Read(pipe.reader.get(), 2); });
   EXPECT_EQ(error.reason(), Reason("read", EINTR));
-  EXPECT_EQ(interrupted_reads, 1);
+  EXPECT_EQ(fake::SystemCallCount("read"), 6 + 2 + 5);
   EXPECT_THAT(fake::Sleeps(), SizeIs(1));
 }
 
@@ -398,7 +385,7 @@ TEST_F(CommunicationTest, AClaimedLengthTakesNoMemory) {
     Write(peer, LengthOf(0xffffffffu) + "a little");
   });
   // The daemon is gone and the caller reads on; this ends it.
-  fake::OnSleep([](std::chrono::microseconds) { interrupted_reads = 100; });
+  fake::OnSleep([](std::chrono::microseconds) { fake::FailEverySystemCall("read", EINTR); });
   const Error error = Thrown([] { SendCommandToDaemon("c", Json::Value()); });
   EXPECT_EQ(error.reason(), Reason("read", EINTR));
   EXPECT_THAT(fake::Sleeps(), SizeIs(1));
@@ -427,6 +414,27 @@ TEST_F(CommunicationTest, ADaemonThatStartsMeanwhileIsReached) {
   ASSERT_NE(daemon, nullptr);
   daemon->Join();
   EXPECT_EQ(frame, std::string(R"({"data":null,"type":"c"})") + '\0');
+}
+
+TEST_F(CommunicationTest, ThreadsDoNotDisturbEachOther) {
+  constexpr int kThreads = 4;
+  constexpr int kCommands = 20;
+  const UniqueFd listener = Listen();
+  std::thread daemon([&] {
+    for (int i = 0; i < kThreads * kCommands; ++i) {
+      const UniqueFd peer(accept4(listener.get(), nullptr, nullptr, SOCK_CLOEXEC));
+      EXPECT_EQ(ReadFrame(peer.get()), std::string(R"({"data":null,"type":"c"})") + '\0');
+      Write(peer.get(), LengthOf(1) + "k");
+    }
+  });
+  std::vector<std::thread> callers;
+  for (int i = 0; i < kThreads; ++i) {
+    callers.emplace_back([] {
+      for (int k = 0; k < kCommands; ++k) SendCommandToDaemon("c", Json::Value());
+    });
+  }
+  for (std::thread& caller : callers) caller.join();
+  daemon.join();
 }
 
 TEST_F(CommunicationTest, ASocketThatNobodyServesIsNotWaitedFor) {

@@ -549,12 +549,37 @@ TEST_F(ElasticControlTest, AFailedCommitWithSpaceChangesNoStatus) {
 }
 
 TEST_F(ElasticControlTest, AFailedCommitWithoutSpaceMarksTheShare) {
+  StatusMgr().SetShareStatus("photo", 2);
+  for (const int out_of_space : {0x2900, 0x2400}) {
+    StatusMgr().UnsetShareStatus("photo", 1);
+    fake::SetQuota(false, out_of_space);
+    Reply(kRefusal);
+    const Error error = Thrown([] { IndexCommit("photo"); });
+    EXPECT_EQ(error.code(), 1003);
+    EXPECT_EQ(error.reason(), "Share (photo) space not enough");
+    EXPECT_EQ(StatusMgr().GetShareStatus("photo"), 3);
+  }
+}
+
+TEST_F(ElasticControlTest, AFailingQuotaServiceIsNoLackOfSpace) {
+  fake::SetQuota(false, 0x1234);
+  Reply(kRefusal);
+  EXPECT_EQ(Thrown([] { IndexCommit("photo"); }).code(), 1310);
+  EXPECT_EQ(StatusMgr().GetShareStatus("photo"), 0);
+}
+
+TEST_F(ElasticControlTest, AFailedTransportFailsTheCommitToo) {
+  fake::FailCall("SockConnection::Send");
+  const Error error = Thrown([] { IndexCommit("photo"); });
+  EXPECT_EQ(error.code(), 913);
+  EXPECT_EQ(error.reason(), "Send failed");
+}
+
+TEST_F(ElasticControlTest, AMarkThatCannotBeKeptIsTheError) {
+  test::WriteFile(kFileIndexStatusCfgPath, "not JSON");
   fake::SetQuota(false, 0x2900);
   Reply(kRefusal);
-  const Error error = Thrown([] { IndexCommit("photo"); });
-  EXPECT_EQ(error.code(), 1003);
-  EXPECT_EQ(error.reason(), "Share (photo) space not enough");
-  EXPECT_EQ(StatusMgr().GetShareStatus("photo"), 1);
+  EXPECT_EQ(Thrown([] { IndexCommit("photo"); }).code(), 504);
 }
 
 TEST_F(ElasticControlTest, AFailedCommitOfAShareThatIsGone) {

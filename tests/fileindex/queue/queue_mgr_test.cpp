@@ -328,6 +328,18 @@ TEST_F(QuestionTest, MalformedLineBeforeTheAnswerIsAnError) {
   EXPECT_EQ(Refusal([this] { Processing("/s/a"); }).code(), 120);
 }
 
+TEST_F(QuestionTest, ATornLastLineIsNoReindex) {
+  const std::string torn = "{\"event\":65536,\"pa";
+  WriteLive(Line(EVENT_MODIFY, "/s/a") + torn);
+  WriteTmp(Line(EVENT_REINDEX, "/s/b") + torn);
+  EXPECT_FALSE(WaitingFor("/s/a"));
+  EXPECT_TRUE(WaitingFor("/s/b"));
+  EXPECT_EQ(Refusal([this] { HasReindex("/s/b"); }).code(), 906);
+  EXPECT_EQ(Refusal([this] { Processing("/s/b"); }).code(), 906);
+  WriteLive(torn + "\n");
+  EXPECT_EQ(Refusal([this] { WaitingFor("/s/b"); }).code(), 906);
+}
+
 TEST_F(QuestionTest, MalformedLineBehindTheAnswerIsNotSeen) {
   WriteLive(Line(EVENT_REINDEX, "/s/a") + "rubbish\n");
   WriteTmp("rubbish\n");

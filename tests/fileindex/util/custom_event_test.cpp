@@ -2,10 +2,14 @@
 
 #include <gmock/gmock.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
+#include <sys/syscall.h>
 #include <unistd.h>
 
+#include <atomic>
+#include <cerrno>
 #include <cstring>
+#include <memory>
+#include <string>
 #include <thread>
 #include <vector>
 
@@ -17,6 +21,19 @@
 #include "fileindex/queue/event.h"
 #include "tests/fake_platform/fixture.h"
 #include "tests/support/files.h"
+
+namespace {
+
+std::atomic<bool> fail_ftruncate{false};
+
+}  // namespace
+
+// Takes the C library's place in this program, so that its failure can be watched.
+extern "C" int ftruncate(int fd, off_t size) noexcept {
+  if (!fail_ftruncate) return static_cast<int>(syscall(SYS_ftruncate, fd, size));
+  errno = EIO;
+  return -1;
+}
 
 namespace quarry::fileindex {
 namespace {
@@ -47,6 +64,7 @@ class CustomEventTest : public fake::FakePlatformTest {
     fake::AddShare("photo", "/volume1/photo");
     queue_ = fake::QueuePath("/volume1/photo");
   }
+  ~CustomEventTest() override { fail_ftruncate = false; }
 
   std::string Queue() const { return test::ReadFile(queue_); }
   void SetQueue(const std::string& text) const { test::WriteFile(queue_, text); }
@@ -107,11 +125,20 @@ TEST_F(CustomEventTest, TheQueueIsNeverTruncated) {
 }
 
 TEST_F(CustomEventTest, ATornLastLineIsEndedFirst) {
-  SetQueue(R"({"event":2,"path":"/volume1/photo/b"})");
+  const std::string line = R"({"event":2,"path":"/volume1/photo/b"})";
+  for (size_t cut = 1; cut <= line.size(); ++cut) {
+    SetQueue(line.substr(0, cut));
+    AddModest();
+    EXPECT_EQ(Queue(), line.substr(0, cut) + "\n" + kModestLine);
+  }
+  EXPECT_THAT(fake::Logs(), IsEmpty());
+  EXPECT_EQ(Status(), 0);
+}
+
+TEST_F(CustomEventTest, ATornReindexThatIsWholeCovers) {
+  SetQueue(R"({"event":65536,"path":"/volume1/photo"})");
   AddModest();
-  EXPECT_EQ(Queue(), R"({"event":2,"path":"/volume1/photo/b"})"
-                     "\n" +
-                         std::string(kModestLine));
+  EXPECT_EQ(Queue(), R"({"event":65536,"path":"/volume1/photo"})");
 }
 
 // ---- What a waiting reindex covers
@@ -154,6 +181,15 @@ TEST_F(CustomEventTest, AppendsUnderTheQueuesLock) {
   AddModest();
   EXPECT_EQ(lock, nullptr);
   EXPECT_EQ(Queue(), kModestLine);
+}
+
+TEST_F(CustomEventTest, AWaitingReindexIsSeenWithoutTheLock) {
+  AddCustomEvent(kReindex, "/volume1/photo", "", Json::Value());
+  const std::string queue = Queue();
+  const LockFile lock(queue_, true);
+  AddModest();
+  EXPECT_THAT(fake::Sleeps(), IsEmpty());
+  EXPECT_EQ(Queue(), queue);
 }
 
 TEST_F(CustomEventTest, WritersDoNotMixTheirLines) {
@@ -206,28 +242,58 @@ TEST_F(CustomEventTest, AQueueThatHasNoPathMarksTheShare) {
 }
 
 TEST_F(CustomEventTest, AMalformedQueueMarksTheShare) {
-  SetQueue("torn");
+  SetQueue("rubbish\n");
   const Error error = Thrown(AddModest);
   EXPECT_EQ(error.code(), 906);
-  EXPECT_EQ(error.reason(), "Malformed event_raw: torn");
-  EXPECT_EQ(Queue(), "torn");
-  EXPECT_EQ(fake::AnyLine(fake::Logs().back()), FailureLine(906, "Malformed event_raw: torn"));
+  EXPECT_EQ(error.reason(), "Malformed event_raw: rubbish");
+  EXPECT_EQ(Queue(), "rubbish\n");
+  EXPECT_EQ(fake::AnyLine(fake::Logs().back()), FailureLine(906, "Malformed event_raw: rubbish"));
   EXPECT_EQ(fake::LogRecords().back().priority, 3);
   EXPECT_EQ(Status(), 1);
 }
 
 TEST_F(CustomEventTest, TheMarkIsAddedToOtherBits) {
   StatusMgr().SetShareStatus("photo", 2);
-  SetQueue("torn");
+  SetQueue("rubbish\n");
   Thrown(AddModest);
   EXPECT_EQ(Status(), 3);
 }
 
 TEST_F(CustomEventTest, AQueueThatCannotBeLockedMarksTheShare) {
-  fake::SetQueuePath("/volume1/photo", RootedPath("/missing/queue"));
+  const std::string queue = RootedPath("/missing/queue");
+  fake::SetQueuePath("/volume1/photo", queue);
   const Error error = Thrown(AddModest);
   EXPECT_EQ(error.code(), 506);
+  const std::string reason = "open failed, path=" + queue + ", reason=" + strerror(ENOENT);
+  EXPECT_EQ(error.reason(), reason);
+  EXPECT_EQ(fake::AnyLine(fake::Logs().back()), FailureLine(506, reason));
   EXPECT_EQ(Status(), 1);
+}
+
+TEST_F(CustomEventTest, AQueueThatCannotBeReadMarksTheShare) {
+  SetQueue(kModestLine);
+  fake::FailSystemCall("open", 1, EACCES);
+  const Error error = Thrown(AddModest);
+  EXPECT_EQ(error.code(), 502);
+  EXPECT_EQ(error.reason(), std::string("Failed to open queue, reason=") + strerror(EACCES));
+  EXPECT_EQ(Queue(), kModestLine);
+  EXPECT_EQ(Status(), 1);
+}
+
+TEST_F(CustomEventTest, AnOldPathWithANulByteMarksTheShare) {
+  const std::string old_path = std::string("/volume1/photo/a\0b", 18);
+  const Error error =
+      Thrown([&] { AddCustomEvent(kRename, "/volume1/photo/new", old_path, Json::Value()); });
+  EXPECT_EQ(error.code(), 120);
+  EXPECT_EQ(error.reason(), "NUL byte in path: " + old_path);
+  EXPECT_NE(access(queue_.c_str(), F_OK), 0);
+  EXPECT_EQ(Status(), 1);
+}
+
+TEST_F(CustomEventTest, APathWithANulByteIsOfNoShare) {
+  const std::string path = std::string("/volume1/photo/a\0b", 18);
+  EXPECT_EQ(Thrown([&] { AddCustomEvent(kReindex, path, "", Json::Value()); }).code(), 502);
+  EXPECT_NE(access(queue_.c_str(), F_OK), 0);
 }
 
 TEST_F(CustomEventTest, AQueueThatCannotBeOpenedLosesTheEventSilently) {
@@ -259,8 +325,28 @@ TEST_F(CustomEventTest, AShortWriteIsCutBackAndMarksTheShare) {
   fake::FailSystemCall("write", 2, ENOSPC);
   const Error error = Thrown(AddModest);
   EXPECT_EQ(error.code(), 502);
-  EXPECT_EQ(error.reason(), std::string("write failed, reason=") + strerror(ENOSPC));
+  const std::string reason = std::string("write failed, reason=") + strerror(ENOSPC);
+  EXPECT_EQ(error.reason(), reason);
   EXPECT_EQ(Queue(), R"({"event":2,"path":"/volume1/photo/b"})");
+  ASSERT_THAT(fake::Logs(), SizeIs(1));
+  EXPECT_EQ(fake::AnyLine(fake::Logs().front()),
+            FailureLine(502, reason) + " [err: " + strerror(ENOSPC) + "]");
+  EXPECT_EQ(Status(), 1);
+}
+
+TEST_F(CustomEventTest, AShortWriteThatCannotBeCutBackIsLogged) {
+  SetQueue("");
+  fake::CutWrite(1, 7);
+  fake::FailSystemCall("write", 2, ENOSPC);
+  fail_ftruncate = true;
+  const Error error = Thrown(AddModest);
+  const std::string reason = std::string("write failed, reason=") + strerror(ENOSPC);
+  EXPECT_EQ(error.reason(), reason);
+  ASSERT_THAT(fake::Logs(), SizeIs(2));
+  EXPECT_EQ(fake::AnyLine(fake::Logs()[0]), fake::AnyLine(fake::LogHead("util", 1, "AppendLine")) +
+                                                "Failed [0 > ftruncate(fd, size)], reason: " +
+                                                queue_ + " [err: " + strerror(EIO) + "]");
+  EXPECT_EQ(fake::AnyLine(fake::Logs()[1]), FailureLine(502, reason));
   EXPECT_EQ(Status(), 1);
 }
 
@@ -273,7 +359,7 @@ TEST_F(CustomEventTest, AWriteThatWritesNothingMarksTheShare) {
 
 TEST_F(CustomEventTest, AStatusThatCannotBeKeptHidesNothing) {
   test::WriteFile(kFileIndexStatusCfgPath, "not JSON");
-  SetQueue("torn");
+  SetQueue("rubbish\n");
   EXPECT_EQ(Thrown(AddModest).code(), 906);
   EXPECT_EQ(
       fake::AnyLine(fake::Logs().back()),

@@ -3,14 +3,29 @@
 #include <gmock/gmock.h>
 
 #include <algorithm>
+#include <cstdint>
 #include <set>
 #include <sstream>
+#include <string>
 #include <vector>
 
 namespace quarry::fileindex {
 namespace {
 
 #include "fileindex/util/file_type_table.inc"
+
+// Tells any change of a text, the order of its parts included.
+std::uint64_t Fingerprint(const std::string& text) {
+  std::uint64_t hash = 0xcbf29ce484222325;
+  for (const char c : text) hash = (hash ^ static_cast<unsigned char>(c)) * 0x100000001b3;
+  return hash;
+}
+
+std::string Joined(const std::vector<std::string>& words, const std::string& separator) {
+  std::string text;
+  for (const std::string& word : words) text += (&word == &words.front() ? "" : separator) + word;
+  return text;
+}
 
 template <size_t size>
 std::vector<std::string> List(const char* const (&extensions)[size]) {
@@ -48,6 +63,18 @@ TEST(FileTypeTest, EachCategoryHasItsKeys) {
   EXPECT_EQ(std::size(kAudioExtensions), 25u);
   EXPECT_EQ(std::size(kVideoExtensions), 31u);
   EXPECT_EQ(std::size(kImageExtensions), 33u);
+}
+
+// The data must not change by accident, as by a slip of an editor.
+TEST(FileTypeTest, TheTableIsTheAgreedOne) {
+  EXPECT_EQ(Fingerprint(Joined(List(kDocumentExtensions), ",")), 0x16b8548d30c6c7c7u);
+  EXPECT_EQ(Fingerprint(Joined(List(kAudioExtensions), ",")), 0x4dcbd19a739b9e0eu);
+  EXPECT_EQ(Fingerprint(Joined(List(kVideoExtensions), ",")), 0x3c789791635a1b3bu);
+  EXPECT_EQ(Fingerprint(Joined(List(kImageExtensions), ",")), 0x96028cb2be6a6715u);
+}
+
+TEST(FileTypeTest, TheHelperOfExtensionsIsOneDefinition) {
+  EXPECT_EQ(&fileindex::GetFileExtension, &quarry::GetFileExtension);
 }
 
 TEST(FileTypeTest, ExtensionsAreLowerCaseWithoutDot) {
@@ -127,10 +154,15 @@ TEST(FileTypeQueryTest, Names) {
 
 TEST(FileTypeQueryTest, ThePiecesAreJoinedByOneBlank) {
   for (const FileTypeQuery* query : {&kDocumentQuery, &kAudioQuery, &kVideoQuery, &kImageQuery}) {
-    std::string joined;
-    for (const std::string& word : Words(*query)) joined += (joined.empty() ? "" : " OR ") + word;
-    EXPECT_EQ(query->query, joined);
+    EXPECT_EQ(query->query, Joined(Words(*query), " OR "));
   }
+}
+
+TEST(FileTypeQueryTest, TheTextsAreTheAgreedOnes) {
+  EXPECT_EQ(Fingerprint(kDocumentQuery.query), 0x00a881d58270bb1cu);
+  EXPECT_EQ(Fingerprint(kAudioQuery.query), 0xda39456df10f20d6u);
+  EXPECT_EQ(Fingerprint(kVideoQuery.query), 0x42d5637b82e0e7bbu);
+  EXPECT_EQ(Fingerprint(kImageQuery.query), 0x6467178ebac267e9u);
 }
 
 TEST(FileTypeQueryTest, Documents) {

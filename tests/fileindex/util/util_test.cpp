@@ -150,6 +150,22 @@ TEST_F(UtilTest, ShareOfAPathOutside) {
   sdk::SDKMutex().Unlock();
 }
 
+TEST_F(UtilTest, ShareNamesAndPathsOfAnyLengthThatFits) {
+  const std::string longest_name(491, 'n');
+  const std::string longest_path = "/" + std::string(4094, 'p');
+  std::string name;
+  std::string path;
+  fake::AddShare(longest_name, longest_path);
+  GetShareNamePathByFullPath(name, path, longest_path + "/a");
+  EXPECT_EQ(name, longest_name);
+  EXPECT_EQ(path, longest_path);
+  fake::AddShare(longest_name + "n", "/volume2/x");
+  EXPECT_EQ(Thrown([&] { GetShareNamePathByFullPath(name, path, "/volume2/x"); }).code(), 502);
+  fake::AddShare("y", longest_path + "p");
+  EXPECT_EQ(Thrown([&] { GetShareNamePathByFullPath(name, path, longest_path + "p"); }).code(),
+            502);
+}
+
 // ---- Text of paths
 
 TEST_F(UtilTest, HelpersOfPathsAreOneDefinition) {
