@@ -1,8 +1,11 @@
 # Flags that every target of this project is compiled with.
+add_library(quarry_plain_flags INTERFACE)
+target_include_directories(quarry_plain_flags INTERFACE ${PROJECT_SOURCE_DIR})
+target_compile_options(quarry_plain_flags INTERFACE -Wall -Wextra -Wpedantic -Wshadow -Wconversion
+                                                    $<$<BOOL:${QUARRY_WERROR}>:-Werror>)
+# All but what must run without a sanitizer has these.
 add_library(quarry_flags INTERFACE)
-target_include_directories(quarry_flags INTERFACE ${PROJECT_SOURCE_DIR})
-target_compile_options(quarry_flags INTERFACE -Wall -Wextra -Wpedantic -Wshadow -Wconversion
-                                              $<$<BOOL:${QUARRY_WERROR}>:-Werror>)
+target_link_libraries(quarry_flags INTERFACE quarry_plain_flags)
 if(QUARRY_SANITIZE)
   target_compile_options(quarry_flags INTERFACE -fsanitize=${QUARRY_SANITIZE} -fno-omit-frame-pointer
                                                 -fno-sanitize-recover=all -O1)
@@ -30,4 +33,16 @@ function(quarry_tests_in dir)
   foreach(source IN LISTS sources)
     quarry_test(${source} ${ARGN})
   endforeach()
+endfunction()
+
+# Installed programs find their libraries, and the libraries each other, wherever the tree is put.
+file(RELATIVE_PATH libraries_from_programs ${CMAKE_INSTALL_FULL_BINDIR} ${CMAKE_INSTALL_FULL_LIBDIR})
+set(CMAKE_INSTALL_RPATH $ORIGIN $ORIGIN/${libraries_from_programs})
+
+# quarry_exports(LIBRARY MAP) shows only what the version script MAP names. Hidden visibility alone
+# leaves instances of the standard library's templates visible.
+function(quarry_exports library map)
+  get_filename_component(absolute ${map} ABSOLUTE)
+  target_link_options(${library} PRIVATE LINKER:--version-script=${absolute})
+  set_property(TARGET ${library} APPEND PROPERTY LINK_DEPENDS ${absolute})
 endfunction()

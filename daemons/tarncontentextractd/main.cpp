@@ -13,6 +13,7 @@
 #include "daemons/common/single_instance.h"
 #include "daemons/common/socket_server.h"
 #include "daemons/common/stop_signal.h"
+#include "daemons/tarncontentextractd/sandbox.h"
 #include "daemons/tarncontentextractd/service.h"
 #include "daemons/tarncontentextractd/worker.h"
 
@@ -46,6 +47,9 @@ int Serve(std::size_t workers) {
       },
       options);
   server.WakeOn(stop.Fd());
+  if (!extract::kSandboxed) {
+    daemon::LogWarning("Built with a sanitizer: workers keep their rights. Use it for tests alone");
+  }
   daemon::LogInfo("Ready, with up to " + std::to_string(workers) + " workers");
   while (!stop.Requested()) server.Step(-1);
   server.Finish(kFinishMilliseconds);

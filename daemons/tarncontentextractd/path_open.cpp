@@ -6,10 +6,11 @@
 #include <sys/syscall.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <array>
 #include <cerrno>
 #include <climits>
 #include <cstdio>
-#include <string_view>
 #include <utility>
 
 namespace quarry::extract {
@@ -17,6 +18,9 @@ namespace {
 
 constexpr int kPlaceFlags = O_PATH | O_NOFOLLOW | O_CLOEXEC;
 constexpr int kDirectoryFlags = O_PATH | O_DIRECTORY | O_CLOEXEC;
+
+// As many as the system follows.
+constexpr int kMaxLinks = 40;
 
 // The usual case in one call: a path without any link.
 UniqueFd OpenWithoutLinks(const std::string& path) {
@@ -27,47 +31,70 @@ UniqueFd OpenWithoutLinks(const std::string& path) {
       static_cast<int>(syscall(SYS_openat2, AT_FDCWD, path.c_str(), &how, sizeof(how))));
 }
 
-bool IsTrustedLink(int parent, const std::string& name) {
-  struct stat status {};
-  if (fstatat(parent, name.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0) return false;
-  return S_ISLNK(status.st_mode) && (status.st_uid == 0 || status.st_uid == geteuid());
-}
+// Goes a path component by component: through links that are trusted, along paths longer than the
+// system takes, and on systems that do not know the one call.
+class Walk {
+ public:
+  explicit Walk(std::string path) : rest_(std::move(path)), place_(open("/", kDirectoryFlags)) {}
 
-// The directory `name` in `parent`.
-UniqueFd EnterDirectory(int parent, const std::string& name) {
-  UniqueFd directory(openat(parent, name.c_str(), kDirectoryFlags | O_NOFOLLOW));
-  if (directory.valid() || (errno != ENOTDIR && errno != ELOOP)) return directory;
-  const int error = errno;
-  if (IsTrustedLink(parent, name)) return UniqueFd(openat(parent, name.c_str(), kDirectoryFlags));
-  struct stat status {};
-  const bool link =
-      fstatat(parent, name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 && S_ISLNK(status.st_mode);
-  errno = link ? ELOOP : error;
-  return UniqueFd();
-}
-
-// The next component of `rest`, which is moved behind it; "" at the end.
-std::string TakeComponent(std::string_view* rest) {
-  while (!rest->empty() && rest->front() == '/') rest->remove_prefix(1);
-  std::string component(rest->substr(0, rest->find('/')));
-  rest->remove_prefix(component.size());
-  return component;
-}
-
-// Component by component: through links that are trusted, along paths longer than the system takes,
-// and on systems that do not know the one call.
-UniqueFd OpenStepwise(const std::string& path) {
-  std::string_view rest = path;
-  UniqueFd place(open("/", kDirectoryFlags));
-  std::string name = TakeComponent(&rest);
-  while (place.valid() && !name.empty()) {
-    std::string next = TakeComponent(&rest);
-    place = next.empty() ? UniqueFd(openat(place.get(), name.c_str(), kPlaceFlags))
-                         : EnterDirectory(place.get(), name);
-    name = std::move(next);
+  UniqueFd ToEnd() {
+    std::string name = TakeComponent();
+    while (place_.valid() && !name.empty() && !AtEnd()) {
+      place_ = Enter(name);
+      name = TakeComponent();
+    }
+    if (!place_.valid() || name.empty()) return std::move(place_);
+    return UniqueFd(openat(place_.get(), name.c_str(), kPlaceFlags));
   }
-  return place;
-}
+
+ private:
+  bool AtEnd() const { return rest_.find_first_not_of('/', at_) == std::string::npos; }
+
+  // The next component, "" at the end.
+  std::string TakeComponent() {
+    at_ = std::min(rest_.find_first_not_of('/', at_), rest_.size());
+    const std::size_t end = std::min(rest_.find('/', at_), rest_.size());
+    return rest_.substr(std::exchange(at_, end), end - at_);
+  }
+
+  // The directory `name` in the place reached; where that is a link, the place where the way goes
+  // on.
+  UniqueFd Enter(const std::string& name) {
+    UniqueFd directory(openat(place_.get(), name.c_str(), kDirectoryFlags | O_NOFOLLOW));
+    if (directory.valid() || (errno != ENOTDIR && errno != ELOOP)) return directory;
+    const UniqueFd link(openat(place_.get(), name.c_str(), kPlaceFlags));
+    struct stat status {};
+    if (!link.valid() || fstat(link.get(), &status) != 0) return UniqueFd();
+    if (!S_ISLNK(status.st_mode)) return Refuse(ENOTDIR);
+    if (!IsTrusted(status) || ++links_ > kMaxLinks) return Refuse(ELOOP);
+    return Follow(link.get());
+  }
+
+  // What the link says is walked in front of what is left, by the same rules: nothing can be put in
+  // its place between looking at it and going through it.
+  UniqueFd Follow(int link) {
+    std::array<char, PATH_MAX> target;
+    const ssize_t size = readlinkat(link, "", target.data(), target.size());
+    if (size <= 0) return UniqueFd();
+    rest_ = std::string(target.data(), static_cast<std::size_t>(size)) + rest_.substr(at_);
+    at_ = 0;
+    return rest_[0] == '/' ? UniqueFd(open("/", kDirectoryFlags)) : std::move(place_);
+  }
+
+  static bool IsTrusted(const struct stat& link) {
+    return link.st_uid == 0 || link.st_uid == geteuid();
+  }
+
+  static UniqueFd Refuse(int error) {
+    errno = error;
+    return UniqueFd();
+  }
+
+  std::string rest_;
+  std::size_t at_ = 0;
+  UniqueFd place_;
+  int links_ = 0;
+};
 
 }  // namespace
 
@@ -78,7 +105,7 @@ UniqueFd OpenPlace(const std::string& path) {
     // What is not there is not there; all else is worth another look, step by step.
     if (errno == ENOENT) return place;
   }
-  return OpenStepwise(path);
+  return Walk(path).ToEnd();
 }
 
 UniqueFd OpenForReading(int place) {

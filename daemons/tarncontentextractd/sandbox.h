@@ -9,7 +9,8 @@
 #if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
 #define QUARRY_SANITIZED_BUILD 1
 #elif defined(__has_feature)
-#if __has_feature(address_sanitizer) || __has_feature(thread_sanitizer)
+#if __has_feature(address_sanitizer) || __has_feature(thread_sanitizer) || \
+    __has_feature(memory_sanitizer)
 #define QUARRY_SANITIZED_BUILD 1
 #endif
 #endif
@@ -17,7 +18,8 @@
 namespace quarry::extract {
 
 // Sanitizers reserve terabytes of addresses and make system calls of their own: programs built with
-// one parse in workers that are not closed off. Such a build is for tests alone.
+// one parse in workers that are not closed off, and the daemon says so. Such a build is for tests
+// alone, and those of the sandbox itself use a worker that is built without a sanitizer.
 #ifdef QUARRY_SANITIZED_BUILD
 inline constexpr bool kSandboxed = false;
 #else

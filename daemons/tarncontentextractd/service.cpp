@@ -62,7 +62,8 @@ bool ExtractService::AddContent(const std::string& path, int place, const Attrib
   const std::string stamp = AttributeStamp(attributes.status);
   if (bad_files_.Contains(path, stamp)) return true;
   const UniqueFd file = OpenForReading(place);
-  if (!file.valid()) return errno != EMFILE && errno != ENFILE && errno != ENOMEM;
+  // Whatever else stands in the way (a lease, a full table of files, a lost server) may pass.
+  if (!file.valid()) return errno == EACCES || errno == EPERM;
   std::vector<Field> fields;
   switch (pool_.Parse(file.get(), GetFileExtension(path, true), path, &fields)) {
     case PoolOutcome::kDone:
@@ -106,7 +107,7 @@ Json::Value ExtractService::Answer(const std::string& request) {
   GetJsonValue(data, json, "data", true);
   GetJsonValue(path, data, "path", true);
   GetJsonValue(options, data, "options", false);
-  GetJsonValue(need_meta, options, "need_meta", false);
+  GetJsonValue(need_meta, options, "need_meta", isObject(options) && options.isMember("need_meta"));
   Json::Value answer(Json::objectValue);
   answer["data"] = ParseFile(path, need_meta);
   answer["success"] = true;

@@ -16,7 +16,6 @@ constexpr std::size_t kReadStep = std::size_t{1} << 20;
 
 Source Source::OfBytes(std::string bytes, std::string extension) {
   Source source(-1, std::move(extension));
-  source.truncated_ = bytes.size() > kMaxFileBytes;
   source.bytes_ = std::move(bytes);
   source.at_end_ = true;
   return source;
@@ -41,8 +40,7 @@ std::string_view Source::Head() {
 }
 
 std::string_view Source::Bytes() {
-  ReadUpTo(kMaxFileBytes + 1);
-  if (bytes_.size() > kMaxFileBytes) truncated_ = true;
+  ReadUpTo(kMaxFileBytes);
   return std::string_view(bytes_).substr(0, kMaxFileBytes);
 }
 

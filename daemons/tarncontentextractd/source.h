@@ -29,9 +29,6 @@ class Source {
   std::string_view Head();
   // The first kMaxFileBytes. Valid as long as the object.
   std::string_view Bytes();
-  // Whether Bytes() is not the whole file. Known after Bytes().
-  bool Truncated() const { return truncated_; }
-
   // For libraries that read for themselves; -1 for bytes.
   int fd() const { return fd_; }
   const std::string& extension() const { return extension_; }
@@ -43,7 +40,6 @@ class Source {
   std::string extension_;
   std::string bytes_;
   bool at_end_ = false;
-  bool truncated_ = false;
 };
 
 }  // namespace quarry::extract

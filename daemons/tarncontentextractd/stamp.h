@@ -17,9 +17,12 @@ inline constexpr int kExtractorVersion = 1;
 inline constexpr char kAttributeStampField[] = "QuarryAttributeStamp";
 inline constexpr char kContentStampField[] = "QuarryContentStamp";
 
-// A time in nanoseconds since 1970.
+// A time in nanoseconds since 1970. Beyond the year 2262, which a file may claim, it wraps around:
+// a stamp need only be another one for another time.
 inline std::string NanosecondText(std::int64_t seconds, std::int64_t nanoseconds) {
-  return std::to_string(seconds * 1000000000 + nanoseconds);
+  const std::uint64_t wrapped =
+      static_cast<std::uint64_t>(seconds) * 1000000000 + static_cast<std::uint64_t>(nanoseconds);
+  return std::to_string(static_cast<std::int64_t>(wrapped));
 }
 
 // "dev:inode:size:mtime_ns:ctime_ns" of what lstat() says. It differs when anything that a document

@@ -157,6 +157,11 @@ WorkerOutcome WorkerProcess::WaitReadable(Deadline deadline) const {
   return ready == 0 ? WorkerOutcome::kTimedOut : WorkerOutcome::kDied;
 }
 
+bool WorkerProcess::HasSpoken() const {
+  char byte = 0;
+  return recv(channel_.get(), &byte, sizeof(byte), MSG_PEEK | MSG_DONTWAIT) >= 0;
+}
+
 WorkerOutcome WorkerProcess::ReadAll(char* buffer, std::size_t size, Deadline deadline) {
   while (size > 0) {
     const WorkerOutcome outcome = WaitReadable(deadline);
@@ -186,7 +191,9 @@ WorkerOutcome WorkerProcess::ReadMessage(std::string* text, Deadline deadline) {
 WorkerOutcome WorkerProcess::Parse(int file, const std::string& extension, milliseconds timeout,
                                    std::vector<Field>* out) {
   out->clear();
-  if (!SendRequest(channel_.get(), extension, file)) return WorkerOutcome::kDied;
+  // What comes before it is asked for, or where nothing is taken, comes from no worker of ours. Its
+  // next answer would be taken for one about this file.
+  if (HasSpoken() || !SendRequest(channel_.get(), extension, file)) return WorkerOutcome::kDied;
   std::string answer;
   const WorkerOutcome outcome = ReadMessage(&answer, Clock::now() + timeout);
   if (outcome != WorkerOutcome::kDone) return outcome;

@@ -56,6 +56,7 @@ class WorkerProcess {
   void Spawn(const std::vector<std::string>& command, int channel);
   WorkerOutcome ReadAll(char* buffer, std::size_t size, Deadline deadline);
   WorkerOutcome ReadMessage(std::string* text, Deadline deadline);
+  bool HasSpoken() const;
   WorkerOutcome WaitReadable(Deadline deadline) const;
 
   pid_t pid_ = -1;

@@ -176,7 +176,7 @@ bool SendRequest(int channel, const std::string& extension, int file) {
   Attach(&message, &attachment, file);
   ssize_t count = 0;
   do {
-    count = sendmsg(channel, &message, MSG_NOSIGNAL);
+    count = sendmsg(channel, &message, MSG_NOSIGNAL | MSG_DONTWAIT);
   } while (count < 0 && errno == EINTR);
   // So few bytes fit the socket's buffer whole: a worker that waits has emptied it.
   return count == static_cast<ssize_t>(text.size());

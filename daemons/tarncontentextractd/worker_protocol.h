@@ -33,8 +33,12 @@ std::string EncodeFields(const std::vector<Field>& fields);
 // within the bounds of extractor.h.
 bool DecodeFields(std::string_view bytes, std::vector<Field>* out);
 
-// Each blocks until all is through, and returns false when the peer is gone or breaks the rules.
+// The daemon's: does not block, since a worker that waits has emptied its channel. Returns false
+// when the worker is gone or does not take the request.
 bool SendRequest(int channel, const std::string& extension, int file);
+
+// The worker's: each blocks until all is through, and returns false when the daemon is gone or
+// breaks the rules.
 bool ReceiveRequest(int channel, std::string* extension, UniqueFd* file);
 bool SendAnswer(int channel, std::string_view text);
 

@@ -5,6 +5,10 @@
 #include <unicode/ucnv.h>
 #include <unicode/ustring.h>
 
+#include <algorithm>
+#include <fstream>
+#include <stdexcept>
+
 #include "daemons/tarncontentextractd/worker.h"
 
 namespace quarry::extract {
@@ -50,7 +54,26 @@ bool IsValidUtf8(const std::string& text) {
 }
 
 UniqueFd OpenToRead(const std::string& path) {
-  return UniqueFd(open(path.c_str(), O_RDONLY | O_CLOEXEC));
+  UniqueFd file(open(path.c_str(), O_RDONLY | O_CLOEXEC));
+  if (!file.valid()) throw std::runtime_error("cannot open " + path);
+  return file;
+}
+
+std::vector<std::string> HostileWorker(const std::string& mode) {
+  return {QUARRY_HOSTILE_WORKER, mode};
+}
+
+std::vector<std::string> RealWorker() {
+  return {QUARRY_EXTRACTOR, "--worker"};
+}
+
+std::string ProcessStatus(pid_t pid, const std::string& key) {
+  std::ifstream status("/proc/" + std::to_string(pid) + "/status");
+  for (std::string line; std::getline(status, line);) {
+    if (line.compare(0, key.size() + 1, key + ":") != 0) continue;
+    return line.substr(std::min(line.find_first_not_of(" \t", key.size() + 1), line.size()));
+  }
+  return std::string();
 }
 
 }  // namespace quarry::extract

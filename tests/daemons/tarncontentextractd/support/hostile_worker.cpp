@@ -5,8 +5,11 @@
 #include <signal.h>
 #include <sys/mman.h>
 #include <sys/ptrace.h>
+#include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
+#include <sys/un.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -31,6 +34,37 @@ std::string Result(long result) {
   return result < 0 ? std::string("refused: ") + strerrorname_np(errno) : "possible";
 }
 
+long RaiseLimit() {
+  const rlimit none{RLIM_INFINITY, RLIM_INFINITY};
+  return setrlimit(RLIMIT_AS, &none);
+}
+
+long MapCode() {
+  return mmap(nullptr, 4096, PROT_READ | PROT_EXEC, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0) ==
+                 MAP_FAILED
+             ? -1
+             : 0;
+}
+
+long Connect() {
+  const sockaddr_un address{AF_UNIX, "/dev/log"};
+  return connect(kWorkerChannel, reinterpret_cast<const sockaddr*>(&address), sizeof(address));
+}
+
+long Stat() {
+  struct stat status {};
+  return stat("/etc/passwd", &status);
+}
+
+// All that this process holds open.
+std::string Descriptors() {
+  std::string held;
+  for (int fd = 0; fd < 1024; ++fd) {
+    if (lseek(fd, 0, SEEK_CUR) >= 0 || errno != EBADF) held += std::to_string(fd) + " ";
+  }
+  return held;
+}
+
 std::string Try(const std::string& what, Source& source) {
   char* const none[] = {nullptr};
   if (what == "socket") return Result(socket(AF_INET, SOCK_STREAM, 0));
@@ -45,7 +79,19 @@ std::string Try(const std::string& what, Source& source) {
   if (what == "kill") return Result(kill(getppid(), SIGTERM));
   if (what == "trace") return Result(ptrace(PTRACE_ATTACH, getppid(), nullptr, nullptr));
   if (what == "root") return Result(setuid(0));
-  if (what == "limit") return Result(nice(-1));
+  if (what == "nice") return Result(nice(-1));
+  if (what == "limit") return Result(RaiseLimit());
+  if (what == "code") return Result(MapCode());
+  if (what == "remove") return Result(unlink("/tmp/planted"));
+  if (what == "move") return Result(rename("/tmp/planted", "/tmp/elsewhere"));
+  if (what == "directory") return Result(mkdir("/tmp/planted", 0700));
+  if (what == "talk") return Result(write(STDERR_FILENO, "x", 1));
+  if (what == "connect") return Result(Connect());
+  if (what == "send") return Result(send(kWorkerChannel, "x", 1, MSG_NOSIGNAL));
+  if (what == "stat") return Result(Stat());
+  if (what == "list") return Result(syscall(SYS_getdents64, source.fd(), nullptr, 0));
+  if (what == "descriptors") return Descriptors();
+  if (what == "pid") return std::to_string(getpid());
   return "unknown";
 }
 
@@ -72,7 +118,8 @@ class HostileExtractor : public Extractor {
 
   void Extract(Source& source, Extraction& out) const override {
     const std::string& what = source.extension();
-    ++files_seen;
+    // A worker first tries its formats on bytes of its own.
+    if (source.fd() >= 0) ++files_seen;
     if (what == "crash") raise(SIGSEGV);
     if (what == "abort") std::abort();
     if (what == "leave") _exit(0);
@@ -82,6 +129,7 @@ class HostileExtractor : public Extractor {
     if (what == "throw") Throw(out);
     if (what == "garbage") SendAnswer(kWorkerChannel, "no fields at all");
     if (what == "endless") ClaimMuch();
+    if (what == "ahead") AnswerTwice();
     if (what == "usedcrash" && files_seen > 1) raise(SIGKILL);
     if (what == "good" || what == "usedcrash") out.text().Append(source.Bytes());
     out.Set(kTitleField, Try(what, source));
@@ -94,6 +142,12 @@ class HostileExtractor : public Extractor {
   static void Throw(Extraction& out) {
     out.text().Append("what was found before");
     throw std::runtime_error("broken file");
+  }
+  // So that what comes next is one answer late.
+  static void AnswerTwice() {
+    const std::string answer = MakeMessage(EncodeFields({{kTitleField, std::string("early")}}));
+    const std::string both = answer + answer;
+    if (write(kWorkerChannel, both.data(), both.size()) < 0) _exit(1);
   }
   // Claims an answer of 4 GiB.
   [[noreturn]] static void ClaimMuch() {

@@ -1,0 +1,196 @@
+#include "daemons/tarncontentextractd/worker_protocol.h"
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+
+#include <cstring>
+#include <limits>
+#include <random>
+#include <thread>
+
+#include "tests/daemons/tarncontentextractd/support/extract_support.h"
+
+namespace quarry::extract {
+namespace {
+
+std::vector<Field> Sample() {
+  return {{"TARNMDTitle", std::string("caf\xC3\xA9")},
+          {"TARNMDTextContent", std::string()},
+          {"TARNMDRecordingYear", std::int64_t{-5}},
+          {"TARNMDDurationSecond", 2.5}};
+}
+
+bool Decodes(const std::vector<Field>& fields) {
+  std::vector<Field> out{{"TARNMDStale", std::string()}};
+  const bool good = DecodeFields(EncodeFields(fields), &out);
+  EXPECT_EQ(out.size(), good ? fields.size() : 0);
+  return good;
+}
+
+TEST(Fields, AreReadAsTheyWereWritten) {
+  std::vector<Field> out;
+  ASSERT_TRUE(DecodeFields(EncodeFields(Sample()), &out));
+  EXPECT_EQ(ToMap(out), ToMap(Sample()));
+  EXPECT_TRUE(DecodeFields("", &out));
+  EXPECT_TRUE(out.empty());
+}
+
+TEST(Fields, CutAnywhereAreRefusedOrFewer) {
+  const std::string whole = EncodeFields(Sample());
+  for (std::size_t size = 0; size < whole.size(); ++size) {
+    std::vector<Field> out;
+    if (DecodeFields(whole.substr(0, size), &out)) {
+      EXPECT_LT(out.size(), Sample().size());
+    } else {
+      EXPECT_TRUE(out.empty());
+    }
+  }
+}
+
+TEST(Fields, WithNamesOfNoFieldAreRefused) {
+  for (const char* name : {"", "title", "tarnmdTitle", "TARNMDTi tle", "TARNMD1", "XTARNMDTitle",
+                           "TARNMDTitle_", "QuarryAttributeStamp"}) {
+    EXPECT_FALSE(Decodes({{name, std::string("x")}})) << name;
+  }
+  EXPECT_TRUE(Decodes({{"TARNMD" + std::string(58, 'x'), std::string("x")}}));
+  EXPECT_FALSE(Decodes({{"TARNMD" + std::string(59, 'x'), std::string("x")}}));
+}
+
+TEST(Fields, WithTextThatIsNoneAreRefused) {
+  for (const char* text : {"\xFF", "\xC3", "\xED\xA0\x80", "\xC0\x80"}) {
+    EXPECT_FALSE(Decodes({{"TARNMDTitle", std::string(text)}}));
+  }
+  EXPECT_FALSE(Decodes({{"TARNMDTitle", std::string("\0", 1)}}));
+}
+
+TEST(Fields, WithNumbersThatAreNoneAreRefused) {
+  EXPECT_FALSE(Decodes({{"TARNMDDurationSecond", std::numeric_limits<double>::quiet_NaN()}}));
+  EXPECT_FALSE(Decodes({{"TARNMDDurationSecond", std::numeric_limits<double>::infinity()}}));
+  EXPECT_TRUE(Decodes({{"TARNMDISOSpeed", std::numeric_limits<std::int64_t>::min()}}));
+}
+
+TEST(Fields, AreBoundedInNumberAndSize) {
+  // The text comes on top of the other fields.
+  EXPECT_TRUE(Decodes(std::vector<Field>(kMaxFields + 1, {"TARNMDTitle", std::int64_t{1}})));
+  EXPECT_FALSE(Decodes(std::vector<Field>(kMaxFields + 2, {"TARNMDTitle", std::int64_t{1}})));
+  EXPECT_TRUE(Decodes({{"TARNMDTextContent", std::string(kMaxTextBytes, 'x')}}));
+  EXPECT_FALSE(Decodes({{"TARNMDTextContent", std::string(kMaxTextBytes + 1, 'x')}}));
+}
+
+TEST(Fields, OfUnknownKindAreRefused) {
+  std::string bytes = EncodeFields({{"TARNMDTitle", std::int64_t{1}}});
+  const std::size_t kind = sizeof(std::uint32_t) + std::strlen("TARNMDTitle");
+  for (int value = 3; value < 256; ++value) {
+    bytes[kind] = static_cast<char>(value);
+    std::vector<Field> out;
+    EXPECT_FALSE(DecodeFields(bytes, &out)) << value;
+  }
+}
+
+TEST(Fields, ChangedAtRandomNeverBreakTheReader) {
+  std::mt19937 random(7);
+  const std::string whole = EncodeFields(Sample());
+  for (int round = 0; round < 20000; ++round) {
+    std::string bytes = whole;
+    for (auto changes = 1 + random() % 4; changes > 0; --changes) {
+      bytes[random() % bytes.size()] = static_cast<char>(random());
+    }
+    std::vector<Field> out;
+    if (!DecodeFields(bytes, &out)) continue;
+    for (const auto& [name, value] : ToMap(out)) {
+      EXPECT_EQ(name.substr(0, 6), "TARNMD");
+      EXPECT_TRUE(IsValidUtf8(value));
+    }
+  }
+}
+
+class Channel : public ::testing::Test {
+ protected:
+  Channel() {
+    int ends[2] = {-1, -1};
+    EXPECT_EQ(socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends), 0);
+    daemon_.Reset(ends[0]);
+    worker_.Reset(ends[1]);
+  }
+  void Write(const std::string& bytes) {
+    ASSERT_EQ(write(daemon_.get(), bytes.data(), bytes.size()), static_cast<ssize_t>(bytes.size()));
+  }
+  bool Receive() { return ReceiveRequest(worker_.get(), &extension_, &file_); }
+
+  UniqueFd daemon_;
+  UniqueFd worker_;
+  std::string extension_;
+  UniqueFd file_;
+};
+
+TEST_F(Channel, ARequestBringsTheFileItself) {
+  const UniqueFd null = OpenToRead("/dev/null");
+  ASSERT_TRUE(SendRequest(daemon_.get(), "txt", null.get()));
+  ASSERT_TRUE(Receive());
+  EXPECT_EQ(extension_, "txt");
+  struct stat sent {};
+  struct stat received {};
+  ASSERT_EQ(fstat(null.get(), &sent), 0);
+  ASSERT_EQ(fstat(file_.get(), &received), 0);
+  EXPECT_EQ(sent.st_rdev, received.st_rdev);
+  EXPECT_EQ(fcntl(file_.get(), F_GETFD) & FD_CLOEXEC, FD_CLOEXEC);
+}
+
+TEST_F(Channel, ExtensionsAreOfAnyBytesAndCutAtTheirBound) {
+  const UniqueFd null = OpenToRead("/dev/null");
+  for (const std::string& extension :
+       {std::string(), std::string("\xFF\0\n", 3), std::string(kMaxExtensionBytes, 'x')}) {
+    ASSERT_TRUE(SendRequest(daemon_.get(), extension, null.get()));
+    ASSERT_TRUE(Receive());
+    EXPECT_EQ(extension_, extension);
+  }
+  ASSERT_TRUE(SendRequest(daemon_.get(), std::string(1000, 'x'), null.get()));
+  ASSERT_TRUE(Receive());
+  EXPECT_EQ(extension_, std::string(kMaxExtensionBytes, 'x'));
+}
+
+TEST_F(Channel, ARequestWithoutAFileIsNone) {
+  Write(MakeMessage("txt"));
+  EXPECT_FALSE(Receive());
+}
+
+TEST_F(Channel, ARequestThatIsTooLongIsNone) {
+  Write(MakeMessage(std::string(kMaxExtensionBytes + 1, 'x')));
+  EXPECT_FALSE(Receive());
+}
+
+TEST_F(Channel, ARequestThatEndsEarlyIsNone) {
+  Write(MakeMessage("txt").substr(0, 6));
+  daemon_.Reset();
+  EXPECT_FALSE(Receive());
+  EXPECT_FALSE(Receive());
+}
+
+TEST_F(Channel, AWorkerThatTakesNothingDoesNotHoldTheDaemonUp) {
+  const UniqueFd null = OpenToRead("/dev/null");
+  int sent = 0;
+  while (sent < 1000000 && SendRequest(daemon_.get(), "txt", null.get())) ++sent;
+  EXPECT_GT(sent, 0);
+  EXPECT_LT(sent, 1000000);
+}
+
+TEST_F(Channel, AWorkerThatIsGoneIsNoticed) {
+  const UniqueFd null = OpenToRead("/dev/null");
+  worker_.Reset();
+  EXPECT_FALSE(SendRequest(daemon_.get(), "txt", null.get()));
+}
+
+TEST_F(Channel, ALongAnswerArrivesWhole) {
+  const std::string text(std::size_t{4} << 20, 'x');
+  std::thread sender([&] { EXPECT_TRUE(SendAnswer(worker_.get(), text)); });
+  std::string received(text.size() + sizeof(std::uint32_t), '\0');
+  EXPECT_EQ(recv(daemon_.get(), received.data(), received.size(), MSG_WAITALL),
+            static_cast<ssize_t>(received.size()));
+  sender.join();
+  EXPECT_TRUE(received == MakeMessage(text));
+}
+
+}  // namespace
+}  // namespace quarry::extract
