@@ -72,8 +72,8 @@ void CheckBatch(const Json::Value& response, const Json::Value& compound) {
   }
 }
 
-Json::Value Member(const Json::Value& value, const char* key) {
-  return isObject(value) ? value[key] : Json::Value();
+const Json::Value& Member(const Json::Value& value, const char* key) {
+  return isObject(value) ? value[key] : Json::Value::nullSingleton();
 }
 
 // For a log line: a batch, for example, has neither a command nor an index.

@@ -13,8 +13,8 @@ namespace quarry::fileindex {
 
 // Sends {"type": command, "data": data} to the index daemon and waits until it has answered; the
 // answer itself is discarded. Throws Error 502 on failure: no daemon, or one that takes nothing for
-// a second. Blocks for up to about 5 seconds while the daemon's socket is missing, and without limit
-// for the answer. May be called from several threads at once.
+// a second. Blocks for up to about 5 seconds while the daemon's socket is missing, and without
+// limit for the answer. May be called from several threads at once.
 QUARRY_EXPORT void SendCommandToDaemon(const std::string& command, const Json::Value& data);
 
 // Reads exactly `len` bytes into `buf`, whose owner is the caller. Blocks until all have arrived:

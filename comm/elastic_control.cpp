@@ -2,6 +2,7 @@
 
 #include <exception>
 #include <stdexcept>
+#include <utility>
 
 #include "comm/built_in.h"
 #include "comm/comm.h"
@@ -35,10 +36,10 @@ Json::Value IndexData(const std::string& share) {
   return data;
 }
 
-Json::Value MakeRequest(const char* command, const Json::Value& data) {
+Json::Value MakeRequest(const char* command, Json::Value data) {
   Json::Value request(Json::objectValue);
   request["command"] = command;
-  request["data"] = data;
+  request["data"] = std::move(data);
   return request;
 }
 
@@ -48,18 +49,17 @@ Json::Value EmptyBatch() {
   return batch;
 }
 
-void Send(const char* command, const Json::Value& data) {
+void Send(const char* command, Json::Value data) {
   Json::Value response;
-  SendRequest(response, MakeRequest(command, data));
+  SendRequest(response, MakeRequest(command, std::move(data)));
 }
 
 // What a document command carries; "data" is left out where `document` is null.
-Json::Value DocumentData(const std::string& id, const std::string& path,
-                         const Json::Value& document) {
+Json::Value DocumentData(const std::string& id, const std::string& path, Json::Value document) {
   Json::Value data(Json::objectValue);
   data["id"] = id;
   data["doc_id"] = path;
-  if (!document.isNull()) data["data"] = document;
+  if (!document.isNull()) data["data"] = std::move(document);
   return data;
 }
 
@@ -77,7 +77,7 @@ Json::Value QueryBelow(const std::string& id, const std::string& dir,
   data["query"] = BelowQuery(dir);
   data["query"]["load_field"] = Vec2JsonArr(fields);
   Json::Value response;
-  SendRequest(response, MakeRequest("document_get_by_query", data));
+  SendRequest(response, MakeRequest("document_get_by_query", std::move(data)));
   return response;
 }
 
@@ -190,7 +190,7 @@ void ShareIndexCreate(const std::string& share) {
   data["settings"] = GetFileIndexSettings();
   data["mappings"] = GetFileIndexMappings();
   data["event_handler"] = GetFileIndexEventHandler();
-  Send("index_create", data);
+  Send("index_create", std::move(data));
 }
 
 void ShareIndexDelete(const std::string& share) {
@@ -210,13 +210,13 @@ void ShareIndexRename(const std::string& old_share, const std::string& new_share
   Json::Value data = IndexData(old_share);
   data["data"] = IndexData(new_share);
   data["data"]["path"] = new_db_path;
-  Send("index_config_set", data);
+  Send("index_config_set", std::move(data));
 }
 
 void ShareIndexMigrate(const std::string& share, const std::string& new_db_path) {
   Json::Value data = IndexData(share);
   data["data"]["path"] = new_db_path;
-  Send("index_config_set", data);
+  Send("index_config_set", std::move(data));
 }
 
 void IndexDel(const std::string& share, const std::string& path) {
@@ -226,7 +226,7 @@ void IndexDel(const std::string& share, const std::string& path) {
 void IndexDelDir(const std::string& share, const std::string& dir) {
   Json::Value data = IndexData(share);
   data["query"] = BelowQuery(dir);
-  Send("document_del_by_query", data);
+  Send("document_del_by_query", std::move(data));
 }
 
 void IndexUpsert(const std::string& share, const std::string& path, bool need_meta) {
@@ -279,7 +279,7 @@ void UpdateTermSuggestion(const std::string& db_name, const std::vector<std::str
     Json::Value data(Json::objectValue);
     data["doc_id_field"] = field;
     data["db_name"] = db_name;
-    batch["compound"].append(MakeRequest("update_term_suggestion", data));
+    batch["compound"].append(MakeRequest("update_term_suggestion", std::move(data)));
   }
   Json::Value response;
   SendRequest(response, batch);
