@@ -8,6 +8,7 @@
 #include <iterator>
 
 #include "platform/include/filesystem.h"
+#include "platform/linux/keep_errno.h"
 #include "platform/linux/last_error.h"
 
 namespace quarry::platform {
@@ -39,6 +40,7 @@ int TARNACLPermGet(const char* path) {
   if (path == nullptr || faccessat(AT_FDCWD, path, F_OK, AT_EACCESS) != 0) {
     return QUARRY_PLATFORM_FAIL(kErrNotFound);
   }
+  const KeepErrno keep;
   int bits = 0;
   for (const int bit : kPermissionBits) {
     if (faccessat(AT_FDCWD, path, bit, AT_EACCESS) == 0) bits |= bit;

@@ -7,6 +7,8 @@
 #include <cerrno>
 #include <cstddef>
 
+#include "platform/linux/keep_errno.h"
+
 namespace quarry::platform {
 namespace {
 
@@ -17,6 +19,7 @@ constexpr int kMaxGroups = 65536;
 // Asks `lookup(record, buffer, size, &result)` with buffers that grow until the entry fits.
 template <typename Record, typename Lookup>
 bool LookUp(Record* record, std::vector<char>* buffer, const Lookup& lookup) {
+  const KeepErrno keep;
   for (std::size_t size = kFirstBuffer; size <= kLastBuffer; size *= 4) {
     buffer->resize(size);
     Record* result = nullptr;
@@ -43,6 +46,16 @@ std::vector<gid_t> GroupsOf(const char* name, gid_t primary) {
   }
 }
 
+// The caller where no account has its number, as in a container. Its name is the number.
+Account NamelessCaller() {
+  Account account;
+  account.name = std::to_string(geteuid());
+  account.uid = geteuid();
+  account.gid = getegid();
+  account.groups = {account.gid};
+  return account;
+}
+
 void Fill(const passwd& entry, Account* account) {
   account->name = entry.pw_name;
   account->uid = entry.pw_uid;
@@ -60,7 +73,8 @@ bool FindAccount(const std::string& name, Account* account) {
     return getpwnam_r(name.c_str(), e, b, n, r);
   });
   if (found) Fill(entry, account);
-  return found;
+  return found || (name == std::to_string(geteuid()) && FindAccountByUid(geteuid(), account) &&
+                   account->name == name);
 }
 
 bool FindAccountByUid(uid_t uid, Account* account) {
@@ -69,8 +83,12 @@ bool FindAccountByUid(uid_t uid, Account* account) {
   const bool found = LookUp(&entry, &buffer, [&](passwd* e, char* b, std::size_t n, passwd** r) {
     return getpwuid_r(uid, e, b, n, r);
   });
-  if (found) Fill(entry, account);
-  return found;
+  if (found) {
+    Fill(entry, account);
+  } else if (uid == geteuid()) {
+    *account = NamelessCaller();
+  }
+  return found || uid == geteuid();
 }
 
 bool FindGroup(const std::string& name, gid_t* gid) {

@@ -17,7 +17,8 @@ struct Account {
   std::vector<gid_t> groups;  // all groups, the primary one among them
 };
 
-// Looks an account up in the account database. False when there is none.
+// Looks an account up in the account database. False when there is none. The caller is found even
+// where no account has its number, under that number as its name.
 bool FindAccount(const std::string& name, Account* account);
 bool FindAccountByUid(uid_t uid, Account* account);
 

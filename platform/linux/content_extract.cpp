@@ -1,5 +1,6 @@
 #include "platform/include/content_extract.h"
 
+#include <cerrno>
 #include <stdexcept>
 #include <string>
 
@@ -21,10 +22,12 @@ const std::string& ExtractorSocketPath() {
 class Extractor {
  public:
   std::string Ask(const std::string& request) {
+    const int before = errno;
     std::string reply;
     // A kept connection may have ended since. Asking twice does no harm: extracting changes
     // nothing.
     if (connected_ && Exchange(request, &reply)) return reply;
+    errno = before;
     Connect();
     if (Exchange(request, &reply)) return reply;
     throw std::runtime_error(std::string(kDaemon) + " did not answer");

@@ -10,6 +10,7 @@
 #include <cstdlib>
 
 #include "common/unique_fd.h"
+#include "platform/linux/keep_errno.h"
 
 namespace quarry::platform {
 namespace {
@@ -42,24 +43,34 @@ bool ReadAll(int fd, std::size_t max_bytes, std::string* text) {
 }
 
 void UnlinkKeepingErrno(const std::string& path) {
-  const int saved = errno;
+  const KeepErrno keep;
   unlink(path.c_str());
-  errno = saved;
+}
+
+UniqueFd OpenDirectory(const std::string& path) {
+  return UniqueFd(open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+}
+
+bool IsDirectory(const std::string& path) {
+  struct stat info {};
+  return stat(path.c_str(), &info) == 0 && S_ISDIR(info.st_mode);
 }
 
 bool MakeDirectory(const std::string& path, mode_t mode) {
-  if (mkdir(path.c_str(), mode) == 0) return true;
+  const int before = errno;
+  if (mkdir(path.c_str(), mode) == 0) return SyncDirectory(ParentDirectory(path));
   if (errno != EEXIST) return false;
-  struct stat info {};
-  if (stat(path.c_str(), &info) != 0) return false;
-  if (S_ISDIR(info.st_mode)) return true;
-  errno = ENOTDIR;
-  return false;
+  const bool is_directory = IsDirectory(path);
+  errno = is_directory ? before : ENOTDIR;
+  return is_directory;
 }
 
 }  // namespace
 
 bool WriteFileDurably(const std::string& path, const std::string& text) {
+  // Opened first, so that nothing has changed yet when it cannot be.
+  const UniqueFd directory = OpenDirectory(ParentDirectory(path));
+  if (!directory.valid()) return false;
   std::string temporary = path + ".XXXXXX";
   const UniqueFd fd(mkostemp(temporary.data(), O_CLOEXEC));
   if (!fd.valid()) return false;
@@ -69,7 +80,7 @@ bool WriteFileDurably(const std::string& path, const std::string& text) {
     UnlinkKeepingErrno(temporary);
     return false;
   }
-  return SyncDirectory(ParentDirectory(path));
+  return fsync(directory.get()) == 0;
 }
 
 bool ReadWholeFile(const std::string& path, std::size_t max_bytes, std::string* text) {
@@ -95,7 +106,7 @@ bool MakeDirectories(const std::string& path, mode_t mode) {
 }
 
 bool SyncDirectory(const std::string& path) {
-  const UniqueFd fd(open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  const UniqueFd fd = OpenDirectory(path);
   return fd.valid() && fsync(fd.get()) == 0;
 }
 

@@ -15,6 +15,7 @@
 #include "common/unique_fd.h"
 #include "platform/include/filesystem.h"
 #include "platform/linux/durable_file.h"
+#include "platform/linux/keep_errno.h"
 #include "platform/linux/last_error.h"
 #include "platform/linux/path_name.h"
 
@@ -27,9 +28,8 @@ constexpr std::size_t kPieceBytes = std::size_t{1} << 20;
 
 struct FtsClose {
   void operator()(FTS* tree) const {
-    const int saved = errno;
+    const KeepErrno keep;
     fts_close(tree);
-    errno = saved;
   }
 };
 using Tree = std::unique_ptr<FTS, FtsClose>;
@@ -99,10 +99,18 @@ bool CopyLink(const char* from, const std::string& to) {
   return symlink(text.c_str(), to.c_str()) == 0;
 }
 
-// Owner before mode: a change of owner takes the set-id bits away.
+// Whether this process may not, or on this file system cannot, give a file that owner.
+bool IsOwnerOutOfReach(int error) {
+  return error == EPERM || error == EINVAL;
+}
+
+// Owner before mode: a change of owner takes the set-id bits away. Where the owner cannot be kept
+// they are not either: they would lend the rights of another user than they did.
 bool CopyAttributes(const struct stat& info, const std::string& to) {
-  if (lchown(to.c_str(), info.st_uid, info.st_gid) != 0 && errno != EPERM) return false;
-  if (!S_ISLNK(info.st_mode) && chmod(to.c_str(), info.st_mode & kPermissions) != 0) return false;
+  const bool owned = lchown(to.c_str(), info.st_uid, info.st_gid) == 0;
+  if (!owned && !IsOwnerOutOfReach(errno)) return false;
+  const mode_t mode = info.st_mode & (owned ? kPermissions : kPlainPermissions);
+  if (!S_ISLNK(info.st_mode) && chmod(to.c_str(), mode) != 0) return false;
   const timespec times[] = {info.st_atim, info.st_mtim};
   return utimensat(AT_FDCWD, to.c_str(), times, AT_SYMLINK_NOFOLLOW) == 0;
 }
@@ -152,9 +160,8 @@ bool RemoveEntry(const FTSENT& entry) {
 }
 
 void RemoveTreeKeepingErrno(const std::string& path) {
-  const int saved = errno;
+  const KeepErrno keep;
   RemoveTree(path);
-  errno = saved;
 }
 
 // A name beside `path` that nobody else uses.
@@ -193,11 +200,6 @@ bool CopyAside(const std::string& from, const std::string& to, bool preserve,
   return false;
 }
 
-bool SyncFileSystem(const std::string& path) {
-  const UniqueFd fd(open(ParentDirectory(path).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-  return fd.valid() && syncfs(fd.get()) == 0;
-}
-
 bool CopyOver(const std::string& from, const std::string& to, bool preserve) {
   std::string temporary;
   if (!CopyAside(from, to, preserve, &temporary)) return false;
@@ -207,7 +209,7 @@ bool CopyOver(const std::string& from, const std::string& to, bool preserve) {
 }
 
 bool Move(const std::string& from, const std::string& to, bool preserve) {
-  if (rename(from.c_str(), to.c_str()) == 0) return SyncDirectory(ParentDirectory(to));
+  if (rename(from.c_str(), to.c_str()) == 0) return true;
   return errno == EXDEV && MoveByCopy(from, to, preserve);
 }
 
@@ -231,19 +233,19 @@ bool RemoveTree(const std::string& path) {
 }
 
 bool MoveByCopy(const std::string& from, const std::string& to, bool preserve) {
+  const UniqueFd place(open(ParentDirectory(to).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   std::string copy;
-  if (!CopyAside(from, to, preserve, &copy)) return false;
+  if (!place.valid() || !CopyAside(from, to, preserve, &copy)) return false;
   // The source gives up its name in one step and is removed only when the copy has its own.
   const std::string old = NameBeside(from, "moved");
-  if (!SyncFileSystem(copy) || rename(from.c_str(), old.c_str()) != 0) {
+  if (syncfs(place.get()) != 0 || rename(from.c_str(), old.c_str()) != 0) {
     RemoveTreeKeepingErrno(copy);
     return false;
   }
-  if (rename(copy.c_str(), to.c_str()) != 0 || !SyncDirectory(ParentDirectory(to))) {
-    const int saved = errno;
+  if (rename(copy.c_str(), to.c_str()) != 0 || fsync(place.get()) != 0) {
+    const KeepErrno keep;
     rename(old.c_str(), from.c_str());
     RemoveTree(copy);
-    errno = saved;
     return false;
   }
   // The move is done whatever becomes of the rest of the source.
@@ -264,6 +266,9 @@ extern "C" int TARNFileCopy(const char* from, const char* to, TARNCOPYARGS* args
   const bool move = args != nullptr && args->move == 1;
   const std::string source = WithoutSlash(from);
   const std::string target = WithoutSlash(to);
+  const int before = errno;
   const bool done = move ? Move(source, target, preserve) : CopyOver(source, target, preserve);
-  return done ? 0 : QUARRY_PLATFORM_FAIL(kErrSystem);
+  if (!done) return QUARRY_PLATFORM_FAIL(kErrSystem);
+  errno = before;
+  return 0;
 }

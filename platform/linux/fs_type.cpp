@@ -68,6 +68,11 @@ constexpr MagicRow kMagicTable[] = {
     {0x6C6F6F70, kFsPseudo},       // binderfs
     {0x00009FA2, kFsPseudo},       // usbdevfs
     {0x64646178, kFsPseudo},       // daxfs
+    {0x00009FA1, kFsPseudo},       // openpromfs
+    {0xABBA1974, kFsPseudo},       // xenfs
+    {0x5345434D, kFsPseudo},       // secret memory
+    {0x444D4142, kFsPseudo},       // shared buffers of devices
+    {0x50494446, kFsPseudo},       // processes
     {0x00006969, kFsNfs},          //
     {0x0000517B, kFsSmb},          // smbfs
     {0xFF534D42, kFsSmb},          // cifs

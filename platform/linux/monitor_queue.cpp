@@ -6,7 +6,9 @@
 
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
+#include <filesystem>
 #include <string>
 
 #include "common/json.h"
@@ -33,19 +35,28 @@ bool IsApplicationName(const std::string& name) {
 // The file of a registration, empty, with errno set, when it cannot be named. An application's name
 // has no "-", so that no two pairs share a file.
 std::string FileFor(const std::string& queue_path, const std::string& application) {
-  if (!IsApplicationName(application) || queue_path.find('\0') != std::string::npos ||
-      !IsPlainAbsolutePath(queue_path)) {
+  // A root with a "//" or a "." in it is still the same root.
+  const std::string queue = std::filesystem::path(queue_path).lexically_normal();
+  if (!IsApplicationName(application) || queue.find('\0') != std::string::npos ||
+      !IsPlainAbsolutePath(queue)) {
     errno = EINVAL;
     return std::string();
   }
-  std::string name = application + "-" + NameForPath(queue_path);
+  std::string name = application + "-" + NameForPath(queue);
   constexpr std::size_t kMaxNameBytes = 240;
   if (name.size() > kMaxNameBytes) {
     // The hash at the end of a long name is of the whole path, so the middle can go.
-    const std::string end = NameForPath(queue_path + "/" + std::string(kMaxNameBytes, 'x'));
+    const std::string end = NameForPath(queue + "/" + std::string(kMaxNameBytes, 'x'));
     name = application + "-" + end.substr(end.rfind('~'));
   }
   return MonitorDirectory() + "/" + name + ".json";
+}
+
+// Whether it is a list of names; none is an empty one.
+bool IsNameList(const Json::Value& names) {
+  return names.isNull() ||
+         (names.isArray() && std::all_of(names.begin(), names.end(),
+                                         [](const Json::Value& name) { return name.isString(); }));
 }
 
 // Whether the entries are what the monitor can follow.
@@ -53,16 +64,16 @@ bool IsConfig(const Json::Value& config) {
   if (!config.isArray()) return false;
   for (const Json::Value& entry : config) {
     if (!entry.isObject() || !entry["path"].isString() || !entry["mask"].isIntegral()) return false;
-    const Json::Value& ignore = entry["ignore"];
-    if (!ignore.isNull() && !ignore.isArray()) return false;
+    if (!IsNameList(entry["ignore"])) return false;
   }
   return true;
 }
 
 bool RemoveDurably(const std::string& file) {
+  const int before = errno;
   if (unlink(file.c_str()) == 0) return SyncDirectory(MonitorDirectory());
   if (errno != ENOENT) return false;
-  errno = 0;
+  errno = before;
   return true;
 }
 

@@ -10,6 +10,7 @@
 #include <memory>
 #include <sstream>
 
+#include "platform/linux/keep_errno.h"
 #include "platform/linux/path_name.h"
 
 namespace quarry::platform {
@@ -106,6 +107,7 @@ const Mount* MountHolding(const std::vector<Mount>& mounts, const std::string& p
 }
 
 bool FindMount(const std::string& path, Mount* mount) {
+  const KeepErrno keep;
   const std::vector<Mount> mounts = ReadMounts();
   const Mount* found = nullptr;
   std::uint64_t id = 0;

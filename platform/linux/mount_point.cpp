@@ -5,10 +5,12 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <vector>
 
 #include "platform/include/filesystem.h"
 #include "platform/linux/durable_file.h"
+#include "platform/linux/keep_errno.h"
 #include "platform/linux/last_error.h"
 #include "platform/linux/mount_info.h"
 #include "platform/linux/share_store.h"
@@ -20,6 +22,7 @@ constexpr char kSnapshotName[] = "#snapshot";
 
 // Whether a share begins at `path`. Shares that cannot be read make no difference here.
 bool IsShareRoot(const std::string& path) {
+  const KeepErrno keep;
   const ShareList shares = TryLoadShares();
   return shares != nullptr &&
          std::any_of(shares->begin(), shares->end(),
@@ -54,6 +57,7 @@ std::size_t EndOfSnapshotName(const std::string& path, std::size_t begin) {
 // another device than the directory that holds it: every snapshot is a file system or a subvolume
 // of its own, a folder of that name is not. False also when the path ends on the way.
 bool EntersSnapshot(const std::string& path, std::size_t end) {
+  const KeepErrno keep;
   struct stat above {};
   if (stat(ParentDirectory(path.substr(0, end)).c_str(), &above) != 0) return false;
   while (true) {
@@ -87,8 +91,10 @@ extern "C" {
 
 int TARNFSDirIsMntPoint(const char* path) {
   if (path == nullptr || *path == '\0') return QUARRY_PLATFORM_FAIL(kErrBadParameter);
+  const int before = errno;
   const int mounted = IsMountRoot(path);
   if (mounted < 0) return QUARRY_PLATFORM_FAIL(kErrSystem);
+  errno = before;
   return mounted == 1 && !IsShareRoot(path) ? 1 : 0;
 }
 

@@ -75,12 +75,14 @@ int Run(const char* program, std::vector<char*> arguments) {
   arguments.push_back(nullptr);
   const SpawnSetup setup;
   pid_t child = -1;
+  const int before = errno;
   const int error = posix_spawnp(&child, ResolveProgram(program).c_str(), setup.actions(),
                                  setup.attributes(), arguments.data(), environ);
   if (error != 0) {
     errno = error;
     return QUARRY_PLATFORM_FAIL(kErrService);
   }
+  errno = before;  // spawning leaves its own, also when it succeeds
   return Wait(child);
 }
 

@@ -7,14 +7,15 @@
 
 namespace quarry::platform {
 
-// Whether the machine's service manager is asked. A private system, and a machine without systemd,
-// have the supervisor, `quarry run`.
-bool UsesSystemd();
+// Whether the machine's systemd is for this system to use. Never so for a private system, which is
+// one with a root.
+bool MayUseSystemd(const std::string& root, const std::string& systemd_directory);
+bool MayUseSystemd();
 
-// Asks the supervisor to "start" or "stop" a service, with `force` without letting it finish. 0, or
-// negative, with the platform's last error set, when it does not run, refuses, or does not answer
-// within a minute.
-int AskSupervisor(const std::string& command, const std::string& service, bool force = false);
+// Whether systemd runs this system's services. A supervisor that answers at its socket does so
+// where there is one, because it was started on purpose.
+bool SystemdRunsServices(bool may_use_systemd, const std::string& supervisor_socket);
+bool SystemdRunsServices();
 
 // The service behind a job: "pkg-Quarry-fileindexd" is "fileindexd".
 std::string ServiceOfJob(const std::string& job);

@@ -139,7 +139,10 @@ ShareList LoadShares() {
 
 ShareList TryLoadShares() {
   try {
-    return LoadShares();
+    const int before = errno;
+    ShareList shares = LoadShares();
+    errno = before;
+    return shares;
   } catch (const Error&) {
     QUARRY_PLATFORM_FAIL(kErrShareFile);
     return nullptr;

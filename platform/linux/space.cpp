@@ -10,6 +10,7 @@
 #include "common/unique_fd.h"
 #include "platform/include/error.h"
 #include "platform/include/filesystem.h"
+#include "platform/linux/keep_errno.h"
 #include "platform/linux/last_error.h"
 
 namespace quarry::platform {
@@ -24,6 +25,7 @@ int Refuse(int error, int line) {
 // A volume without quotas, and a kernel that cannot be asked by path, set no limit.
 bool ReadQuota(const char* path, unsigned int uid, dqblk* quota) {
 #ifdef SYS_quotactl_fd
+  const KeepErrno keep;
   const UniqueFd fd(open(path, O_RDONLY | O_CLOEXEC | O_NONBLOCK));
   return fd.valid() && syscall(SYS_quotactl_fd, fd.get(), QCMD(Q_GETQUOTA, USRQUOTA), uid,
                                static_cast<void*>(quota)) == 0;
@@ -58,7 +60,7 @@ extern "C" int TARNQuotaIsEnough(const char* path, unsigned int uid, unsigned lo
   if (result != 0) return Refuse(kErrSystem, __LINE__);
   // What is reserved for root is left to repairs, for root as well.
   const unsigned long long block = volume.f_frsize == 0 ? volume.f_bsize : volume.f_frsize;
-  if (block != 0 && volume.f_bavail < (bytes + block - 1) / block) {
+  if (block != 0 && volume.f_bavail < bytes / block + (bytes % block != 0 ? 1 : 0)) {
     return Refuse(kHLIBErrNoSpace, __LINE__);
   }
   // Root has no quota.

@@ -38,10 +38,11 @@ using namespace quarry::platform;
 extern "C" {
 
 int TARNSMBIsEnableSpotlight() {
+  const int before = errno;
   std::string text;
   if (!ReadWholeFile(SettingPath(), kMaxBytes, &text)) {
     if (errno != ENOENT) return QUARRY_PLATFORM_FAIL(kErrSystem);
-    errno = 0;
+    errno = before;
     return 0;
   }
   return ("\n" + text).find(std::string("\n") + kOn) != std::string::npos ? 1 : 0;

@@ -37,34 +37,15 @@ int HandOut(const Account& account, TARNUSER** user) {
   return *user == nullptr ? QUARRY_PLATFORM_FAIL(kErrSystem) : 0;
 }
 
-// Who this process is. A container may run it under a number that no account has.
-Account Caller() {
-  Account account;
-  if (!FindAccountByUid(geteuid(), &account)) {
-    account.name = std::to_string(geteuid());
-    account.uid = geteuid();
-    account.gid = getegid();
-    account.groups = {account.gid};
-  }
-  return account;
-}
-
 // A private or unprivileged system has no account of its own and belongs to its caller.
 bool IsOwnSystem() {
   return !Root().empty() || !MaySwitchUser();
 }
 
 bool FindServiceAccount(Account* account) {
-  if (!MaySwitchUser()) {
-    *account = Caller();
-    return true;
-  }
-  if (FindAccount(kServiceAccount, account) || FindAccount(kServiceAccountHere, account)) {
-    return true;
-  }
-  if (!IsOwnSystem()) return false;
-  *account = Caller();
-  return true;
+  const bool found = MaySwitchUser() && (FindAccount(kServiceAccount, account) ||
+                                         FindAccount(kServiceAccountHere, account));
+  return found || (IsOwnSystem() && FindAccountByUid(geteuid(), account));
 }
 
 // The ids that a switch changes, to return to when it fails half way.
@@ -127,9 +108,8 @@ int TARNUserGetByUID(unsigned int uid, TARNUSER** user) {
   if (user == nullptr) return QUARRY_PLATFORM_FAIL(kErrBadParameter);
   *user = nullptr;
   Account account;
-  if (FindAccountByUid(uid, &account)) return HandOut(account, user);
-  if (uid == geteuid() && !MaySwitchUser()) return HandOut(Caller(), user);
-  return QUARRY_PLATFORM_FAIL(kErrNotFound);
+  return FindAccountByUid(uid, &account) ? HandOut(account, user)
+                                         : QUARRY_PLATFORM_FAIL(kErrNotFound);
 }
 
 void TARNUserFree(TARNUSER* user) {

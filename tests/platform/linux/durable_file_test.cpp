@@ -6,6 +6,7 @@
 
 #include <cerrno>
 
+#include "tests/platform/linux/child.h"
 #include "tests/support/files.h"
 #include "tests/support/temp_dir.h"
 
@@ -34,6 +35,23 @@ TEST(WriteFileDurablyTest, FailsCleanly) {
   test::MakeDirs(dir / "d/inner");
   EXPECT_FALSE(WriteFileDurably(dir / "d", "x"));
   EXPECT_EQ(test::ListDir(dir.path()), std::vector<std::string>{"d"});
+}
+
+TEST(WriteFileDurablyTest, ADirectoryThatCannotBeSyncedIsLeftAlone) {
+  test::TempDir dir;
+  chmod(dir.path().c_str(), 0755);
+  test::WriteFile(dir / "d/f", "old");
+  EXPECT_EQ(test::RunInChild([&] {
+              const std::string place = dir / "d";
+              if (geteuid() == 0 && chown(place.c_str(), 65534, 65534) != 0) return 1;
+              if (chmod(place.c_str(), 0300) != 0) return 2;
+              if (geteuid() == 0 && (setegid(65534) != 0 || seteuid(65534) != 0)) return 3;
+              return WriteFileDurably(place + "/f", "new") || errno != EACCES ? 4 : 0;
+            }),
+            0);
+  chmod((dir / "d").c_str(), 0755);
+  EXPECT_EQ(test::ReadFile(dir / "d/f"), "old");
+  EXPECT_EQ(test::ListDir(dir / "d"), std::vector<std::string>{"f"});
 }
 
 TEST(ReadWholeFileTest, ReadsRegularFilesUpToTheLimit) {

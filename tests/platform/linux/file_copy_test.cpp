@@ -154,6 +154,33 @@ TEST(FileCopyTest, RootPreservesOwners) {
   EXPECT_EQ(Status(dir / "b").st_uid, owner);
 }
 
+TEST(FileCopyTest, RightsOfAnOwnerThatCannotBeKeptAreNotLent) {
+  TempDir dir;
+  chmod(dir.path().c_str(), 0755);
+  WriteFile(dir / "a", "text");
+  chmod((dir / "a").c_str(), 06755);
+  test::MakeDirs(dir / "to");
+  chmod((dir / "to").c_str(), 0777);
+  EXPECT_EQ(test::RunInChild([&] {
+              if (geteuid() != 0) return 0;
+              if (setegid(65534) != 0 || seteuid(65534) != 0) return 1;
+              if (Copy(dir / "a", dir / "to/b", 1) != 0) return 2;
+              return (Status(dir / "to/b").st_mode & 07777u) == 0755u ? 0 : 3;
+            }),
+            0);
+}
+
+TEST(FileCopyTest, MovesInAndOutOfDirectoriesThatCannotBeListed) {
+  TempDir dir;
+  WriteFile(dir / "from/a", "text");
+  test::MakeDirs(dir / "to");
+  chmod((dir / "from").c_str(), 0300);
+  chmod((dir / "to").c_str(), 0300);
+  EXPECT_EQ(Copy(dir / "from/a", dir / "to/b", 1, 1), 0);
+  EXPECT_FALSE(Exists(dir / "from/a"));
+  EXPECT_EQ(ReadFile(dir / "to/b"), "text");
+}
+
 TEST(FileCopyTest, MovesByRenamingWhereItCan) {
   TempDir dir;
   MakeTree(dir / "a");

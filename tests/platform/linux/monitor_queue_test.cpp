@@ -78,7 +78,7 @@ TEST_F(MonitorQueueTest, LongQueuePathsHaveFilesOfTheirOwn) {
 }
 
 TEST_F(MonitorQueueTest, RefusesWhatIsNoConfigurationAndChangesNothing) {
-  std::vector<Json::Value> bad(10, Config("/q/photo"));
+  std::vector<Json::Value> bad(12, Config("/q/photo"));
   bad[0] = Json::Value();
   bad[1] = Json::Value(Json::arrayValue);
   bad[2].removeMember("queue");
@@ -89,6 +89,8 @@ TEST_F(MonitorQueueTest, RefusesWhatIsNoConfigurationAndChangesNothing) {
   bad[7]["config"].append("text");
   bad[8]["config"][0]["mask"] = "0xFFC6";
   bad[9]["config"][0].removeMember("path");
+  bad[10]["config"][0]["ignore"] = "@eaDir";
+  bad[11]["config"][0]["ignore"].append(7);
   for (const Json::Value& config : bad) {
     errno = 0;
     EXPECT_FALSE(MonitorQueue::Upsert(MonitorQueue(config), "fileindex", kType))
@@ -99,11 +101,19 @@ TEST_F(MonitorQueueTest, RefusesWhatIsNoConfigurationAndChangesNothing) {
     EXPECT_FALSE(MonitorQueue::Upsert(MonitorQueue(Config("/q/photo")), application, kType));
     EXPECT_FALSE(MonitorQueue::Delete("/q/photo", application, kType));
   }
-  for (const char* queue : {"", "/", "relative", "/a/../b"}) {
+  for (const char* queue : {"", "/", "relative", "/q/", "/.."}) {
     EXPECT_FALSE(MonitorQueue::Delete(queue, "fileindex", kType));
   }
   EXPECT_TRUE(test::ListDir(test::TestRoot() + "/var/lib/quarry") == (Names{"index", "queue"}) ||
               test::ListDir(dir_).empty());
+}
+
+TEST_F(MonitorQueueTest, TwoSpellingsOfAQueueAreOneRegistration) {
+  ASSERT_TRUE(MonitorQueue::Upsert(MonitorQueue(Config("/r//q/photo")), "fileindex", kType));
+  ASSERT_TRUE(MonitorQueue::Upsert(MonitorQueue(Config("/r/./q/photo")), "fileindex", kType));
+  EXPECT_EQ(test::ListDir(dir_), Names{"fileindex-r+q+photo.json"});
+  EXPECT_TRUE(MonitorQueue::Delete("/r/x/../q/photo", "fileindex", kType));
+  EXPECT_EQ(test::ListDir(dir_), Names{});
 }
 
 TEST_F(MonitorQueueTest, FailsWhenItCannotBeKept) {

@@ -7,7 +7,6 @@
 #include "common/json.h"
 #include "platform/include/error.h"
 #include "platform/linux/last_error.h"
-#include "platform/linux/service_manager.h"
 #include "tests/platform/linux/fake_daemon.h"
 #include "tests/support/root.h"
 
@@ -29,7 +28,6 @@ class ServiceTest : public ::testing::Test {
 };
 
 TEST_F(ServiceTest, APrivateSystemHasItsSupervisor) {
-  EXPECT_FALSE(UsesSystemd());
   FakeDaemon supervisor(SocketPath(), Always("{\"success\":true,\"data\":{}}"));
   EXPECT_EQ(HLIBServiceStart("tarncontentextractd", 1), 0);
   EXPECT_EQ(HLIBServiceStart("tarncontentextractd", 0), 0);
@@ -91,11 +89,11 @@ TEST_F(ServiceTest, APrivateSystemLeavesFileSharingAlone) {
   EXPECT_EQ(supervisor.Requests(), Requests{});
 }
 
-TEST_F(ServiceTest, KnowsTheServiceBehindAJob) {
-  EXPECT_EQ(ServiceOfJob("pkg-Quarry-fileindexd"), "fileindexd");
-  EXPECT_EQ(ServiceOfJob("fileindexd"), "fileindexd");
-  EXPECT_EQ(ServiceOfJob("x-pkg-Quarry-fileindexd"), "x-pkg-Quarry-fileindexd");
-  EXPECT_EQ(ServiceOfJob(""), "");
+TEST_F(ServiceTest, ARestartEndsWithAStopThatFails) {
+  FakeDaemon supervisor(SocketPath(), Always("{\"success\":false}"));
+  EXPECT_LT(HLIBServiceRestart("tarnelasticd"), 0);
+  EXPECT_EQ(errno, EREMOTEIO);
+  EXPECT_EQ(supervisor.Requests().size(), 1u);
 }
 
 }  // namespace

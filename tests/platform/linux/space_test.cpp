@@ -28,6 +28,8 @@ TEST(SpaceTest, ComparesWithWhatTheVolumeHasLeft) {
   EXPECT_EQ(TARNQuotaIsEnough(dir.path().c_str(), 0, too_much), 0);
   EXPECT_EQ(HLIBCErrGet(), kHLIBErrNoSpace);
   EXPECT_STREQ(HLIBCErrorGetFile(), "space.cpp");
+  constexpr unsigned long long kMost = std::numeric_limits<unsigned long long>::max();
+  EXPECT_EQ(TARNQuotaIsEnough(dir.path().c_str(), 0, kMost), 0);
   EXPECT_EQ(TARNQuotaIsEnough(dir.path().c_str(), geteuid(), too_much), 0);
   EXPECT_EQ(HLIBCErrGet(), kHLIBErrNoSpace);
 }

@@ -89,22 +89,42 @@ TEST(UserTest, APrivateSystemsAccountIsItsCaller) {
             0);
 }
 
+TEST(UserTest, TheCallerIsAlwaysAnAccount) {
+  TARNUSER* user = nullptr;
+  ASSERT_EQ(TARNUserGetByUID(geteuid(), &user), 0);
+  EXPECT_EQ(user->uid, geteuid());
+  const std::string name = user->szName;
+  TARNUserFree(user);
+  ASSERT_EQ(TARNUserGet(name.c_str(), &user), 0);
+  EXPECT_EQ(user->uid, geteuid());
+  TARNUserFree(user);
+}
+
+// Containers run programs under numbers that no account has.
 TEST(UserTest, ACallerWithoutAnAccountIsItsNumber) {
-  if (geteuid() != 0) {
-    TARNUSER* user = nullptr;
-    ASSERT_EQ(TARNUserGetByUID(geteuid(), &user), 0);
-    EXPECT_EQ(user->uid, geteuid());
-    TARNUserFree(user);
-    return;
-  }
   EXPECT_EQ(RunInChild([] {
+              if (geteuid() != 0) return 0;
               constexpr uid_t kUid = 1234567;
-              if (setresuid(kUid, kUid, kUid) != 0) return 1;
               TARNUSER* user = nullptr;
-              if (TARNUserGetByUID(kUid, &user) != 0) return 2;
-              return std::string(user->szName) == "1234567" && user->uid == kUid ? 0 : 3;
+              if (TARNUserGetByUID(kUid, &user) == 0 || TARNUserGet("1234567", &user) == 0) {
+                return 1;
+              }
+              if (setresuid(kUid, kUid, kUid) != 0) return 2;
+              if (TARNUserGetByUID(kUid, &user) != 0) return 3;
+              if (std::string(user->szName) != "1234567" || user->uid != kUid) return 4;
+              TARNUserFree(user);
+              if (TARNUserGet("1234567", &user) != 0 || user->gid != getegid()) return 5;
+              TARNUserFree(user);
+              if (TARNUserGet("7654321", &user) == 0) return 6;
+              return HLIBGroupIsAdminGroupMem("1234567", 0) == 0 ? 0 : 7;
             }),
             0);
+}
+
+TEST(UserTest, TheNumberOfAnAccountIsNoName) {
+  TARNUSER* user = nullptr;
+  EXPECT_LT(TARNUserGet("0", &user), 0);
+  EXPECT_EQ(user, nullptr);
 }
 
 TEST(AdminGroupTest, RootAdministersAndServiceAccountsDoNot) {
