@@ -2,7 +2,6 @@
 
 #include <poll.h>
 #include <sys/socket.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
@@ -11,10 +10,10 @@
 #include <limits>
 #include <system_error>
 #include <thread>
+#include <utility>
 
 #include "common/error.h"
 #include "common/json.h"
-#include "common/unique_fd.h"
 #include "daemons/common/frame.h"
 #include "daemons/common/socket_address.h"
 
@@ -62,17 +61,8 @@ Client::Client(const std::string& daemon, const std::string& socket_path, Client
   CheckSocketPath(path_);
 }
 
-Client::~Client() {
-  Disconnect();
-}
-
-void Client::Disconnect() {
-  if (fd_ >= 0) close(fd_);
-  fd_ = -1;
-}
-
 void Client::Broken(const std::string& what) {
-  Disconnect();
+  fd_.Reset();
   throw Error(kErrorSystem, daemon_ + " " + what + " (socket " + path_ + ").");
 }
 
@@ -87,17 +77,17 @@ void Client::Connect() {
     if (deadline.LeftMs() == 0) Broken("is too busy to accept a connection");
     std::this_thread::sleep_for(std::chrono::milliseconds(5));
   }
-  fd_ = fd.Release();
+  fd_ = std::move(fd);
 }
 
 // Whether the peer has ended the kept connection, or has sent what nobody asked for.
 bool Client::IsStale() const {
-  pollfd poll_fd{fd_, POLLIN | POLLRDHUP, 0};
+  pollfd poll_fd{fd_.get(), POLLIN | POLLRDHUP, 0};
   return poll(&poll_fd, 1, 0) != 0;
 }
 
 void Client::Wait(short events, const Deadline& deadline) {
-  pollfd poll_fd{fd_, events, 0};
+  pollfd poll_fd{fd_.get(), events, 0};
   const int ready = poll(&poll_fd, 1, deadline.LeftMs());
   if (ready == 0) {
     Broken("did not answer within " + std::to_string(options_.timeout.count()) + " ms");
@@ -109,7 +99,7 @@ void Client::SendAll(const std::string& bytes, const Deadline& deadline) {
   std::size_t done = 0;
   while (done < bytes.size()) {
     const std::size_t size = std::min(bytes.size() - done, kPieceBytes);
-    const ssize_t sent = send(fd_, bytes.data() + done, size, MSG_NOSIGNAL | MSG_DONTWAIT);
+    const ssize_t sent = send(fd_.get(), bytes.data() + done, size, MSG_NOSIGNAL | MSG_DONTWAIT);
     if (sent >= 0) {
       done += static_cast<std::size_t>(sent);
     } else if (errno == EAGAIN) {
@@ -123,7 +113,7 @@ void Client::SendAll(const std::string& bytes, const Deadline& deadline) {
 void Client::RecvAll(char* buffer, std::size_t size, const Deadline& deadline) {
   std::size_t done = 0;
   while (done < size) {
-    const ssize_t got = recv(fd_, buffer + done, size - done, MSG_DONTWAIT);
+    const ssize_t got = recv(fd_.get(), buffer + done, size - done, MSG_DONTWAIT);
     if (got > 0) {
       done += static_cast<std::size_t>(got);
     } else if (got == 0) {
@@ -157,8 +147,8 @@ Json::Value Client::Request(const Json::Value& request) {
   if (text.size() > std::numeric_limits<std::uint32_t>::max()) {
     throw Error(kErrorSystem, "A request of 4 GiB or more cannot be sent to " + daemon_ + ".");
   }
-  if (fd_ >= 0 && IsStale()) Disconnect();
-  if (fd_ < 0) Connect();
+  if (fd_.valid() && IsStale()) fd_.Reset();
+  if (!fd_.valid()) Connect();
   const Deadline deadline(options_.timeout);
   SendAll(MakeFrame(text), deadline);
   std::string reply = RecvFrame(deadline);

@@ -9,6 +9,8 @@
 #include <cstddef>
 #include <string>
 
+#include "common/unique_fd.h"
+
 namespace quarry::daemon {
 
 struct ClientOptions {
@@ -26,9 +28,6 @@ class Client {
   // `daemon` names it in messages. Nothing is connected yet. Throws Error 502 when the path does
   // not fit a socket address.
   Client(const std::string& daemon, const std::string& socket_path, ClientOptions options = {});
-  ~Client();
-  Client(const Client&) = delete;
-  Client& operator=(const Client&) = delete;
 
   // Sends one request and returns its answer, which may be any JSON value: whether it reports
   // success is for the caller to see. Blocks for at most the two timeouts. Throws Error 502 with a
@@ -39,7 +38,6 @@ class Client {
  private:
   class Deadline;
   void Connect();
-  void Disconnect();
   bool IsStale() const;
   void Wait(short events, const Deadline& deadline);
   void SendAll(const std::string& bytes, const Deadline& deadline);
@@ -50,7 +48,7 @@ class Client {
   std::string daemon_;
   std::string path_;
   ClientOptions options_;
-  int fd_ = -1;
+  UniqueFd fd_;
 };
 
 // One request on a connection of its own, as Client::Request.

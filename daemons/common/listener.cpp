@@ -64,6 +64,10 @@ Listener::Listener(const std::string& path) : path_(path) {
 }
 
 Listener::~Listener() {
+  Unlink();
+}
+
+void Listener::Unlink() {
   struct stat info {};
   if (lstat(path_.c_str(), &info) == 0 && info.st_dev == device_ && info.st_ino == inode_) {
     unlink(path_.c_str());

@@ -18,6 +18,8 @@ class Listener {
   // As SocketServer's constructor says.
   explicit Listener(const std::string& path);
   ~Listener();
+  // Removes the socket file now. Who has connected already is still accepted.
+  void Unlink();
   Listener(const Listener&) = delete;
   Listener& operator=(const Listener&) = delete;
 

@@ -8,10 +8,10 @@
 #include <chrono>
 #include <cstdlib>
 #include <thread>
+#include <utility>
 
 #include "common/error.h"
 #include "common/paths.h"
-#include "common/unique_fd.h"
 #include "daemons/common/system_error.h"
 
 namespace quarry::daemon {
@@ -87,13 +87,12 @@ SingleInstance::SingleInstance(const std::string& name, const std::string& pid_p
       pwrite(fd.get(), text.data(), text.size(), 0) != static_cast<ssize_t>(text.size())) {
     ThrowSystemError("Cannot write " + pid_path);
   }
-  fd_ = fd.Release();
+  fd_ = std::move(fd);
 }
 
 SingleInstance::~SingleInstance() {
   // Nobody reads the number once the lock is gone, so a failure to empty the file does no harm.
-  if (ftruncate(fd_, 0) != 0) errno = 0;
-  close(fd_);
+  if (ftruncate(fd_.get(), 0) != 0) errno = 0;
 }
 
 }  // namespace quarry::daemon

@@ -7,6 +7,8 @@
 
 #include <string>
 
+#include "common/unique_fd.h"
+
 namespace quarry::daemon {
 
 // RootedPath("/var/run/" + name + ".pid").
@@ -31,7 +33,7 @@ class SingleInstance {
   SingleInstance& operator=(const SingleInstance&) = delete;
 
  private:
-  int fd_ = -1;
+  UniqueFd fd_;
 };
 
 }  // namespace quarry::daemon

@@ -27,6 +27,10 @@ using State = Connection::State;
 
 // How long no connection is accepted after the system has run out of descriptors or memory.
 constexpr auto kAcceptPause = std::chrono::milliseconds(100);
+// A server that ends takes requests until nobody has sent anything for that long, but not for
+// longer than that altogether.
+constexpr auto kSilence = std::chrono::milliseconds(20);
+constexpr auto kLastRequestsTime = std::chrono::milliseconds(100);
 constexpr std::size_t kMaxReplyBytes = std::numeric_limits<std::uint32_t>::max();
 
 UniqueFd NewEventFd() {
@@ -134,6 +138,8 @@ class SocketServer::Impl {
   void CloseOverdue();
   void AcceptAll();
   bool MakeRoom();
+  void TakeLastRequests(Clock::time_point end);
+  void CloseIdle();
   bool HasWorkLeft() const;
 
   const SocketServerOptions options_;
@@ -146,6 +152,7 @@ class SocketServer::Impl {
   std::uint64_t next_id_ = 0;
   std::size_t buffered_ = 0;
   int taken_ = 0;
+  int ready_ = 0;  // descriptors with which the last Step() had to do
   bool finishing_ = false;
   Clock::time_point accept_from_ = Clock::time_point::min();
 
@@ -162,9 +169,9 @@ int SocketServer::Impl::Step(int timeout_ms) {
   const Clock::time_point now = Clock::now();
   FillPoll(now);
   const int timeout = PollTimeout(NextDeadline(now), now, timeout_ms);
-  const int ready = poll(poll_fds_.data(), poll_fds_.size(), timeout);
-  if (ready < 0 && errno != EINTR) ThrowSystemError("Cannot wait for connections");
-  if (ready > 0) {
+  ready_ = poll(poll_fds_.data(), poll_fds_.size(), timeout);
+  if (ready_ < 0 && errno != EINTR) ThrowSystemError("Cannot wait for connections");
+  if (ready_ > 0) {
     if (poll_fds_[0].revents != 0) Drain(wake_.get());
     if (poll_fds_[1].revents != 0) TakeReplies();
     ServeConnections();
@@ -185,7 +192,6 @@ void SocketServer::Impl::FillPoll(Clock::time_point now) {
     poll_fds_.push_back({connection.fd(), connection.Events(), 0});
     polled_ids_.push_back(id);
   }
-  if (finishing_) return;
   for (const int fd : wake_fds_) poll_fds_.push_back({fd, POLLIN, 0});
 }
 
@@ -334,16 +340,31 @@ bool SocketServer::Impl::HasWorkLeft() const {
                      [](const auto& entry) { return entry.second.state() != State::kReading; });
 }
 
+// Who has connected already may wait for an answer without end, however the connection ends.
+void SocketServer::Impl::TakeLastRequests(Clock::time_point end) {
+  wake_fds_.clear();
+  listener_->Unlink();
+  end = std::min(end, Clock::now() + kLastRequestsTime);
+  do {
+    Step(PollTimeout(end, Clock::now(), kSilence.count()));
+  } while (ready_ != 0 && Clock::now() < end);
+}
+
+void SocketServer::Impl::CloseIdle() {
+  for (auto it = connections_.begin(); it != connections_.end();) {
+    const auto next = std::next(it);
+    if (it->second.state() == State::kReading) Close(it);
+    it = next;
+  }
+}
+
 bool SocketServer::Impl::Finish(int timeout_ms) {
+  const Clock::time_point end = Clock::now() + std::chrono::milliseconds(timeout_ms);
+  if (!finishing_) TakeLastRequests(end);
   finishing_ = true;
   listener_.reset();
-  const Clock::time_point end = Clock::now() + std::chrono::milliseconds(timeout_ms);
   while (true) {
-    for (auto it = connections_.begin(); it != connections_.end();) {
-      const auto next = std::next(it);
-      if (it->second.state() == State::kReading) Close(it);
-      it = next;
-    }
+    CloseIdle();
     if (!HasWorkLeft()) return true;
     const Clock::time_point now = Clock::now();
     if (now >= end) return false;

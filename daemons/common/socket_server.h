@@ -74,8 +74,9 @@ class SocketServer {
   // read from it. The descriptor stays the caller's and must stay open.
   void WakeOn(int fd);
 
-  // Takes no more connections or requests, and gives the requests in work up to `timeout_ms`
-  // milliseconds to be answered and their answers to be taken. Returns whether all were.
+  // Removes the socket file, takes what was sent before, and then no more connections or requests;
+  // gives the requests in work up to `timeout_ms` milliseconds to be answered and their answers to
+  // be taken. Returns whether all were. Called again it only waits on.
   bool Finish(int timeout_ms);
 
   // Open connections, for reports and tests.

@@ -5,7 +5,6 @@
 
 #include <cerrno>
 
-#include "common/unique_fd.h"
 #include "daemons/common/system_error.h"
 
 namespace quarry::daemon {
@@ -25,8 +24,8 @@ StopSignal::StopSignal() {
   const sigset_t signals = StopSignals();
   errno = pthread_sigmask(SIG_BLOCK, &signals, &old_mask_);
   if (errno != 0) ThrowSystemError("Cannot block the stop signals");
-  fd_ = signalfd(-1, &signals, SFD_NONBLOCK | SFD_CLOEXEC);
-  if (fd_ < 0) {
+  fd_.Reset(signalfd(-1, &signals, SFD_NONBLOCK | SFD_CLOEXEC));
+  if (!fd_.valid()) {
     const int saved = errno;
     pthread_sigmask(SIG_SETMASK, &old_mask_, nullptr);
     errno = saved;
@@ -36,14 +35,13 @@ StopSignal::StopSignal() {
 
 StopSignal::~StopSignal() {
   Requested();
-  close(fd_);
   pthread_sigmask(SIG_SETMASK, &old_mask_, nullptr);
 }
 
 bool StopSignal::Requested() {
   signalfd_siginfo info;
   while (true) {
-    const ssize_t got = read(fd_, &info, sizeof(info));
+    const ssize_t got = read(fd_.get(), &info, sizeof(info));
     if (got == static_cast<ssize_t>(sizeof(info))) {
       requested_ = true;
     } else if (got >= 0 || errno != EINTR) {

@@ -5,6 +5,8 @@
 
 #include <csignal>
 
+#include "common/unique_fd.h"
+
 namespace quarry::daemon {
 
 // Turns SIGTERM and SIGINT into a readable descriptor as long as the object lives. Make it before
@@ -20,13 +22,13 @@ class StopSignal {
   StopSignal& operator=(const StopSignal&) = delete;
 
   // Readable once a signal has come, until Requested() is called. Stays this object's.
-  int Fd() const { return fd_; }
+  int Fd() const { return fd_.get(); }
 
   // Whether a signal has come since this object was made. Does not block.
   bool Requested();
 
  private:
-  int fd_ = -1;
+  UniqueFd fd_;
   bool requested_ = false;
   sigset_t old_mask_{};
 };

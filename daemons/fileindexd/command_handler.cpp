@@ -2,7 +2,7 @@
 
 #include <unistd.h>
 
-#include <functional>
+#include <exception>
 #include <map>
 
 #include "common/error.h"
@@ -87,6 +87,14 @@ Json::Value Run(CommandTarget& target, const std::string& text) {
   return command->second(target, request.isMember("data") ? request["data"] : Json::Value());
 }
 
+Json::Value Refusal(int code, const std::string& reason) {
+  Json::Value answer;
+  answer["success"] = false;
+  answer["error"]["code"] = code;
+  answer["error"]["msg"] = reason;
+  return answer;
+}
+
 }  // namespace
 
 std::string HandleCommand(CommandTarget& target, const std::string& request) {
@@ -96,9 +104,10 @@ std::string HandleCommand(CommandTarget& target, const std::string& request) {
     answer["success"] = true;
     if (!data.isNull()) answer["data"] = data;
   } catch (const Error& error) {
-    answer["success"] = false;
-    answer["error"]["code"] = static_cast<int>(error.code());
-    answer["error"]["msg"] = error.reason();
+    answer = Refusal(error.code(), error.reason());
+  } catch (const std::exception& error) {
+    // The library's callers wait for an answer as long as there is none.
+    answer = Refusal(kErrorSystem, error.what());
   }
   return toString(answer);
 }

@@ -66,9 +66,14 @@ std::string ElasticIndex::Epoch() {
 }
 
 std::uint64_t ElasticIndex::Count() {
-  const Json::Value status = EngineStatus();
-  for (const Json::Value& index : status["indexes"]) {
-    if (index["id"] == id_) return index["documents"].asUInt64();
+  Json::Value indexes;
+  GetJsonValue<Json::Value>(indexes, EngineStatus(), "indexes", true);
+  for (const Json::Value& index : indexes) {
+    std::string id;
+    long long documents = 0;
+    GetJsonValue<std::string>(id, index, "id", true);
+    GetJsonValue<long long>(documents, index, "documents", true);
+    if (id == id_) return static_cast<std::uint64_t>(documents);
   }
   return 0;
 }

@@ -12,30 +12,11 @@
 #include <memory>
 
 #include "common/file_util.h"
+#include "common/unique_fd.h"
 #include "daemons/tarncontentextractd/stamp.h"
 
 namespace quarry::fileindexd {
 namespace {
-
-// A descriptor that closes itself.
-class Descriptor {
- public:
-  explicit Descriptor(int fd) : fd_(fd) {}
-  ~Descriptor() {
-    if (fd_ >= 0) close(fd_);
-  }
-  Descriptor(const Descriptor&) = delete;
-  Descriptor& operator=(const Descriptor&) = delete;
-
-  int get() const { return fd_; }
-  void Reset(int fd) {
-    if (fd_ >= 0) close(fd_);
-    fd_ = fd;
-  }
-
- private:
-  int fd_;
-};
 
 struct CloseDir {
   void operator()(DIR* dir) const { closedir(dir); }
@@ -122,14 +103,14 @@ Place PlaceOfBase(const std::string& base) {
 
 Place PosixFileSystem::Look(const std::string& base, const std::string& path) {
   Place place = PlaceOfBase(base);
-  Descriptor dir(-1);
+  UniqueFd dir;
   std::string name = base;
   std::size_t done = base.size();
   // One component at a time: no link is followed, and the path may be longer than the system's
   // calls would take.
   while (done < path.size()) {
     if (place.kind != PlaceKind::kDirectory) return Blocked(place.kind);
-    const int fd = openat(dir.get() < 0 ? AT_FDCWD : dir.get(), name.c_str(),
+    const int fd = openat(dir.valid() ? dir.get() : AT_FDCWD, name.c_str(),
                           O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
     if (fd < 0) return Failed(errno);
     dir.Reset(fd);
@@ -147,13 +128,11 @@ Place PosixFileSystem::Peek(const std::string& path) {
 
 PlaceKind PosixFileSystem::List(const std::string& dir, std::vector<std::string>& names) {
   names.clear();
-  const int fd = open(dir.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
-  if (fd < 0) return KindOfFailure(errno);
-  const std::unique_ptr<DIR, CloseDir> stream(fdopendir(fd));
-  if (!stream) {
-    close(fd);
-    return PlaceKind::kUnknown;
-  }
+  UniqueFd fd(open(dir.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+  if (!fd.valid()) return KindOfFailure(errno);
+  const std::unique_ptr<DIR, CloseDir> stream(fdopendir(fd.get()));
+  if (!stream) return PlaceKind::kUnknown;
+  fd.Release();
   for (;;) {
     errno = 0;
     const dirent* entry = readdir(stream.get());

@@ -131,6 +131,8 @@ Json::Value IndexDaemon::Status() const {
 }
 
 bool IndexDaemon::Stop(std::chrono::milliseconds time) {
+  server_->Finish(kLastAnswersMs);
+  server_.reset();
   return workers_.StopAll(time);
 }
 

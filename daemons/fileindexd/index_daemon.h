@@ -33,8 +33,9 @@ class IndexDaemon : private CommandTarget {
   // Step() returns as soon as `fd` is readable.
   void WakeOn(int fd) { server_->WakeOn(fd); }
 
-  // Takes no more commands and stops the workers. Returns whether all have ended in that time; the
-  // socket file is gone in any case. Nothing else may be called afterwards.
+  // Removes the socket file, answers the last commands (which takes 0.2 s at most) and stops the
+  // workers. Returns whether all workers have ended in `time`. Nothing else may be called
+  // afterwards.
   bool Stop(std::chrono::milliseconds time);
 
  private:

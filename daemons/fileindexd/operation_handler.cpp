@@ -2,6 +2,7 @@
 
 #include "common/file_util.h"
 #include "daemons/common/log.h"
+#include "daemons/fileindexd/stamps.h"
 
 namespace quarry::fileindexd {
 
@@ -13,6 +14,22 @@ using fileindex::OP_NONE;
 using fileindex::OP_REINDEX;
 using fileindex::OP_RENAME;
 using fileindex::OP_UPDATE_CFG;
+
+namespace {
+
+bool IsOfKind(const std::optional<Document>& document, PlaceKind kind) {
+  return document && document->is_dir == (kind == PlaceKind::kDirectory);
+}
+
+// Whether a file's document was made of the file that is there now, and not, as when a pass is done
+// again, of one that has taken its old place since. A directory's is good in any case: what lies
+// below it is compared afterwards.
+bool IsSameFile(const Document& document, const Place& place) {
+  return document.is_dir || document.content_stamp.empty() ||
+         SameInode(document.attribute_stamp, place.attribute_stamp);
+}
+
+}  // namespace
 
 OperationHandler::OperationHandler(const PassTools& tools, const std::string& share_root)
     : tools_(tools), reconciler_(tools), share_root_(share_root) {}
@@ -53,9 +70,10 @@ void OperationHandler::HandleIndex(const std::string& path) {
 }
 
 void OperationHandler::HandleAttributes(const std::string& path) {
-  if (tools_.survey.Examine(path).verdict != Verdict::kWanted) return reconciler_.Reconcile(path);
+  const Finding finding = tools_.survey.Examine(path);
+  if (finding.verdict != Verdict::kWanted) return reconciler_.Reconcile(path);
   tools_.lane.Settle(path);
-  if (tools_.index.Find(path)) {
+  if (IsOfKind(tools_.index.Find(path), finding.place.kind)) {
     tools_.writer.SetAttributes(path);
   } else {
     reconciler_.Reconcile(path);
@@ -96,7 +114,7 @@ void OperationHandler::MoveDocuments(const std::string& new_path, const std::str
   if (finding.verdict != Verdict::kWanted) return;
   tools_.lane.Drain();
   const std::optional<Document> document = tools_.index.Find(old_path);
-  if (!document || document->is_dir != (finding.place.kind == PlaceKind::kDirectory)) return;
+  if (!IsOfKind(document, finding.place.kind) || !IsSameFile(*document, finding.place)) return;
   tools_.writer.Rename(new_path, old_path);
   const bool same_kind = GetFileExtension(new_path, true) == GetFileExtension(old_path, true);
   if (finding.place.kind == PlaceKind::kFile && !same_kind) {
@@ -110,10 +128,12 @@ void OperationHandler::HandleFullReindex() {
 }
 
 bool OperationHandler::RemoveOrphans() {
+  // Documents of paused folders are counted, too, but were not walked over.
   if (tools_.index.Count() <= reconciler_.WantedCount()) return false;
-  daemon::LogWarning("The index of " + share_root_ +
-                     " holds documents that no directory leads to; looking for them");
-  reconciler_.SweepOrphans(share_root_);
+  const std::uint64_t removed = reconciler_.SweepOrphans();
+  if (removed == 0) return false;
+  daemon::LogWarning("Removed " + std::to_string(removed) + " documents from the index of " +
+                     share_root_ + " that no directory led to");
   return true;
 }
 

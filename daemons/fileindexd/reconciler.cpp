@@ -4,20 +4,13 @@
 #include <cstddef>
 #include <utility>
 
+#include "daemons/fileindexd/stamps.h"
+
 namespace quarry::fileindexd {
 namespace {
 
 // Documents that are asked for at a time.
 constexpr std::size_t kPage = 5000;
-
-// The device's number, which comes first, may be another one after each start of the machine; the
-// rest tells well enough whether it is the same file in the same state.
-bool SameAttributes(const std::string& a, const std::string& b) {
-  const std::size_t rest_a = a.find(':');
-  const std::size_t rest_b = b.find(':');
-  if (rest_a == std::string::npos || rest_b == std::string::npos) return false;
-  return a.compare(rest_a, std::string::npos, b, rest_b, std::string::npos) == 0;
-}
 
 // The documents directly in a directory, in ascending order of paths, a page at a time.
 class ChildCursor {
@@ -207,15 +200,18 @@ void Reconciler::DropAroundFolders(const std::string& path) {
   tools_.writer.Remove(path);
 }
 
-void Reconciler::SweepOrphans(const std::string& share_root) {
+std::uint64_t Reconciler::SweepOrphans() {
+  std::uint64_t removed = 0;
   std::string after;
   for (;;) {
-    const std::vector<std::string> paths = tools_.index.PathsBelow(share_root, after, kPage);
+    const std::vector<std::string> paths = tools_.index.PathsBelow("", after, kPage);
     for (const std::string& path : paths) {
       tools_.gate.Pass();
-      if (tools_.survey.Examine(path).verdict == Verdict::kUnwanted) tools_.writer.Remove(path);
+      if (tools_.survey.Examine(path).verdict != Verdict::kUnwanted) continue;
+      tools_.writer.Remove(path);
+      ++removed;
     }
-    if (paths.size() < kPage) return;
+    if (paths.size() < kPage) return removed;
     after = paths.back();
   }
 }

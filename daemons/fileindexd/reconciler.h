@@ -44,8 +44,9 @@ class Reconciler {
   // One place, without what lies below it. `document` is what the index has there.
   void Bring(const std::string& path, const Place& place, const std::optional<Document>& document);
 
-  // Removes documents that no directory leads to. Asks for all documents.
-  void SweepOrphans(const std::string& share_root);
+  // Removes documents that no directory leads to, wherever they claim to be, and returns how many.
+  // Asks for all documents.
+  std::uint64_t SweepOrphans();
 
   // Places that the last ReconcileAll() found wanted.
   std::uint64_t WantedCount() const { return wanted_; }

@@ -20,6 +20,10 @@ constexpr milliseconds kPoll(200);
 constexpr milliseconds kFirstBackoff(500);
 constexpr milliseconds kLongestBackoff = seconds(60);
 
+// An index is missing for a moment while it gets another name. One that was made anew then would
+// take the name, and be empty.
+constexpr int kMissesBeforeCreate = 3;
+
 // A queue that is there but empty was only touched in order to lock it.
 bool HasLines(const std::string& path) {
   struct stat status {};
@@ -67,8 +71,10 @@ Worker::Milliseconds Worker::Step() {
     RefreshLayout();
     ClaimReindex();
     if (gate_.Paused() || layout_.rules->AllPaused()) return kPoll;
+    FollowRoot();
     if (!HasWork()) {
-      if (last_error_.empty()) progress_.SetState(WorkState::kIdle);
+      Recover();
+      progress_.SetState(WorkState::kIdle);
       return kPoll;
     }
     progress_.SetState(WorkState::kIndexing);
@@ -86,23 +92,22 @@ Worker::Milliseconds Worker::Step() {
 }
 
 // The folder list is loaded when it may have changed, in the middle of a pass too.
-bool Worker::RefreshLayout() {
-  if (!reload_.exchange(false)) return false;
+void Worker::RefreshLayout() {
+  if (!reload_.exchange(false)) return;
   try {
     ShareLayout layout = parts_.host->Load();
     // While a folder was paused nobody watched it.
-    if (layout_.rules && HasNewlyActive(*layout_.rules, *layout.rules)) compare_all_ = true;
+    if (layout_.rules && HasNewlyActive(*layout_.rules, *layout.rules)) CompareAll();
     layout_ = std::move(layout);
     progress_.SetFolders(layout_.rules);
   } catch (...) {
     reload_ = true;
     throw;
   }
-  return true;
 }
 
 Survey::Rules Worker::CurrentRules() {
-  if (reload_) RefreshLayout();
+  RefreshLayout();
   return layout_.rules;
 }
 
@@ -112,7 +117,7 @@ void Worker::ClaimReindex() {
   if (!check_status_.exchange(false)) return;
   try {
     if (!parts_.host->NeedsReindex()) return;
-    compare_all_ = true;
+    CompareAll();
     parts_.host->ClearNeedsReindex();
   } catch (...) {
     check_status_ = true;
@@ -120,33 +125,41 @@ void Worker::ClaimReindex() {
   }
 }
 
-bool Worker::HasWork() {
-  return compare_all_ || Exists(layout_.queue_path + ".tmp") || HasLines(layout_.queue_path);
+// Another directory in the share's place, such as a disk's that was mounted meanwhile, comes
+// without an event.
+void Worker::FollowRoot() {
+  const Identity root = parts_.files->Identify(layout_.root);
+  if (root == root_) return;
+  root_ = root;
+  CompareAll();
+}
+
+bool Worker::HasWork() const {
+  return MustCompare() || Exists(layout_.queue_path + ".tmp") || HasLines(layout_.queue_path);
 }
 
 void Worker::RunOnePass() {
-  const Identity root = parts_.files->Identify(layout_.root);
-  CheckShareIsThere(root);
+  CheckShareIsThere();
+  const std::uint64_t asked = compares_asked_;
   const PassSetup setup{layout_.queue_path, layout_.root,  *parts_.index,  survey_, gate_,
-                        progress_,          *parts_.slots, parts_.threads, root};
-  if (RunPass(setup, compare_all_) == PassResult::kAgain) {
+                        progress_,          *parts_.slots, parts_.threads, root_};
+  if (RunPass(setup, MustCompare()) == PassResult::kAgain) {
     daemon::LogWarning("The search engine was started anew while share " + share_ +
                        " was indexed; doing it again");
     return;
   }
-  compare_all_ = false;
-  backoff_ = milliseconds(0);
-  if (!last_error_.empty()) daemon::LogInfo("Share " + share_ + " is indexed again");
-  last_error_.clear();
+  compares_done_ = asked;
+  missing_index_ = 0;
+  Recover();
   progress_.EndPass("");
 }
 
 // All documents of a disk that is unplugged would be deleted otherwise.
-void Worker::CheckShareIsThere(const Identity& root) {
-  if (!root.exists || (was_mounted_ && !root.mount_root)) {
+void Worker::CheckShareIsThere() {
+  if (!root_.exists || (was_mounted_ && !root_.mount_root)) {
     throw Error(kErrorSystem, "The share's directory " + layout_.root + " is not there");
   }
-  was_mounted_ = root.mount_root;
+  was_mounted_ = root_.mount_root;
 }
 
 Worker::Milliseconds Worker::Fail(const std::string& error) {
@@ -159,12 +172,23 @@ Worker::Milliseconds Worker::Fail(const std::string& error) {
   return backoff_;
 }
 
+// Also where there is nothing left to do, as after a folder list that could not be loaded.
+void Worker::Recover() {
+  backoff_ = milliseconds(0);
+  if (last_error_.empty()) return;
+  daemon::LogInfo("Share " + share_ + " is indexed again");
+  last_error_.clear();
+  progress_.EndPass("");
+}
+
 void Worker::HandleMissingIndex(const Error& error) {
-  if (Classify(error) != Failure::kIndexMissing) return;
+  missing_index_ = Classify(error) == Failure::kIndexMissing ? missing_index_ + 1 : 0;
+  if (missing_index_ < kMissesBeforeCreate) return;
   try {
     if (!parts_.host->CreateIndexIfWanted([this] { parts_.index->Create(); })) return;
     daemon::LogWarning("The index of share " + share_ + " was missing; made it anew");
-    compare_all_ = true;
+    missing_index_ = 0;
+    CompareAll();
   } catch (const Error& failure) {
     daemon::LogError("The index of share " + share_ + " cannot be made: " + Describe(failure));
   }

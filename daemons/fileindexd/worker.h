@@ -8,6 +8,7 @@
 #include <atomic>
 #include <chrono>
 #include <cstddef>
+#include <cstdint>
 #include <memory>
 #include <optional>
 #include <string>
@@ -56,14 +57,18 @@ class Worker {
   Json::Value Report() const { return progress_.Report(gate_.Paused()); }
 
  private:
-  bool RefreshLayout();
-  bool HasWork();
-  void ClaimReindex();
-  void RunOnePass();
-  void CheckShareIsThere(const Identity& root);
-  Milliseconds Fail(const std::string& error);
-  void HandleMissingIndex(const Error& error);
+  void RefreshLayout();
   Survey::Rules CurrentRules();
+  void ClaimReindex();
+  void FollowRoot();
+  void CompareAll() { ++compares_asked_; }
+  bool MustCompare() const { return compares_done_ != compares_asked_; }
+  bool HasWork() const;
+  void RunOnePass();
+  void CheckShareIsThere();
+  Milliseconds Fail(const std::string& error);
+  void Recover();
+  void HandleMissingIndex(const Error& error);
 
   const std::string share_;
   WorkerParts parts_;
@@ -75,8 +80,12 @@ class Worker {
   // The worker's thread only.
   ShareLayout layout_;
   Survey survey_;
-  bool compare_all_ = true;
+  Identity root_;  // as it was last seen
   bool was_mounted_ = false;
+  // Comparing the whole share may be asked for again while a pass does it.
+  std::uint64_t compares_asked_ = 1;
+  std::uint64_t compares_done_ = 0;
+  int missing_index_ = 0;  // passes in a row that failed for want of it
   std::string last_error_;
   Milliseconds backoff_{0};
 };
