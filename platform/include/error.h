@@ -11,7 +11,8 @@ constexpr int kHLIBErrQuota = 0x2400;
 
 extern "C" {
 
-// The number, and the source file and line that set it. 0, "" and 0 before any error.
+// The number, and the source file and line that set it. 0, "" and 0 before any error. A success
+// leaves them as they are. The file's name belongs to the platform.
 QUARRY_EXPORT int HLIBCErrGet();
 QUARRY_EXPORT const char* HLIBCErrorGetFile();
 QUARRY_EXPORT int HLIBCErrorGetLine();

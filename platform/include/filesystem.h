@@ -1,4 +1,8 @@
 // What a place in the file system is, who may use it, and how much room it has.
+//
+// Paths are NUL-terminated bytes. A negative result sets the platform's last error
+// (platform/include/error.h). All may be called from any thread, and block as long as the file
+// system does.
 
 #ifndef QUARRY_PLATFORM_INCLUDE_FILESYSTEM_H_
 #define QUARRY_PLATFORM_INCLUDE_FILESYSTEM_H_
@@ -35,21 +39,22 @@ QUARRY_EXPORT int HLIBFhsPathInSnapshot(const char* path, int* in_snapshot);
 // Whether `name`, one path component, is a hidden metadata directory of the platform: 1 or 0.
 QUARRY_EXPORT int TARNEAIsHiddenDir(const char* name);
 
-// The caller's effective permission bits on `path` (1 execute, 2 write, 4 read), or negative.
+// The permission bits of the process's effective user on `path` (1 execute, 2 write, 4 read), or
+// negative.
 QUARRY_EXPORT int TARNACLPermGet(const char* path);
 
 // Whether the user `uid` can still write `bytes` bytes to the volume that holds `path`: nonzero if
 // so, else 0 with the reason as the platform's last error.
 QUARRY_EXPORT int TARNQuotaIsEnough(const char* path, unsigned int uid, unsigned long long bytes);
 
-// Copies a file or a directory with all that is in it. 0, or negative with errno set; what was
-// copied before a failure may be left behind, the source is whole.
+// Copies a file or a directory with all that is in it. `args` stays the caller's. 0, or negative
+// with errno set; what was copied before a failure may be left behind, the source is whole.
 QUARRY_EXPORT int TARNFileCopy(const char* from, const char* to, TARNCOPYARGS* args);
-
-}  // extern "C"
 
 // Compares two UTF-8 texts without regard to case: negative, 0 or positive. Bytes that are not
 // UTF-8 compare as they are.
-extern "C" QUARRY_EXPORT int HLIBCUnicodeUTF8StrCaseCmp(const char* a, const char* b);
+QUARRY_EXPORT int HLIBCUnicodeUTF8StrCaseCmp(const char* a, const char* b);
+
+}  // extern "C"
 
 #endif  // QUARRY_PLATFORM_INCLUDE_FILESYSTEM_H_

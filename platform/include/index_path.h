@@ -2,7 +2,7 @@
 //
 // Each writes a NUL-terminated text into a buffer of `size` bytes and returns 0, or a negative
 // number when the argument is no absolute path of a share (or no name) or the buffer is too small.
-// Nothing is created or looked up.
+// Nothing is created or looked up. All may be called from any thread.
 
 #ifndef QUARRY_PLATFORM_INCLUDE_INDEX_PATH_H_
 #define QUARRY_PLATFORM_INCLUDE_INDEX_PATH_H_

@@ -5,7 +5,7 @@
 
 #include "common/export.h"
 
-// A growing list of NUL-terminated strings, allocated by the platform.
+// A growing list of NUL-terminated strings, allocated by the platform. One thread at a time.
 struct HLIBCSZLIST;
 
 extern "C" {

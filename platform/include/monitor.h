@@ -13,6 +13,8 @@ namespace TARN::TARNOTIFYD {
 
 enum MonitorQueueType { MONITOR_QUEUE_TYPE_APPLICATION = 1 };
 
+// May be called from any thread; blocks until the configuration is on disk.
+//
 // One queue's configuration: {"queue": file, "config": [{"path", "mask", "ignore": [name, ...]}]}.
 class QUARRY_EXPORT MonitorQueue {
  public:

@@ -1,7 +1,8 @@
 // Services of the machine, the file-sharing service's search support, and running programs.
 //
 // Functions that return int return a negative number on failure, with the platform's last error
-// set, unless said otherwise.
+// set, else 0 unless said otherwise. They block until the service manager has answered or the
+// program has ended, and may be called from any thread.
 
 #ifndef QUARRY_PLATFORM_INCLUDE_SERVICE_H_
 #define QUARRY_PLATFORM_INCLUDE_SERVICE_H_
@@ -20,6 +21,7 @@ QUARRY_EXPORT int HLIBServiceStart(const char* name, int wait);
 // does not let it finish its work.
 QUARRY_EXPORT int HLIBServiceStop(const char* name, int force);
 
+// Stops a service, where it runs, and starts it.
 QUARRY_EXPORT int HLIBServiceRestart(const char* name);
 
 // The same for a job; `kind` is HLIB_SERVICECTL_UPSTART.

@@ -1,7 +1,8 @@
 // Accounts, and becoming one of them.
 //
 // Functions that return int return 0 on success (or the value said) and a negative number on
-// failure, with the platform's last error set. None is safe for threads.
+// failure, with the platform's last error set (platform/include/error.h). None is safe for threads:
+// callers hold one lock around them.
 
 #ifndef QUARRY_PLATFORM_INCLUDE_USER_H_
 #define QUARRY_PLATFORM_INCLUDE_USER_H_
@@ -31,9 +32,10 @@ QUARRY_EXPORT int HLIBGroupIsAdminGroupMem(const char* name, int flags);
 
 }  // extern "C"
 
-// Makes the account the process's effective user, with its groups. Returns whether it did. With
-// `keep_privilege` the process may switch again afterwards. A process that was started without the
-// right to switch is every account it is asked to become, and succeeds without effect.
+// Makes the account the effective user of the whole process, with its groups. Returns whether it
+// did; the platform's last error is set when not. With `keep_privilege` the process may switch
+// again afterwards. A process that was started without the right to switch is every account it is
+// asked to become, and succeeds without effect.
 QUARRY_EXPORT bool ResetCredentialsByName(const std::string& name, bool keep_privilege = true);
 
 #endif  // QUARRY_PLATFORM_INCLUDE_USER_H_
