@@ -1,12 +1,10 @@
 #include "fileindex/index_mgr.h"
 
-#include <cstdio>
 #include <memory>
 #include <set>
 #include <string>
 #include <vector>
 
-#include "comm/communication.h"
 #include "comm/elastic_control.h"
 #include "common/error.h"
 #include "common/json.h"
@@ -16,26 +14,16 @@
 #include "common/sdk/share.h"
 #include "fileindex/config/folder.h"
 #include "fileindex/config/folder_mgr.h"
+#include "fileindex/config/status_mgr.h"
 #include "fileindex/index_mgr_internal.h"
 #include "fileindex/queue/event.h"
 #include "fileindex/util/custom_event.h"
 #include "fileindex/util/util.h"
-#include "platform/include/error.h"
-#include "platform/include/monitor.h"
-#include "platform/include/service.h"
 
 namespace quarry::fileindex {
 namespace {
 
-using TARN::TARNOTIFYD::MONITOR_QUEUE_TYPE_APPLICATION;
-using TARN::TARNOTIFYD::MonitorQueue;
 using FolderPtr = std::shared_ptr<Folder>;
-
-constexpr char kAppName[] = "fileindex";
-constexpr char kMetadataDirectory[] = "@eaDir";
-constexpr unsigned int kMonitorMask = 0xFFC6;
-constexpr int kWait = 1;     // TRUE of the service interface
-constexpr int kNoForce = 0;  // FALSE of the service interface
 
 const std::string kFolderLockPath = RootedPath("/tmp/quarry_cfg_folder.lock");
 
@@ -80,95 +68,37 @@ void UpsertOne(FolderMgr& folder_mgr, FolderChanges& changes, const Json::Value&
   changes.shares.insert(share_name);
 }
 
-// Logs a failed step of SetupRelatedServices, which has no reason beside errno.
-void LogServiceFailure(const char* condition) {
-  LogError({"index_mgr.cpp", __LINE__, "SetupRelatedServices"},
-           std::string("Failed [") + condition + "]");
-}
-
-// The same for a step of which the platform says more.
-void LogSharingFailure(const char* call) {
-  char error[16];
-  std::snprintf(error, sizeof(error), "0x%04X", static_cast<unsigned int>(HLIBCErrGet()));
-  LogError({"index_mgr.cpp", __LINE__, "SetupRelatedServices"},
-           std::string(call) + " failed: err=[" + error + " " + HLIBCErrorGetFile() + ":" +
-               std::to_string(HLIBCErrorGetLine()) + "]");
-}
-
-// The sharing service is restarted only for a change: that interrupts its users. Where the platform
-// cannot tell what is set, it is left as it is.
-void SetupSearchOfSharingService(bool enable) {
-  const int enabled = TARNSMBIsEnableSpotlight();
-  if (0 > enabled) LogServiceFailure("0 > TARNSMBIsEnableSpotlight()");
-  if (0 > enabled || (enabled != 0) == enable) return;
-  if (0 > TARNSMBSetSpotlight(enable ? 1 : 0)) {
-    LogSharingFailure("TARNSMBSetSpotlight");
-  } else if (0 > HLIBServiceRestart("samba")) {
-    LogSharingFailure("HLIBServiceRestart");
+void RequireArray(const char* function, const Json::Value& path_list) {
+  if (!path_list.isArray()) {
+    Fail({"index_mgr.cpp", __LINE__, function}, "!path_list.isArray()", kErrorBadParameter,
+         toString(path_list));
   }
 }
 
-void StartServices() {
-  if (0 > HLIBServiceStart("tarncontentextractd", kWait)) {
-    LogServiceFailure("0 > HLIBServiceStart(\"tarncontentextractd\", TRUE)");
+std::string PathOf(const char* function, const Json::Value& it) {
+  if (!it.isString()) {
+    Fail({"index_mgr.cpp", __LINE__, function}, "!it.isString()", kErrorBadParameter, toString(it));
   }
-  if (0 > HLIBServicectlStart("pkg-Quarry-fileindexd", HLIB_SERVICECTL_UPSTART)) {
-    LogServiceFailure(
-        "0 > HLIBServicectlStart(\"pkg-Quarry-fileindexd\", HLIB_SERVICECTL_UPSTART)");
-  }
+  return it.asString();
 }
 
-void StopServices() {
-  if (0 > HLIBServiceStop("tarncontentextractd", kNoForce)) {
-    LogServiceFailure("0 > HLIBServiceStop(\"tarncontentextractd\", FALSE)");
-  }
-  if (0 > HLIBServicectlStop("pkg-Quarry-fileindexd", HLIB_SERVICECTL_UPSTART)) {
-    LogServiceFailure("0 > HLIBServicectlStop(\"pkg-Quarry-fileindexd\", HLIB_SERVICECTL_UPSTART)");
-  }
+// A new, empty index, to be filled from the disk.
+void RebuildShareIndex(const std::string& share_name) {
+  const sdk::SDKShare share(share_name);
+  elastic::ShareIndexDelete(share_name);
+  elastic::ShareIndexCreate(share_name);
+  AddCustomEvent(EVENT_REINDEX, share.GetPath(), "", Json::Value());
 }
 
-Json::Value MonitorEntry(const Folder& folder) {
-  Json::Value entry;
-  entry["path"] = folder.GetFullPath();
-  entry["mask"] = kMonitorMask;
-  entry["ignore"] = Vec2JsonArr<std::string>({kMetadataDirectory});
-  return entry;
+// Takes the machinery of a share down that has no folder any more.
+void RemoveShareIndex(const std::string& share_name) {
+  const sdk::SDKShare share(share_name);
+  elastic::ShareIndexDelete(share_name);
+  DeleteTARNotifydCfg(share_name);
+  CleanShareIndexData(share_name, share.GetPath());
 }
 
 }  // namespace
-
-void SetupRelatedServices(bool enable) {
-  SetupSearchOfSharingService(enable);
-  if (enable) {
-    StartServices();
-  } else {
-    StopServices();
-  }
-}
-
-void NotifySettingChanged(const std::string& share_name, bool is_upsert) {
-  Json::Value data;
-  data["share_name"] = share_name;
-  data["is_upsert"] = is_upsert;
-  SendCommandToDaemon("notify_setting_changed", data);
-}
-
-void UpsertTARNotifydCfg(const std::string& share_name, const FolderMgr& folder_mgr) {
-  const sdk::SDKShare share(share_name);
-  Json::Value config(Json::arrayValue);
-  for (const FolderPtr& folder : folder_mgr.GetFolders()) {
-    if (folder->GetShare() == share_name) config.append(MonitorEntry(*folder));
-  }
-  Json::Value data;
-  data["queue"] = share.GetQueuePath();
-  data["config"] = config;
-  const MonitorQueue monitor_queue(data);
-  if (!MonitorQueue::Upsert(monitor_queue, kAppName, MONITOR_QUEUE_TYPE_APPLICATION)) {
-    Fail(QUARRY_SITE("index_mgr"),
-         "!MonitorQueue::Upsert(monitor_queue, kAppName, MONITOR_QUEUE_TYPE_APPLICATION)",
-         kErrorSystem, "MonitorQueue::Upsert failed, share=" + share_name);
-  }
-}
 
 void FolderUpsert(const Json::Value& folder_list, bool create, bool updater_mode) {
   const LockFile lock(kFolderLockPath, true);
@@ -205,6 +135,64 @@ void FolderSet(const Json::Value& folder_list, bool updater_mode) {
   FolderUpsert(folder_list, false, updater_mode);
 }
 
+void FolderReindex(const Json::Value& path_list) {
+  StatusMgr status_mgr;
+  const FolderMgr folder_mgr;
+  RequireArray(__func__, path_list);
+  std::set<std::string> rebuild;
+  std::set<std::string> touched;
+  for (const Json::Value& it : path_list) {
+    const std::string path = PathOf(__func__, it);
+    const std::string share = GetShareNameByPath(path);
+    if (!folder_mgr.IsShareIndexed(share)) continue;
+    if ((status_mgr.GetShareStatus(share) & kShareNeedRebuild) != 0) {
+      rebuild.insert(share);
+    } else {
+      AddCustomEvent(EVENT_REINDEX, GetFullPath(path), "", Json::Value());
+    }
+    touched.insert(share);
+  }
+  for (const std::string& share : rebuild) RebuildShareIndex(share);
+  for (const std::string& share : touched) {
+    if ((status_mgr.GetShareStatus(share) & kShareNeedReindex) != 0) {
+      status_mgr.UnsetShareStatus(share, kShareNeedReindex | kShareNeedRebuild);
+    }
+  }
+}
+
+void FolderDelete(const Json::Value& path_list) {
+  const LockFile lock(kFolderLockPath, true);
+  FolderMgr folder_mgr;
+  RequireArray(__func__, path_list);
+  std::vector<FolderPtr> removed;
+  std::set<std::string> shares;
+  for (const Json::Value& it : path_list) {
+    const std::string path = PathOf(__func__, it);
+    FolderPtr folder;
+    // An enclosing folder would answer for a path that is no folder itself.
+    folder_mgr.Get(folder, path);
+    folder_mgr.Delete(folder, path);
+    removed.push_back(folder);
+    shares.insert(GetShareNameByPath(path));
+  }
+
+  // From here on the world outside changes, and a failure leaves behind what was done before it.
+  for (const std::string& share : shares) {
+    if (folder_mgr.IsShareIndexed(share)) {
+      UpsertTARNotifydCfg(share, folder_mgr);
+    } else {
+      RemoveShareIndex(share);
+    }
+  }
+  folder_mgr.Save();
+  for (const std::string& share : shares) NotifySettingChanged(share, false);
+  for (const FolderPtr& folder : removed) {
+    if (!folder_mgr.IsShareIndexed(folder->GetShare())) continue;
+    AddCustomEvent(EVENT_UPDATE_CFG, folder->GetFullPath(), "", folder->GetIndexCfg());
+  }
+  if (folder_mgr.GetFolders().empty()) SetupRelatedServices(false);
+}
+
 void FolderGet(Json::Value& result, const std::string& path) {
   const FolderMgr folder_mgr;
   FolderPtr folder;
@@ -225,10 +213,6 @@ void FolderList(Json::Value& result, unsigned int offset, unsigned int limit,
   result["total"] = total;
   result["offset"] = offset;
   for (const FolderPtr& folder : folders) list.append(folder->GetDataWithAdditional(additional));
-}
-
-void PrepareServices() {
-  SetupRelatedServices(!FolderMgr().GetFolders().empty());
 }
 
 }  // namespace quarry::fileindex

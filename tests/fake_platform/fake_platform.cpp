@@ -259,9 +259,9 @@ void AddShareRecycle(const std::string& directory) {
   TheWorld().share_recycles.insert(directory);
 }
 
-void AddHomeRecycle(const std::string& directory) {
+void AddHomeRecycle(const std::string& directory, int auth) {
   WorldLock lock(TheWorld().mutex);
-  TheWorld().home_recycles.insert(directory);
+  TheWorld().home_recycles[auth].insert(directory);
 }
 
 void AddHiddenDirName(const std::string& name) {

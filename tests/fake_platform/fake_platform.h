@@ -96,7 +96,9 @@ void AddMountPoint(const std::string& path);
 // The directory and all below it.
 void AddSnapshot(const std::string& directory);
 void AddShareRecycle(const std::string& directory);
-void AddHomeRecycle(const std::string& directory);
+// The same for the home folder of an account of the kind `auth`, an AUTH_TYPE. The platform lists
+// them in ascending order of the kinds and of the bytes.
+void AddHomeRecycle(const std::string& directory, int auth = 0);
 void AddHiddenDirName(const std::string& name);
 // The permission bits on exactly this path.
 void SetACLPerm(const std::string& path, int bits);

@@ -61,6 +61,10 @@ int Copy(const std::string& from, const std::string& to, bool move) {
   return -1;
 }
 
+void Push(const std::set<std::string>& texts, HLIBCSZLIST** list) {
+  for (const std::string& text : texts) HLIBCSzListPush(text.c_str(), list);
+}
+
 }  // namespace
 
 extern "C" {
@@ -155,7 +159,23 @@ int TARNRecycleUserHomePathIsExist(const char* full_path, int kind) {
   const auto failure = Called("TARNRecycleUserHomePathIsExist", full_path, kind);
   if (failure) return failure->result;
   WorldLock lock(TheWorld().mutex);
-  return quarry::fake::IsWithinAny(full_path, TheWorld().home_recycles) ? 1 : 0;
+  for (const auto& [auth, directories] : TheWorld().home_recycles) {
+    if (quarry::fake::IsWithinAny(full_path, directories)) return 1;
+  }
+  return 0;
+}
+
+int TARNRecycleHomeEnumRecyclePath(HLIBCSZLIST** list) {
+  if (const auto failure = Called("TARNRecycleHomeEnumRecyclePath")) return failure->result;
+  for (const auto& [auth, directories] : TheWorld().home_recycles) Push(directories, list);
+  return 0;
+}
+
+int TARNRecycleHomeEnumRecyclePathForAuthType(HLIBCSZLIST** list, AUTH_TYPE auth) {
+  const auto failure = Called("TARNRecycleHomeEnumRecyclePathForAuthType", static_cast<int>(auth));
+  if (failure) return failure->result;
+  Push(TheWorld().home_recycles[auth], list);
+  return 0;
 }
 
 int FILEIDXQueuePathCompose(const char* share_path, char* buffer, size_t size) {

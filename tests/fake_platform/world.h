@@ -44,7 +44,7 @@ struct World {
   std::set<std::string> mount_points;
   std::set<std::string> snapshots;
   std::set<std::string> share_recycles;
-  std::set<std::string> home_recycles;
+  std::map<int, std::set<std::string>> home_recycles;  // by kind of account
   std::set<std::string> hidden_names;
   std::map<std::string, int> acl_bits;
   bool quota_enough = true;
