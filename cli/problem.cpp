@@ -22,6 +22,8 @@ constexpr Explanation kExplanations[] = {
     {kErrorSaveFile, "A state file cannot be written; check free space and permissions"},
     {kErrorLock, "Another process holds the lock; try again when it is done"},
     {kErrorShareNotFound, "There is no such share; \"quarry share list\" names those there are"},
+    {kErrorServiceAccount,
+     "The account that the package runs as is missing; install the package anew"},
     {kErrorTooManyFolders, "The list of folders is full (1000); remove one first"},
     {kErrorFolderExists, "The folder is indexed already; change it with \"quarry folder set\""},
     {kErrorFolderNotFound,
@@ -33,6 +35,9 @@ constexpr Explanation kExplanations[] = {
     {kErrorMalformedEvent, "The share's queue holds a line that cannot be read"},
     {kErrorEngineRequest,
      "The search engine (tarnelasticd) did not answer; start it with \"quarry run\""},
+    {kErrorParseDocument,
+     "A document could not be read; see that tarncontentextractd runs (\"quarry status\")"},
+    {kErrorEngineQuery, "The search engine could not look up or move entries; see its log"},
     {kErrorNoSpace, "The volume is full; free at least 100 MiB, then try again"},
     {kErrorEngineBusy, "The search engine is busy; try again in a while"},
     {kErrorEngineBusyMemory, "The search engine is busy; try again in a while"},
@@ -44,8 +49,12 @@ std::string Explain(const Error& error) {
   const int code = error.code();
   const auto* found = std::find_if(std::begin(kExplanations), std::end(kExplanations),
                                    [&](const Explanation& e) { return e.code == code; });
-  std::string text = found != std::end(kExplanations) ? found->text : "The request failed";
-  if (!error.reason().empty()) text += ": " + error.reason();
+  std::string text = error.reason();
+  if (found != std::end(kExplanations)) {
+    text = std::string(found->text) + (text.empty() ? text : ": " + text);
+  } else if (text.empty()) {
+    text = "The request failed";  // the engine gives a reason with each code of its own
+  }
   return text + " (code " + std::to_string(code) + ")";
 }
 

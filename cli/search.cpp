@@ -69,6 +69,16 @@ struct Free {
 
 }  // namespace
 
+std::string QueryOf(const std::vector<std::string>& words) {
+  if (words.size() == 1) return words.front();
+  std::string query;
+  for (const std::string& word : words) {
+    const bool phrase = word.find(' ') != std::string::npos && word.find('"') == std::string::npos;
+    query += (query.empty() ? "" : " ") + (phrase ? "\"" + word + "\"" : word);
+  }
+  return query;
+}
+
 Json::Value Search(const SearchRequest& request) {
   Json::Value data;
   data["ids"] = Vec2JsonArr<std::string>(IndexedShares());
@@ -87,8 +97,7 @@ void PrintHits(std::ostream& out, const Json::Value& found, unsigned int offset,
     if (total == 0) {
       out << "Nothing found.\n";
     } else if (number < total) {
-      out << number - offset << " of " << total << " shown; more with: quarry search --offset "
-          << number << '\n';
+      out << number - offset << " of " << total << " shown.\n";
     }
   } catch (const Json::Exception& failure) {
     throw Problem(std::string("The search engine's answer cannot be read: ") + failure.what());

@@ -7,6 +7,7 @@
 
 #include <iosfwd>
 #include <string>
+#include <vector>
 
 namespace quarry::cli {
 
@@ -16,10 +17,15 @@ struct SearchRequest {
   unsigned int limit = 10;
 };
 
+// The query that the words of a command line mean: a single one is a query as it stands; of several
+// those with blanks were quoted for the shell and are phrases.
+std::string QueryOf(const std::vector<std::string>& words);
+
 // The engine's answer: {"total", "hits": [...]}, over all indexed shares. Throws Problem or Error.
 Json::Value Search(const SearchRequest& request);
 
-// The hits for a person, numbered from `offset` + 1; matches are marked where `colours` says so.
+// The hits for a person, numbered from `offset` + 1, and how many there are; matches are marked
+// where `colours` says so.
 void PrintHits(std::ostream& out, const Json::Value& found, unsigned int offset, bool colours);
 
 // Asks for words and shows hits until the end of the input. A search that fails is reported and the

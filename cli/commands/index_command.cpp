@@ -55,12 +55,6 @@ double SecondsSince(std::chrono::steady_clock::time_point start) {
   return std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
 }
 
-std::string Joined(const std::vector<std::string>& words) {
-  std::string text;
-  for (const std::string& word : words) text += (text.empty() ? "" : " ") + word;
-  return text;
-}
-
 void Index(const std::string& argument, const std::vector<std::string>& words) {
   // What is wrong with the directory is said before anything is started or changed.
   const std::string directory = ResolveDirectory(argument);
@@ -79,7 +73,7 @@ void Index(const std::string& argument, const std::vector<std::string>& words) {
   if (words.empty()) {
     SearchPrompt();
   } else {
-    PrintHits(std::cout, Search({Joined(words), 0, 10}), 0, OutputIsTerminal());
+    PrintHits(std::cout, Search({QueryOf(words), 0, 10}), 0, OutputIsTerminal());
   }
 }
 

@@ -7,20 +7,6 @@
 #include "cli/search.h"
 
 namespace quarry::cli {
-namespace {
-
-// Words that the shell has split are one query; a word with blanks was quoted and is a phrase.
-std::string Query(const std::vector<std::string>& words) {
-  if (words.size() == 1) return words.front();
-  std::string query;
-  for (const std::string& word : words) {
-    const bool phrase = word.find(' ') != std::string::npos && word.find('"') == std::string::npos;
-    query += (query.empty() ? "" : " ") + (phrase ? "\"" + word + "\"" : word);
-  }
-  return query;
-}
-
-}  // namespace
 
 void AddSearchCommand(CLI::App& app) {
   CLI::App* search = app.add_subcommand("search", "Find files by name and content");
@@ -38,7 +24,7 @@ void AddSearchCommand(CLI::App& app) {
       "  quarry search 'cat OR dog type:photo'  either word; type: document, audio, video, photo\n"
       "  quarry search 'ext:pdf in:/srv/Docs name:plan'");
   search->callback([words, request, &json] {
-    request->query = Query(*words);
+    request->query = QueryOf(*words);
     const Json::Value found = Search(*request);
     if (json) {
       PrintJson(std::cout, found);
