@@ -1,6 +1,7 @@
 #include "fileindex/queue/ledger.h"
 
 #include <algorithm>
+#include <cstdint>
 #include <iterator>
 #include <string>
 
@@ -9,6 +10,40 @@ namespace {
 
 // Below this, comparing names one by one is faster than hashing.
 constexpr std::size_t kFewChildren = 8;
+
+bool IsWork(FileIndexOP kind) {
+  return kind == OP_INDEX || kind == OP_ATTR || kind == OP_REINDEX;
+}
+
+// Kinds that no rule knows fare as OP_FULL_REINDEX does.
+std::size_t Slot(FileIndexOP kind) {
+  return std::min<std::size_t>(static_cast<std::uint32_t>(kind), OP_FULL_REINDEX);
+}
+
+// Appends the shorter to the longer, and leaves the result in `to`.
+template <typename T>
+void Pour(std::vector<T>& from, std::vector<T>& to) {
+  if (to.size() < from.size()) to.swap(from);
+  to.insert(to.end(), std::make_move_iterator(from.begin()), std::make_move_iterator(from.end()));
+  from.clear();
+}
+
+// Appends the records of `later` to those of `set`.
+template <typename RecordSet>
+void Append(RecordSet& set, RecordSet& later) {
+  for (std::size_t kind = 0; kind < set.kinds.size(); ++kind) {
+    if (later.kinds[kind].recs.empty()) continue;
+    set.kinds[kind].last = set.entered + later.kinds[kind].last;
+    Pour(later.kinds[kind].recs, set.kinds[kind].recs);
+  }
+  set.entered += later.entered;
+}
+
+template <typename RecordSet>
+bool IsEmpty(const RecordSet& set) {
+  return std::all_of(set.kinds.begin(), set.kinds.end(),
+                     [](const auto& of_kind) { return of_kind.recs.empty(); });
+}
 
 }  // namespace
 
@@ -86,14 +121,31 @@ std::vector<OPNode*> Ledger::TakeMovable(OPNode& node) {
   return taken;
 }
 
-void Ledger::Enter(OPNode& node, OPNode::RecordIndex& index, OP* rec) {
-  if (rec->node.get() == &node) {
-    index.own.push_back(rec);
-  } else if (rec->op == OP_RENAME) {
+void Ledger::Enter(OPNode::RecordIndex& index, OP* rec) {
+  if (rec->op == OP_NONE) return;
+  if (rec->op == OP_RENAME) {
     ++index.renames;
-  } else if (rec->op != OP_NONE) {
-    index.foreign.push_back(rec);
+    return;
   }
+  OPNode::RecordIndex::RecordSet& set = index.about[rec->node.get()];
+  OPNode::RecordIndex::OfKind& of_kind = set.kinds[Slot(rec->op)];
+  of_kind.recs.push_back(rec);
+  of_kind.last = ++set.entered;
+}
+
+// All records of a kind have changed alike, or none has.
+void Ledger::Refile(OPNode::RecordIndex::RecordSet& set, FileIndexOP kind) {
+  OPNode::RecordIndex::OfKind& from = set.kinds[kind];
+  if (from.recs.empty()) return;
+  const FileIndexOP changed = from.recs.front()->op;
+  if (Slot(changed) == Slot(kind)) return;
+  if (changed == OP_NONE) {
+    from.recs.clear();
+    return;
+  }
+  OPNode::RecordIndex::OfKind& to = set.kinds[Slot(changed)];
+  to.last = to.recs.empty() ? from.last : std::max(to.last, from.last);
+  Pour(from.recs, to.recs);
 }
 
 OPNode::RecordIndex& Ledger::Sift(OPNode& node, const OP* current) {
@@ -101,16 +153,47 @@ OPNode::RecordIndex& Ledger::Sift(OPNode& node, const OP* current) {
     node.record_index_ = std::make_unique<OPNode::RecordIndex>();
   }
   OPNode::RecordIndex& index = *node.record_index_;
-  for (; index.seen < node.ops.size(); ++index.seen) {
-    Enter(node, index, node.ops[index.seen].get());
+  if (index.unsettled != nullptr && index.unsettled != current) {
+    Enter(index, std::exchange(index.unsettled, nullptr));
   }
-  const auto is_settled = [&index, current](const OP* rec) {
-    if (rec == current) return false;
-    if (rec->op == OP_RENAME) ++index.renames;
-    return rec->op == OP_RENAME || rec->op == OP_NONE;
-  };
-  index.own.erase(std::remove_if(index.own.begin(), index.own.end(), is_settled), index.own.end());
+  for (; index.seen < node.ops.size(); ++index.seen) {
+    OP* const rec = node.ops[index.seen].get();
+    if (rec == current) {
+      index.unsettled = rec;
+    } else {
+      Enter(index, rec);
+    }
+  }
   return index;
+}
+
+// The same when no event is being folded at this node. Afterwards only what is pending is listed.
+OPNode::RecordIndex& Ledger::SiftSettled(OPNode& node) {
+  OPNode::RecordIndex& index = Sift(node, nullptr);
+  const auto own = index.about.find(&node);
+  if (own != index.about.end() && IsEmpty(own->second)) index.about.erase(own);
+  return index;
+}
+
+FileIndexOP Ledger::TakeWork(OPNode& node) {
+  FileIndexOP work = OP_NONE;
+  if (IsShort(node.ops)) {
+    for (const std::shared_ptr<OP>& rec : node.ops) {
+      if (rec->node.get() == &node && IsWork(rec->op)) work = std::exchange(rec->op, OP_NONE);
+    }
+    return work;
+  }
+  OPNode::RecordIndex::RecordSet& own = Sift(node, nullptr).about[&node];
+  std::size_t last = 0;
+  for (const FileIndexOP kind : {OP_INDEX, OP_ATTR, OP_REINDEX}) {
+    OPNode::RecordIndex::OfKind& of_kind = own.kinds[kind];
+    if (of_kind.recs.empty()) continue;
+    if (of_kind.last > last) work = kind;
+    last = std::max(last, of_kind.last);
+    for (OP* rec : of_kind.recs) rec->op = OP_NONE;
+    of_kind.recs.clear();
+  }
+  return work;
 }
 
 bool Ledger::HasPending(OPNode& node) {
@@ -118,33 +201,45 @@ bool Ledger::HasPending(OPNode& node) {
     return std::any_of(node.ops.begin(), node.ops.end(),
                        [](const auto& rec) { return rec->op != OP_NONE; });
   }
-  const OPNode::RecordIndex& index = Sift(node, nullptr);
-  return index.renames > 0 || !index.own.empty() || !index.foreign.empty();
+  const OPNode::RecordIndex& index = SiftSettled(node);
+  return index.renames > 0 || !index.about.empty();
 }
 
 Ledger::Bundle Ledger::Take(OPNode& node) {
-  if (!IsShort(node.ops)) Sift(node, nullptr);
   Bundle bundle;
-  bundle.index = IsShort(node.ops) ? nullptr : std::move(node.record_index_);
+  if (!IsShort(node.ops)) {
+    SiftSettled(node);
+    bundle.index = std::move(node.record_index_);
+  }
   bundle.ops = std::exchange(node.ops, {});
   node.record_index_.reset();
   return bundle;
+}
+
+// The records of the longer index stay where they are, so that one that is moved to and fro costs
+// little.
+void Ledger::Merge(OPNode::RecordIndex& index, OPNode::RecordIndex& later) {
+  const bool swapped = index.about.size() < later.about.size();
+  if (swapped) index.about.swap(later.about);
+  for (auto& [node, set] : later.about) {
+    const auto [entry, is_new] = index.about.try_emplace(node);
+    if (swapped && !is_new) std::swap(entry->second, set);
+    Append(entry->second, set);
+  }
+  index.renames += later.renames;
 }
 
 void Ledger::Receive(OPNode& node, Bundle bundle, const OP* current) {
   if (bundle.index || !IsShort(node.ops)) {
     OPNode::RecordIndex& index = Sift(node, current);
     if (bundle.index) {
-      for (OP* rec : bundle.index->own) Enter(node, index, rec);
-      for (OP* rec : bundle.index->foreign) Enter(node, index, rec);
-      index.renames += bundle.index->renames;
+      Merge(index, *bundle.index);
     } else {
-      for (const auto& rec : bundle.ops) Enter(node, index, rec.get());
+      for (const auto& rec : bundle.ops) Enter(index, rec.get());
     }
     index.seen = node.ops.size() + bundle.ops.size();
-    // The short list joins the long one, so that a list which is moved to and fro costs little. The
-    // order that rules see is the index's.
-    if (node.ops.size() < bundle.ops.size()) node.ops.swap(bundle.ops);
+    Pour(bundle.ops, node.ops);  // of a long list only the index keeps the order that rules see
+    return;
   }
   node.ops.insert(node.ops.end(), std::make_move_iterator(bundle.ops.begin()),
                   std::make_move_iterator(bundle.ops.end()));

@@ -7,6 +7,7 @@
 #ifndef QUARRY_FILEINDEX_QUEUE_LEDGER_H_
 #define QUARRY_FILEINDEX_QUEUE_LEDGER_H_
 
+#include <array>
 #include <cstddef>
 #include <memory>
 #include <string_view>
@@ -30,13 +31,23 @@ struct OPNode::ChildIndex {
   std::vector<OPNode*> movable;
 };
 
-// The records of a node's list by the part that they can still play. Cancelled ones play none and
-// are left out; renames are only counted, for every rule keeps clear of them.
+// What is pending in a node's long list. Cancelled records play no part any more and are left out;
+// renames are only counted, for every rule keeps clear of them.
 struct OPNode::RecordIndex {
-  std::size_t seen = 0;      // how many entries of the list are accounted for
-  std::vector<OP*> own;      // about this node, in order of attachment
-  std::vector<OP*> foreign;  // moved here, about the node where they came from
+  struct OfKind {
+    std::vector<OP*> recs;  // in no order: records about one node and of one kind always fare alike
+    std::size_t last = 0;   // number of the last one among all records of its RecordSet
+  };
+  // Records about one node.
+  struct RecordSet {
+    std::array<OfKind, OP_FULL_REINDEX + 1> kinds;
+    std::size_t entered = 0;
+  };
+
+  std::size_t seen = 0;  // how many entries of the list are accounted for
+  std::unordered_map<const OPNode*, RecordSet> about;  // moved ones are about where they came from
   std::size_t renames = 0;
+  OP* unsettled = nullptr;  // in the list, but of a kind that the event being folded may yet change
 };
 
 // All functions cost time in proportion to what they hand out or change, over all calls on a tree.
@@ -54,8 +65,9 @@ class Ledger {
   static std::vector<OPNode*> TakeReindexable(OPNode& node);
   static std::vector<OPNode*> TakeMovable(OPNode& node);
 
-  // Calls `rule` for each record that is about this node and takes part in rules, in order, but not
-  // for `current`. The rule may change the record's kind and data.
+  // Calls `rule` for the records that are about this node and not cancelled, but not for `current`.
+  // It may change the kind and data of a record and says whether it did: one that it leaves as it
+  // is may speak for all of its kind, which are not shown then.
   template <typename Rule>
   static void ForEachOwn(OPNode& node, const OP* current, Rule rule) {
     if (IsShort(node.ops)) {
@@ -64,10 +76,20 @@ class Ledger {
       }
       return;
     }
-    for (OP* rec : Sift(node, current).own) {
-      if (rec != current) rule(*rec);
+    OPNode::RecordIndex::RecordSet& own = Sift(node, current).about[&node];
+    // Configuration updates come first: what becomes one is not to be merged with itself.
+    for (const FileIndexOP kind :
+         {OP_UPDATE_CFG, OP_DELETE, OP_INDEX, OP_ATTR, OP_REINDEX, OP_FULL_REINDEX}) {
+      for (OP* rec : own.kinds[kind].recs) {
+        if (!rule(*rec)) break;
+      }
+      Refile(own, kind);
     }
   }
+
+  // Cancels the records about this node that can be done at another place as well, and returns the
+  // kind of the last one; OP_NONE when there are none.
+  static FileIndexOP TakeWork(OPNode& node);
 
   // Whether a record in the node's list is not cancelled.
   static bool HasPending(OPNode& node);
@@ -91,8 +113,11 @@ class Ledger {
   static OPNode::ChildIndex& Children(OPNode& node);
   static const std::shared_ptr<OPNode>* Find(OPNode& node, std::string_view name);
   static void Adopt(OPNode& node);
-  static void Enter(OPNode& node, OPNode::RecordIndex& index, OP* rec);
+  static void Enter(OPNode::RecordIndex& index, OP* rec);
+  static void Refile(OPNode::RecordIndex::RecordSet& set, FileIndexOP kind);
+  static void Merge(OPNode::RecordIndex& index, OPNode::RecordIndex& later);
   static OPNode::RecordIndex& Sift(OPNode& node, const OP* current);
+  static OPNode::RecordIndex& SiftSettled(OPNode& node);
 };
 
 }  // namespace quarry::fileindex

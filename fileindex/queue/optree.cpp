@@ -43,16 +43,18 @@ constexpr RuleRow kUpdateCfg = {OP_UPDATE_CFG,  {{Keep, Drop,  Take, Take, Merge
 constexpr RuleRow kReindex   = {OP_REINDEX,     {{Keep, Drop,  Take, Take, Take,  Keep, Drop,   Keep}}};
 // clang-format on
 
-void Meet(OP& pending, OP& rec, const RuleRow& rules) {
+// Whether the pending record is changed.
+bool Meet(OP& pending, OP& rec, const RuleRow& rules) {
   const auto kind = static_cast<std::size_t>(pending.op);
   const Rule rule = kind < rules.meeting.size() ? rules.meeting[kind] : Keep;
-  if (rule == Keep) return;
+  if (rule == Keep) return false;
   if (rule == Merge) pending.MergeData(rec.data);
   if (rule == Take) {
     pending.op = rules.kind;
     if (rules.kind == OP_UPDATE_CFG) pending.data = rec.data;
   }
   rec.op = OP_NONE;
+  return rule != Drop;
 }
 
 void CancelBelow(OPNode& node) {
@@ -61,7 +63,9 @@ void CancelBelow(OPNode& node) {
     OPNode& below = *waiting.back();
     waiting.pop_back();
     Ledger::ForEachOwn(below, nullptr, [](OP& rec) {
-      if (rec.op != OP_RENAME) rec.op = OP_NONE;
+      if (rec.op == OP_RENAME) return false;
+      rec.op = OP_NONE;
+      return true;
     });
     const std::vector<OPNode*> children = Ledger::TakeReindexable(below);
     waiting.insert(waiting.end(), children.begin(), children.end());
@@ -71,7 +75,9 @@ void CancelBelow(OPNode& node) {
 // What was there before something was moved over it is gone.
 void CancelReplaced(OPNode& destination, const OP* current) {
   Ledger::ForEachOwn(destination, current, [](OP& rec) {
-    if (rec.op == OP_DELETE || rec.op == OP_INDEX || rec.op == OP_ATTR) rec.op = OP_NONE;
+    if (rec.op != OP_DELETE && rec.op != OP_INDEX && rec.op != OP_ATTR) return false;
+    rec.op = OP_NONE;
+    return true;
   });
 }
 
@@ -181,7 +187,7 @@ void OPTree::Attach(const std::shared_ptr<OPNode>& node, const std::shared_ptr<O
 void OPTree::Fold(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& rec,
                   const RuleRow& rules) {
   rec->op = rules.kind;
-  Ledger::ForEachOwn(*node, rec.get(), [&](OP& pending) { Meet(pending, *rec, rules); });
+  Ledger::ForEachOwn(*node, rec.get(), [&](OP& pending) { return Meet(pending, *rec, rules); });
   if (rec->op != OP_NONE) Attach(node, rec);
 }
 
@@ -230,8 +236,9 @@ void OPTree::TraverseNodeDescendant(std::shared_ptr<OPNode> node,
   while (!waiting.empty()) {
     const std::shared_ptr<OPNode> at = std::move(waiting.back());
     waiting.pop_back();
-    if (!skip_self || at != node) fn(at);
+    // Noted before `fn` is called, which could else add children without end.
     waiting.insert(waiting.end(), at->children.rbegin(), at->children.rend());
+    if (!skip_self || at != node) fn(at);
   }
 }
 

@@ -80,7 +80,8 @@ class QUARRY_EXPORT OPNode : public std::enable_shared_from_this<OPNode> {
   std::string name;                               // empty for the root
   std::shared_ptr<OPNode> parent;                 // null for the root
   std::vector<std::shared_ptr<OPNode>> children;  // in order of creation
-  std::vector<std::shared_ptr<OP>> ops;           // in order of attachment
+  // In order of attachment; a rename that moves more than 32 may put them before what was there.
+  std::vector<std::shared_ptr<OP>> ops;
 
  private:
   friend class Ledger;  // finds children and records without walking long lists
@@ -142,8 +143,8 @@ class QUARRY_EXPORT OPTree {
   void HandleUpdateCfg(std::shared_ptr<OPNode> node, std::shared_ptr<OP> rec);
 
   // Calls `fn` for every node below `node`, and for `node` itself unless `skip_self`: parents
-  // before their children, children in order of creation. Children that `fn` adds to a node that
-  // was visited before are not visited.
+  // before their children, children in order of creation. Children that `fn` adds to the node that
+  // it is called for, or to one that was visited before, are not visited.
   void TraverseNodeDescendant(std::shared_ptr<OPNode> node,
                               std::function<void(std::shared_ptr<OPNode>)> fn, bool skip_self);
 

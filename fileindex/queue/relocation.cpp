@@ -32,11 +32,7 @@ void Relocation::Collect(OPNode& source, OPNode& destination) {
 }
 
 void Relocation::Load(Stop& stop) {
-  Ledger::ForEachOwn(*stop.from, nullptr, [&stop](OP& rec) {
-    if (rec.op != OP_INDEX && rec.op != OP_ATTR && rec.op != OP_REINDEX) return;
-    stop.carried = rec.op;
-    rec.op = OP_NONE;
-  });
+  stop.carried = Ledger::TakeWork(*stop.from);
   stop.bundle = Ledger::Take(*stop.from);
   stop.loaded = true;
 }

@@ -71,6 +71,13 @@ TEST_F(EventTest, OptionalKeysOfTheWrongTypeCountAsAbsent) {
   EXPECT_EQ(event.path_old, "");
 }
 
+TEST_F(EventTest, WhatConvertsIsReadAsTheJsonLibraryConvertsIt) {
+  const Event event(R"({"event":2.0,"path":7,"is_dir":1})");
+  EXPECT_EQ(event.op, 2u);
+  EXPECT_EQ(event.path, "7");
+  EXPECT_TRUE(event.is_dir);
+}
+
 TEST_F(EventTest, BytesOfAPathAreKept) {
   const std::string path = "/s/\xff\xfe caf\xc3\xa9";
   EXPECT_EQ(Event("{\"event\":2,\"path\":\"" + path + "\"}").path, path);

@@ -154,11 +154,15 @@ class NaiveTree {
       if (!value->isNull() && !value->isObject()) throw NaiveFailure("not an object");
     }
     for (const char* name : {"document", "audio", "video", "photo"}) {
-      const bool theirs =
-          !other.isNull() && other.isMember(name) && other[name].isBool() && other[name].asBool();
+      const bool theirs = !other.isNull() && IsTrue(other[name]);
       const bool ours = data[name].isBool() && data[name].asBool();
       data[name] = theirs || ours;
     }
+  }
+
+  // Numbers count, texts do not.
+  static bool IsTrue(const Json::Value& value) {
+    return value.isBool() ? value.asBool() : value.isInt() && value.asInt() != 0;
   }
 
   void Reindex(const std::shared_ptr<NaiveRecord>& rec) {

@@ -180,6 +180,68 @@ TEST_F(BoundsTest, SavingByRenamingInTurn) {
   EXPECT_EQ(Last(3), (Strings{"delete /s/old", "rename /s/new -> /s/f", "index /s/f"}));
 }
 
+// Directories that are made under one name and published under another, over and over. Their
+// reindexes stay at the new place, and nothing may look at all of them each time.
+TEST_F(BoundsTest, DirectoriesPublishedByRenaming) {
+  for (int i = 0; i < 100'000; ++i) {
+    Insert(EVENT_REINDEX, "/s/new");
+    Insert(EVENT_RENAME, "/s/public", "/s/new");
+    Insert(EVENT_ATTR, "/s/public");
+  }
+  EXPECT_EQ(Pending(), 200'000);
+  EXPECT_EQ(Last(2), (Strings{"rename /s/new -> /s/public", "reindex /s/public"}));
+}
+
+TEST_F(BoundsTest, FilesPublishedWithTheirDirectory) {
+  for (int i = 0; i < 100'000; ++i) {
+    Insert(EVENT_MODIFY, "/s/new/x");
+    Insert(EVENT_RENAME, "/s/public", "/s/new");
+    Insert(EVENT_MODIFY, "/s/public/x");
+  }
+  EXPECT_EQ(Pending(), 200'000);
+  Insert(EVENT_DELETE, "/s/public/x");
+  EXPECT_EQ(Last(2), (Strings{"rename /s/new -> /s/public", "delete /s/public/x"}));
+}
+
+TEST_F(BoundsTest, FilesReplacedWithTheirDirectory) {
+  for (int i = 0; i < 100'000; ++i) {
+    Insert(EVENT_MODIFY, "/s/new/x");
+    Insert(EVENT_DELETE, "/s/public/x");
+    Insert(EVENT_RENAME, "/s/public", "/s/new");
+  }
+  EXPECT_EQ(Pending(), 200'001);
+  EXPECT_EQ(Last(2), (Strings{"rename /s/new -> /s/public", "index /s/public/x"}));
+}
+
+TEST_F(BoundsTest, ManyDeletionsThatAreMovedToAndFro) {
+  for (int i = 0; i < 100'000; ++i) {
+    Insert(EVENT_DELETE, "/s/a");
+    Insert(EVENT_RENAME, "/s/b", "/s/a");
+  }
+  for (int i = 0; i < 50'000; ++i) {
+    Insert(EVENT_RENAME, "/s/c", "/s/b");
+    Insert(EVENT_RENAME, "/s/b", "/s/c");
+  }
+  Insert(EVENT_RENAME, "/s/a", "/s/b");
+  EXPECT_EQ(Pending(), 300'001);
+  Insert(EVENT_CREATE, "/s/a");
+  EXPECT_EQ(Text(*tree_.ops[0]), "index /s/a");
+  EXPECT_EQ(Pending(), 300'001);
+  for (int i = 0; i < 100'000; ++i) Insert(EVENT_MODIFY, "/s/a");
+  EXPECT_EQ(Pending(), 300'001);
+}
+
+TEST_F(BoundsTest, BadConfigurationChangesAmongManyRecords) {
+  for (int i = 0; i < 100'000; ++i) Insert(EVENT_RENAME, "/s/a", "/s/x");
+  event_->data = Json::Value(Json::objectValue);
+  Insert(EVENT_UPDATE_CFG, "/s/a");
+  event_->data = 5;
+  for (int i = 0; i < 100'000; ++i) {
+    EXPECT_THROW(Insert(EVENT_UPDATE_CFG, "/s/a"), Error);
+  }
+  EXPECT_EQ(Last(1), Strings{"config /s/a {}"});
+}
+
 TEST_F(BoundsTest, LineOfManyMegabytes) {
   const std::string name(20'000'000, 'n');
   const std::string rubbish(20'000'000, '{');

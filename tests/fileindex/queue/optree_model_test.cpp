@@ -26,6 +26,7 @@ struct Mix {
   int rename_odds;  // one in so many events is a rename, one a reindex
   int bits_odds;    // one in so many events has several bits
   bool odd_paths;   // "/", "//a/", ""
+  bool bad_data;    // configuration changes that cannot be merged
 };
 
 std::ostream& operator<<(std::ostream& stream, const Mix& mix) {
@@ -80,11 +81,22 @@ class Generator {
 
   Json::Value Data() {
     Json::Value data;
-    if (Pick(12) == 0) return Json::Value(7);
+    if (mix_.bad_data && Pick(12) == 0) return Json::Value(7);
     for (const char* name : {"document", "audio", "video", "photo", "other"}) {
-      if (Pick(3) == 0) data[name] = Pick(2) == 0;
+      if (Pick(3) == 0) data[name] = Switch();
     }
     return data;
+  }
+
+  Json::Value Switch() {
+    switch (Pick(6)) {
+      case 0:
+        return Json::Value(Pick(2));
+      case 1:
+        return Json::Value("true");
+      default:
+        return Json::Value(Pick(2) == 0);
+    }
   }
 
   const Mix& mix_;
@@ -94,6 +106,12 @@ class Generator {
 std::string Show(const NaiveEvent& event) {
   return std::to_string(event.op) + (event.is_dir ? "d " : " ") + event.path_old + " -> " +
          event.path + " " + toString(event.data);
+}
+
+std::string Show(const std::vector<NaiveEvent>& history) {
+  std::string text;
+  for (const NaiveEvent& event : history) text += Show(event) + "\n";
+  return text;
 }
 
 std::string Show(int op, const std::string& src, const std::string& path, const Json::Value& data) {
@@ -110,6 +128,15 @@ std::vector<std::string> Show(const std::vector<std::shared_ptr<OP>>& list) {
   std::vector<std::string> texts;
   for (const auto& e : list) texts.push_back(Show(e->op, e->src, e->node->GetPath(), e->data));
   return texts;
+}
+
+// Texts are made only when something is wrong, for they cost more than the tree.
+bool Same(const std::vector<std::shared_ptr<OP>>& list, const NaiveList& model) {
+  return std::equal(list.begin(), list.end(), model.begin(), model.end(),
+                    [](const auto& a, const auto& b) {
+                      return a->op == b->op && a->src == b->src && a->data == b->data &&
+                             a->node->GetPath() == b->path;
+                    });
 }
 
 // Whether both say that the event cannot be folded, or both that it can.
@@ -135,6 +162,13 @@ bool SameVerdict(OPTree& tree, NaiveTree& model, const NaiveEvent& event) {
   return refused == model_refused;
 }
 
+std::string Difference(const OPTree& tree, const NaiveTree& model) {
+  std::string text;
+  for (const std::string& line : Show(tree.ops)) text += "tree  " + line + "\n";
+  for (const std::string& line : Show(model.ops)) text += "model " + line + "\n";
+  return text;
+}
+
 void CompareNodes(OPTree& tree, const NaiveTree& model) {
   std::vector<std::string> paths;
   tree.TraverseNodeDescendant(
@@ -142,13 +176,15 @@ void CompareNodes(OPTree& tree, const NaiveTree& model) {
       [&](std::shared_ptr<OPNode> node) {
         const std::string path = node->GetPath();
         paths.push_back(path);
-        std::vector<std::string> list = Show(node->ops);
-        std::vector<std::string> expected = Show(model.At(path));
-        if (list.size() > 32) {  // the order of long lists is nobody's business
-          std::sort(list.begin(), list.end());
-          std::sort(expected.begin(), expected.end());
+        if (!Same(node->ops, model.At(path))) {
+          std::vector<std::string> list = Show(node->ops);
+          std::vector<std::string> expected = Show(model.At(path));
+          if (list.size() > 32) {  // the order of long lists is nobody's business
+            std::sort(list.begin(), list.end());
+            std::sort(expected.begin(), expected.end());
+          }
+          EXPECT_EQ(list, expected) << path;
         }
-        EXPECT_EQ(list, expected) << path;
         std::vector<std::string> children;
         for (const auto& child : node->children) children.push_back(child->GetPath());
         EXPECT_EQ(children, model.ChildrenOf(path));
@@ -167,31 +203,34 @@ TEST_P(ModelTest, TreeAndModelAgree) {
     Generator generator(GetParam(), static_cast<unsigned int>(seed));
     OPTree tree(queue.path());
     NaiveTree model;
-    std::string history;
+    std::vector<NaiveEvent> history;
     for (int i = 0; i < GetParam().events; ++i) {
       const NaiveEvent event = generator.Next();
-      history += Show(event) + "\n";
-      ASSERT_TRUE(SameVerdict(tree, model, event)) << history;
+      history.push_back(event);
+      ASSERT_TRUE(SameVerdict(tree, model, event)) << Show(history);
       if (GetParam().events > 100 && i % 50 != 0) continue;
-      ASSERT_EQ(Show(tree.ops), Show(model.ops)) << history;
+      ASSERT_TRUE(Same(tree.ops, model.ops)) << Difference(tree, model) << Show(history);
     }
-    ASSERT_EQ(Show(tree.ops), Show(model.ops)) << history;
+    ASSERT_TRUE(Same(tree.ops, model.ops)) << Difference(tree, model) << Show(history);
     CompareNodes(tree, model);
-    ASSERT_FALSE(HasFailure()) << history;
+    ASSERT_FALSE(HasFailure()) << Show(history);
   }
 }
 
-INSTANTIATE_TEST_SUITE_P(Mixes, ModelTest,
-                         ::testing::Values(Mix{"small", 2, 2, 20, 1500, 3, 6, false},
-                                           Mix{"deep", 2, 5, 40, 500, 3, 6, false},
-                                           Mix{"wide", 12, 2, 60, 200, 4, 8, false},
-                                           Mix{"odd", 2, 3, 30, 800, 3, 3, true},
-                                           Mix{"calm", 3, 3, 60, 300, 15, 50, false},
-                                           Mix{"one_place", 1, 1, 300, 30, 6, 4, true},
-                                           Mix{"long_lists", 2, 2, 400, 60, 4, 6, false},
-                                           Mix{"long_lists_of_renames", 2, 1, 400, 60, 2, 10,
-                                               true}),
-                         ::testing::PrintToStringParamName());
+// How far a long list has been gone through when a change turns out to be bad is left open.
+INSTANTIATE_TEST_SUITE_P(
+    Mixes, ModelTest,
+    ::testing::Values(Mix{"small", 2, 2, 20, 1500, 3, 6, false, true},
+                      Mix{"deep", 2, 5, 40, 500, 3, 6, false, true},
+                      Mix{"wide", 12, 2, 60, 200, 4, 8, false, true},
+                      Mix{"odd", 2, 3, 30, 800, 3, 3, true, true},
+                      Mix{"calm", 3, 3, 60, 300, 15, 50, false, true},
+                      Mix{"one_place", 1, 1, 300, 60, 6, 4, true, false},
+                      Mix{"two_places", 2, 1, 500, 60, 5, 8, false, false},
+                      Mix{"long_lists", 2, 2, 400, 60, 4, 6, false, false},
+                      Mix{"very_long_lists", 2, 2, 1500, 8, 4, 6, false, false},
+                      Mix{"long_lists_of_renames", 2, 1, 400, 60, 2, 10, true, false}),
+    ::testing::PrintToStringParamName());
 
 }  // namespace
 }  // namespace quarry::fileindex

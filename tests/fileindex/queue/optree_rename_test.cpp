@@ -230,6 +230,25 @@ TEST_F(RenameTest, LongListsAreMovedWhole) {
             (Strings{"delete /d/a", "index /e/a", "rename /d -> /e", "index /d/a"}));
 }
 
+TEST_F(RenameTest, LastOfSeveralKindsIsCarriedFromALongListToo) {
+  std::string renames;
+  for (int i = 0; i < 50; ++i) renames += RenameLine("/x", "/a");
+  const std::string attr_comes = Line(EVENT_ATTR, "/y") + RenameLine("/y", "/a");
+  const std::string reindex_comes = Line(EVENT_REINDEX, "/z") + RenameLine("/z", "/a");
+  // The attributes do not stand against the reindex that is moved over them.
+  const std::string go = RenameLine("/a", "/b");
+  EXPECT_EQ(Folded(renames + reindex_comes + attr_comes + go).back(), "attr /b");
+  EXPECT_EQ(Folded(renames + attr_comes + reindex_comes + go).back(), "reindex /b");
+  // A creation turns the deletion that came home into indexing, in the deletion's place.
+  const std::string home = Line(EVENT_DELETE, "/a") + RenameLine("/a", "/h");
+  const std::string back = RenameLine("/h", "/a") + Line(EVENT_CREATE, "/a");
+  EXPECT_EQ(Folded(home + renames + reindex_comes + back + go).back(), "index /b");
+  EXPECT_EQ(Folded(home + RenameLine("/h", "/a") + renames + reindex_comes +
+                   Line(EVENT_CREATE, "/a") + go)
+                .back(),
+            "reindex /b");
+}
+
 // ---- Reindexes
 
 TEST_F(ReindexTest, WhatIsBelowIsCancelled) {

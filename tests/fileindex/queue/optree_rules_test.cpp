@@ -199,6 +199,56 @@ TEST_F(RulesTest, EveryCellBehindManyRenames) {
   }
 }
 
+// There a record that is left as it is speaks for all of its kind, and no other does.
+TEST_F(RulesTest, EveryPairOfKindsAmongManyRecords) {
+  for (const Row& row : kRows) {
+    for (int first = OP_DELETE; first <= OP_FULL_REINDEX; ++first) {
+      for (int second = OP_DELETE; second <= OP_FULL_REINDEX; ++second) {
+        SCOPED_TRACE(std::string(row.name) + " " + std::to_string(first) + std::to_string(second));
+        OPTree tree(queue_.path());
+        const auto node = tree.GetNodeByPath("/s/a");
+        for (int i = 0; i < 100; ++i) {
+          const auto kind = FileIndexOP(i % 3 == 0 ? second : first);
+          node->ops.push_back(std::make_shared<OP>(node, kind, "", Json::Value()));
+        }
+        const auto rec = std::make_shared<OP>(node, OP_NONE, "", Json::Value());
+        (tree.*row.handler)(node, rec);
+        for (int i = 0; i < 100; ++i) {
+          const int kind = i % 3 == 0 ? second : first;
+          EXPECT_EQ(node->ops[size_t(i)]->op, row.outcomes[size_t(kind)].pending) << i;
+        }
+        const bool dropped =
+            row.outcomes[size_t(first)].dropped || row.outcomes[size_t(second)].dropped;
+        EXPECT_EQ(rec->op, dropped ? OP_NONE : row.kind);
+        EXPECT_EQ(node->ops.size(), dropped ? 100u : 101u);
+      }
+    }
+  }
+}
+
+TEST_F(RulesTest, ConfigurationUpdateAmongManyRecordsMeetsEachOnce) {
+  const Json::Value change = Parsed(R"({"audio":true})");
+  OPTree tree(queue_.path());
+  const auto node = tree.GetNodeByPath("/s/a");
+  for (int i = 0; i < 100; ++i) {
+    const auto kind = i % 2 == 0 ? OP_UPDATE_CFG : OP_INDEX;
+    node->ops.push_back(std::make_shared<OP>(node, kind, "", Json::Value()));
+  }
+  tree.HandleUpdateCfg(node, std::make_shared<OP>(node, OP_NONE, "", change));
+  for (int i = 0; i < 100; ++i) {
+    const OP& op = *node->ops[size_t(i)];
+    EXPECT_EQ(op.op, OP_UPDATE_CFG);
+    // Merged with the change, or made of it.
+    EXPECT_EQ(op.data.size(), i % 2 == 0 ? 4u : 1u) << i;
+    EXPECT_TRUE(op.data["audio"].asBool());
+  }
+  const auto bad = std::make_shared<OP>(node, OP_NONE, "", Json::Value(5));
+  EXPECT_THROW(tree.HandleUpdateCfg(node, bad), Error);
+  tree.HandleReindex(node, std::make_shared<OP>(node, OP_NONE, "", Json::Value()));
+  for (const auto& op : node->ops) EXPECT_EQ(op->op, OP_REINDEX);
+  EXPECT_EQ(node->ops.size(), 100u);
+}
+
 TEST_F(RulesTest, OnlyAConfigurationUpdateHandsItsDataOver) {
   const Json::Value change = Parsed(R"({"audio":true})");
   for (const Row& row : kRows) {

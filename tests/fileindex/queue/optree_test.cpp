@@ -291,6 +291,22 @@ TEST_F(OPTreeTest, TraversalIsNotDisturbedByNewChildren) {
   EXPECT_EQ(node->children.size(), 4u);
 }
 
+TEST_F(OPTreeTest, TraversalEndsWhenEachVisitAddsAChild) {
+  const QueueFile queue;
+  OPTree tree(queue.path());
+  const auto node = tree.GetNodeByPath("/d");
+  tree.GetNodeByPath("/d/a/b");
+  Strings seen;
+  tree.TraverseNodeDescendant(
+      node,
+      [&seen](std::shared_ptr<OPNode> at) {
+        seen.push_back(at->name);
+        at->GetChild("new");
+      },
+      false);
+  EXPECT_EQ(seen, (Strings{"d", "a", "b"}));
+}
+
 TEST_F(OPTreeTest, RecordsAndTheirPathsOutliveTheTree) {
   const QueueFile queue(Line(EVENT_MODIFY, "/a/b/c") + Line(EVENT_DELETE, "/a/d") +
                         RenameLine("/a/d", "/e"));
