@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <vector>
 
+#include "common/error.h"
 #include "platform/include/filesystem.h"
 #include "platform/linux/durable_file.h"
 #include "platform/linux/keep_errno.h"
@@ -23,10 +24,13 @@ constexpr char kSnapshotName[] = "#snapshot";
 // Whether a share begins at `path`. Shares that cannot be read make no difference here.
 bool IsShareRoot(const std::string& path) {
   const KeepErrno keep;
-  const ShareList shares = TryLoadShares();
-  return shares != nullptr &&
-         std::any_of(shares->begin(), shares->end(),
-                     [&](const ShareRecord& share) { return share.path == path; });
+  try {
+    const ShareList shares = LoadShares();
+    return std::any_of(shares->begin(), shares->end(),
+                       [&](const ShareRecord& share) { return share.path == path; });
+  } catch (const Error&) {
+    return false;
+  }
 }
 
 // Where mounts are listed by place; otherwise a directory on another device than its parent's is
