@@ -98,6 +98,7 @@ void Worker::RefreshLayout() {
     ShareLayout layout = parts_.host->Load();
     // While a folder was paused nobody watched it.
     if (layout_.rules && HasNewlyActive(*layout_.rules, *layout.rules)) CompareAll();
+    if (layout.root != layout_.root) root_ = Identity();
     layout_ = std::move(layout);
     progress_.SetFolders(layout_.rules);
   } catch (...) {

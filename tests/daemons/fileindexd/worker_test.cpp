@@ -1,0 +1,436 @@
+#include "daemons/fileindexd/worker.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <thread>
+
+#include "daemons/tarnelasticd/engine_error.h"
+#include "tests/daemons/fileindexd/share_fixture.h"
+#include "tests/daemons/fileindexd/shared_parts.h"
+#include "tests/support/files.h"
+
+namespace quarry::fileindexd {
+namespace {
+
+using fileindex::EVENT_CREATE;
+using fileindex::EVENT_MODIFY;
+using std::chrono::milliseconds;
+using ::testing::Contains;
+using ::testing::HasSubstr;
+using ::testing::IsEmpty;
+
+class WorkerTest : public ShareFixture {
+ protected:
+  WorkerTest() {
+    host_.SetFolders({Folder("/s")});
+    worker_ = MakeWorker(host_, index_, disk_, slots_);
+  }
+
+  std::string State() const { return worker_->Report()["state"].asString(); }
+  std::string LastError() const { return worker_->Report()["last_error"].asString(); }
+
+  // The commands of one step, which must be a pass that ends well.
+  std::vector<std::string> CommandsOfStep() {
+    index_.ForgetCommands();
+    worker_->Step();
+    std::vector<std::string> commands = index_.Commands();
+    if (!commands.empty()) commands.pop_back();
+    return commands;
+  }
+
+  // Whether a step finds nothing to do.
+  bool IsAtRest() {
+    index_.ForgetCommands();
+    worker_->Step();
+    return index_.CallCount() == 0;
+  }
+
+  HostState host_{QueuePath()};
+  std::unique_ptr<Worker> worker_;
+};
+
+TEST_F(WorkerTest, BeginsByComparingTheWholeShare) {
+  disk_.WriteFile("/v/s/d/a.txt");
+  index_.Put({"/v/s/gone.txt", false, "", ""});
+  EXPECT_EQ("waiting", State());
+  EXPECT_EQ(milliseconds(0), worker_->Step());
+  ExpectInLine();
+  EXPECT_GT(worker_->Step(), milliseconds(0));
+  EXPECT_EQ("idle", State());
+  EXPECT_TRUE(IsAtRest());
+}
+
+TEST_F(WorkerTest, TakesTheQueueOnlyWhenItHasLines) {
+  worker_->Step();
+  test::WriteFile(QueuePath(), "");
+  EXPECT_TRUE(IsAtRest());
+  disk_.WriteFile("/v/s/a.txt");
+  Queue(EVENT_CREATE, "/v/s/a.txt");
+  EXPECT_THAT(CommandsOfStep(), ::testing::ElementsAre("upsert /v/s/a.txt content"));
+}
+
+TEST_F(WorkerTest, FindsTheSnapshotOfAnEarlierLife) {
+  worker_->Step();
+  disk_.WriteFile("/v/s/a.txt");
+  Queue(EVENT_CREATE, "/v/s/a.txt");
+  ASSERT_EQ(0, rename(QueuePath().c_str(), (QueuePath() + ".tmp").c_str()));
+  EXPECT_THAT(CommandsOfStep(), Contains("upsert /v/s/a.txt content"));
+  EXPECT_FALSE(HasSnapshot());
+}
+
+TEST_F(WorkerTest, WaitsLongerAndLongerWhileTheEngineIsDown) {
+  index_.SetHook([](const std::string&) { throw Error(kErrorEngineRequest, "not running"); });
+  EXPECT_EQ(milliseconds(500), worker_->Step());
+  EXPECT_EQ("retrying", State());
+  EXPECT_THAT(LastError(), HasSubstr("not running"));
+  EXPECT_EQ(milliseconds(1000), worker_->Step());
+  EXPECT_EQ(milliseconds(2000), worker_->Step());
+  for (int i = 0; i < 20; ++i) EXPECT_LE(worker_->Step(), milliseconds(60000));
+  EXPECT_EQ(milliseconds(60000), worker_->Step());
+  index_.SetHook(nullptr);
+  EXPECT_EQ(milliseconds(0), worker_->Step());
+  EXPECT_EQ("", LastError());
+  ExpectInLine();
+  index_.SetHook([](const std::string&) { throw Error(kErrorEngineRequest, "not running"); });
+  worker_->CheckStatus();
+  host_.MarkNeedsReindex();
+  EXPECT_EQ(milliseconds(500), worker_->Step());
+}
+
+// What stops a pass and is not one document's fault.
+class FailingWorkerTest : public WorkerTest, public ::testing::WithParamInterface<int> {};
+
+TEST_P(FailingWorkerTest, LosesNothingAndTriesAgain) {
+  worker_->Step();
+  disk_.WriteFile("/v/s/a.txt");
+  Queue(EVENT_CREATE, "/v/s/a.txt");
+  index_.SetHook([](const std::string& command) {
+    if (command == "upsert /v/s/a.txt content") throw Error(GetParam(), "cannot now");
+  });
+  for (int i = 0; i < 3; ++i) {
+    EXPECT_GT(worker_->Step(), milliseconds(0));
+    EXPECT_TRUE(HasSnapshot());
+    EXPECT_EQ("retrying", State());
+    EXPECT_THAT(LastError(), HasSubstr("cannot now (code " + std::to_string(GetParam()) + ")"));
+  }
+  index_.SetHook(nullptr);
+  worker_->Step();
+  EXPECT_EQ(1U, index_.All().count("/v/s/a.txt"));
+  EXPECT_FALSE(HasSnapshot());
+}
+
+INSTANTIATE_TEST_SUITE_P(Codes, FailingWorkerTest,
+                         ::testing::Values(static_cast<int>(kErrorNoSpace),
+                                           static_cast<int>(kErrorSystem), 1400, 1401,
+                                           engine::kPausedIndex, engine::kDiskFull,
+                                           engine::kStorageFailed, engine::kMovingIndex,
+                                           engine::kOutOfMemory, engine::kInternalFailure));
+
+TEST_F(WorkerTest, WaitsForTheReader) {
+  disk_.WriteFile("/v/s/a.txt");
+  index_.SetReaderRunning(false);
+  worker_->Step();
+  EXPECT_THAT(LastError(), HasSubstr("tarncontentextractd"));
+  index_.SetReaderRunning(true);
+  worker_->Step();
+  EXPECT_EQ("", LastError());
+  ExpectInLine();
+}
+
+TEST_F(WorkerTest, DoesTheWorkAgainForAnEngineThatWasStartedAnew) {
+  worker_->Step();
+  disk_.WriteFile("/v/s/a.txt");
+  Queue(EVENT_CREATE, "/v/s/a.txt");
+  index_.SetHook([this](const std::string& command) {
+    if (command == "commit") index_.Restart();
+  });
+  EXPECT_EQ(milliseconds(0), worker_->Step());
+  EXPECT_TRUE(HasSnapshot());
+  index_.SetHook(nullptr);
+  worker_->Step();
+  EXPECT_EQ(1U, index_.All().count("/v/s/a.txt"));
+  EXPECT_FALSE(HasSnapshot());
+}
+
+TEST_F(WorkerTest, ComparesAgainWhenTheFirstComparisonWasCutShort) {
+  disk_.WriteFile("/v/s/a.txt");
+  index_.SetHook([](const std::string& command) {
+    if (command == "commit") throw Error(engine::kDiskFull, "full");
+  });
+  worker_->Step();
+  index_.SetHook(nullptr);
+  index_.Restart();
+  EXPECT_TRUE(index_.All().empty());
+  worker_->Step();
+  ExpectInLine();
+}
+
+// The index.
+
+TEST_F(WorkerTest, MakesALostIndexAnewButNotAtOnce) {
+  disk_.WriteFile("/v/s/a.txt");
+  worker_->Step();
+  index_.DeleteIndex();
+  Queue(EVENT_MODIFY, "/v/s/a.txt");
+  index_.ForgetCommands();
+  worker_->Step();
+  worker_->Step();
+  EXPECT_THAT(index_.Commands(), ::testing::Not(Contains("create")));
+  worker_->Step();
+  EXPECT_THAT(index_.Commands(), Contains("create"));
+  worker_->Step();
+  ExpectInLine();
+  EXPECT_EQ("", LastError());
+}
+
+TEST_F(WorkerTest, AnIndexThatWasOnlyRenamedIsNotMadeAnew) {
+  disk_.WriteFile("/v/s/a.txt");
+  worker_->Step();
+  index_.ForgetCommands();
+  for (int i = 0; i < 5; ++i) {
+    Queue(EVENT_MODIFY, "/v/s/a.txt");
+    int calls = 0;
+    index_.SetHook([calls](const std::string&) mutable {
+      if (++calls == 2) throw Error(engine::kUnknownIndex, "no such index");
+    });
+    worker_->Step();
+    index_.SetHook(nullptr);
+    worker_->Step();
+  }
+  EXPECT_THAT(index_.Commands(), ::testing::Not(Contains("create")));
+}
+
+TEST_F(WorkerTest, DoesNotBringBackTheIndexOfAShareWithoutFolders) {
+  disk_.WriteFile("/v/s/a.txt");
+  worker_->Step();
+  index_.DeleteIndex();
+  Queue(EVENT_MODIFY, "/v/s/a.txt");
+  index_.ForgetCommands();
+  index_.SetHook([this](const std::string& command) {
+    if (command == "epoch") host_.SetFolders({});
+  });
+  for (int i = 0; i < 5; ++i) worker_->Step();
+  EXPECT_THAT(index_.Commands(), ::testing::Not(Contains("create")));
+}
+
+// The share.
+
+TEST_F(WorkerTest, AShareThatCannotBeLoadedIsTriedAgain) {
+  host_.FailLoad(Error(kErrorShareNotFound, "no share"));
+  EXPECT_EQ(milliseconds(500), worker_->Step());
+  EXPECT_THAT(LastError(), HasSubstr("no share"));
+  host_.FailLoad(std::nullopt);
+  worker_->Step();
+  EXPECT_EQ("", LastError());
+  ExpectInLine();
+}
+
+TEST_F(WorkerTest, ATroubleThatIsOverIsForgottenWithoutWork) {
+  worker_->Step();
+  host_.FailLoad(Error(kErrorLoadFile, "Cannot load json"));
+  worker_->Reload();
+  worker_->Step();
+  EXPECT_EQ("retrying", State());
+  host_.FailLoad(std::nullopt);
+  worker_->Step();
+  EXPECT_EQ("idle", State());
+  EXPECT_EQ("", LastError());
+}
+
+TEST_F(WorkerTest, AMissingDirectoryLosesNoDocument) {
+  disk_.WriteFile("/v/s/a.txt");
+  worker_->Step();
+  const std::size_t before = index_.All().size();
+  disk_.Remove("/v/s");
+  worker_->Step();
+  EXPECT_EQ("retrying", State());
+  EXPECT_THAT(LastError(), HasSubstr("/v/s is not there"));
+  EXPECT_EQ(before, index_.All().size());
+  disk_.WriteFile("/v/s/b.txt");
+  worker_->Step();
+  EXPECT_EQ("", LastError());
+  ExpectInLine();
+}
+
+TEST_F(WorkerTest, ADiskThatIsMountedLaterIsCompared) {
+  worker_->Step();
+  EXPECT_TRUE(IsAtRest());
+  disk_.Remove("/v/s");
+  disk_.AddMount("/v/s");
+  disk_.WriteFile("/v/s/a.txt");
+  worker_->Step();
+  EXPECT_EQ(1U, index_.All().count("/v/s/a.txt"));
+  EXPECT_TRUE(IsAtRest());
+}
+
+TEST_F(WorkerTest, ADiskThatIsUnmountedLosesNoDocument) {
+  disk_.Remove("/v/s");
+  disk_.AddMount("/v/s");
+  disk_.WriteFile("/v/s/a.txt");
+  worker_->Step();
+  ASSERT_EQ(1U, index_.All().count("/v/s/a.txt"));
+  disk_.Remove("/v/s");
+  disk_.AddDir("/v/s");
+  worker_->Step();
+  EXPECT_EQ("retrying", State());
+  EXPECT_EQ(1U, index_.All().count("/v/s/a.txt"));
+}
+
+TEST_F(WorkerTest, AShareThatHasMovedIsComparedAtItsNewPlace) {
+  disk_.WriteFile("/v/s/a.txt");
+  worker_->Step();
+  disk_.Rename("/v", "/w");
+  host_.SetRoot("/w/s");
+  FolderRule folder = Folder("/s");
+  folder.full_path = "/w/s";
+  host_.SetFolders({folder});
+  worker_->Reload();
+  worker_->Step();
+  EXPECT_EQ(1U, index_.All().count("/w/s/a.txt"));
+  EXPECT_EQ(0U, index_.All().count("/v/s/a.txt"));
+}
+
+// Folders and pauses.
+
+TEST_F(WorkerTest, RestsWhilePausedAndGoesOn) {
+  disk_.WriteFile("/v/s/a.txt");
+  worker_->SetPaused(true);
+  EXPECT_TRUE(IsAtRest());
+  EXPECT_EQ("paused", State());
+  worker_->SetPaused(false);
+  worker_->Step();
+  ExpectInLine();
+}
+
+TEST_F(WorkerTest, RestsWhileAllFoldersArePaused) {
+  host_.SetFolders({PausedFolder("/s")});
+  disk_.WriteFile("/v/s/a.txt");
+  Queue(EVENT_CREATE, "/v/s/a.txt");
+  EXPECT_TRUE(IsAtRest());
+  EXPECT_EQ("paused", State());
+  EXPECT_TRUE(HasQueue());
+}
+
+TEST_F(WorkerTest, AFolderThatIsNoLongerPausedIsCompared) {
+  host_.SetFolders({Folder("/s"), PausedFolder("/s/p")});
+  disk_.WriteFile("/v/s/p/a.txt");
+  worker_->Step();
+  EXPECT_EQ(0U, index_.All().count("/v/s/p/a.txt"));
+  host_.SetFolders({Folder("/s"), Folder("/s/p")});
+  worker_->Reload();
+  worker_->Step();
+  EXPECT_EQ(1U, index_.All().count("/v/s/p/a.txt"));
+}
+
+TEST_F(WorkerTest, AFolderThatIsNoLongerPausedDuringAPassIsCompared) {
+  host_.SetFolders({Folder("/s"), PausedFolder("/s/p")});
+  disk_.WriteFile("/v/s/p/a.txt");
+  index_.SetHook([this](const std::string& command) {
+    if (command != "commit") return;
+    host_.SetFolders({Folder("/s"), Folder("/s/p")});
+    worker_->Reload();
+  });
+  worker_->Step();
+  index_.SetHook(nullptr);
+  while (worker_->Step() == milliseconds(0)) {
+  }
+  EXPECT_EQ(1U, index_.All().count("/v/s/p/a.txt"));
+}
+
+// The walk itself loads the list that has changed.
+TEST_F(WorkerTest, AFolderThatIsNoLongerPausedBehindTheWalkIsCompared) {
+  host_.SetFolders({Folder("/s"), PausedFolder("/s/a")});
+  disk_.WriteFile("/v/s/a/1.txt");
+  disk_.WriteFile("/v/s/b/2.txt");
+  index_.SetHook([this](const std::string& command) {
+    if (command != "children /v/s/b") return;
+    host_.SetFolders({Folder("/s"), Folder("/s/a")});
+    worker_->Reload();
+  });
+  worker_->Step();
+  index_.SetHook(nullptr);
+  while (worker_->Step() == milliseconds(0)) {
+  }
+  EXPECT_EQ(1U, index_.All().count("/v/s/a/1.txt"));
+}
+
+TEST_F(WorkerTest, LoadsTheFoldersOnlyWhenTheyMayHaveChanged) {
+  for (int i = 0; i < 5; ++i) worker_->Step();
+  EXPECT_EQ(1, host_.Loads());
+  worker_->Reload();
+  for (int i = 0; i < 5; ++i) worker_->Step();
+  EXPECT_EQ(2, host_.Loads());
+}
+
+// The mark in the status file.
+
+TEST_F(WorkerTest, AMarkedShareIsComparedAndTheMarkIsTakenAway) {
+  worker_->Step();
+  disk_.WriteFile("/v/s/untold.txt");
+  host_.MarkNeedsReindex();
+  EXPECT_TRUE(IsAtRest());
+  worker_->CheckStatus();
+  worker_->Step();
+  EXPECT_FALSE(host_.NeedsReindex());
+  ExpectInLine();
+}
+
+TEST_F(WorkerTest, AMarkThatCannotBeTakenAwayIsTriedAgain) {
+  worker_->Step();
+  disk_.WriteFile("/v/s/untold.txt");
+  host_.MarkNeedsReindex();
+  host_.FailClear(Error(kErrorLock, "locked"));
+  worker_->CheckStatus();
+  worker_->Step();
+  EXPECT_EQ("retrying", State());
+  EXPECT_TRUE(host_.NeedsReindex());
+  host_.FailClear(std::nullopt);
+  worker_->Step();
+  EXPECT_FALSE(host_.NeedsReindex());
+  ExpectInLine();
+}
+
+// Its end.
+
+TEST_F(WorkerTest, RunsUntilItIsStopped) {
+  disk_.WriteFile("/v/s/a.txt");
+  std::thread thread([this] { worker_->Run(); });
+  EXPECT_TRUE(test::WaitUntil([this] { return index_.All().size() == 2; }));
+  disk_.WriteFile("/v/s/b.txt");
+  Queue(EVENT_CREATE, "/v/s/b.txt");
+  EXPECT_TRUE(test::WaitUntil([this] { return index_.All().count("/v/s/b.txt") == 1; }));
+  worker_->Stop();
+  thread.join();
+  EXPECT_EQ(milliseconds(0), worker_->Step());
+}
+
+TEST_F(WorkerTest, AStopInTheMiddleLeavesTheSnapshotAndIsNoFailure) {
+  worker_->Step();
+  for (int i = 0; i < 50; ++i) {
+    const std::string path = "/v/s/" + std::to_string(i) + ".txt";
+    disk_.WriteFile(path);
+    Queue(EVENT_CREATE, path);
+  }
+  index_.SetHook([this](const std::string& command) {
+    if (command == "upsert /v/s/9.txt content") worker_->Stop();
+  });
+  worker_->Step();
+  EXPECT_TRUE(HasSnapshot());
+  EXPECT_EQ("", LastError());
+}
+
+TEST_F(WorkerTest, AReloadEndsTheWaitAfterAFailure) {
+  host_.FailLoad(Error(kErrorShareNotFound, "no share"));
+  std::thread thread([this] { worker_->Run(); });
+  EXPECT_TRUE(test::WaitUntil([this] { return State() == "retrying"; }));
+  host_.FailLoad(std::nullopt);
+  disk_.WriteFile("/v/s/a.txt");
+  worker_->Reload();
+  EXPECT_TRUE(test::WaitUntil([this] { return index_.All().size() == 2; }));
+  worker_->Stop();
+  thread.join();
+}
+
+}  // namespace
+}  // namespace quarry::fileindexd
