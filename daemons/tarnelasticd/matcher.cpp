@@ -177,13 +177,9 @@ bool IsPlainNegation(const std::vector<QueryTerm>& group) {
 
 }  // namespace
 
+// As typed: the database folds it exactly as it has folded the texts, whatever bytes there are.
 std::string PhraseExpression(const QueryTerm& term) {
-  std::string text;
-  for (const std::string& word : term.words) {
-    if (!text.empty()) text += ' ';
-    text += word;
-  }
-  return Quoted(text) + (term.prefix ? "*" : "");
+  return Quoted(term.text) + (term.prefix ? "*" : "");
 }
 
 DocSet MatchRows(Database* db, const std::string& table, const std::string& expression) {

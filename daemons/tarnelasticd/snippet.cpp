@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <deque>
+#include <optional>
 
 namespace quarry::engine {
 namespace {
@@ -88,12 +89,17 @@ bool IsContinuation(char c) {
 
 constexpr std::size_t kWordReach = 40;
 
-// Moves `at` back to the nearest beginning of a word, or of a character where words are long.
-std::size_t CutBefore(std::string_view text, std::size_t at) {
+// The nearest beginning of a word at or before `at`, where there is one near.
+std::optional<std::size_t> WordBefore(std::string_view text, std::size_t at) {
   const std::size_t least = at - std::min(at, kWordReach);
   for (std::size_t i = at; i > least; --i) {
     if (IsBlank(text[i - 1])) return i;
   }
+  if (least == 0) return 0;
+  return std::nullopt;
+}
+
+std::size_t CharacterBefore(std::string_view text, std::size_t at) {
   while (at > 0 && at < text.size() && IsContinuation(text[at])) --at;
   return at;
 }
@@ -102,11 +108,14 @@ std::size_t CutBefore(std::string_view text, std::size_t at) {
 std::pair<std::size_t, std::size_t> Window(std::string_view text, std::size_t begin,
                                            std::size_t end, std::size_t length) {
   const std::size_t room = length > end - begin ? length - (end - begin) : 0;
-  const std::size_t wished = begin - std::min(begin, room / 3);
-  const std::size_t start = wished <= kWordReach ? 0 : CutBefore(text, wished);
-  std::size_t stop = std::min(text.size(), std::max(end, start + length));
-  if (stop < text.size()) stop = std::max(end, CutBefore(text, stop));
-  return {start, stop};
+  // At the end of the text the room behind is given to what stands before.
+  const std::size_t last = text.size() - std::min(text.size(), length);
+  const std::size_t wished = std::min(begin - std::min(begin, room / 3), last);
+  const std::size_t start = WordBefore(text, wished).value_or(CharacterBefore(text, wished));
+  const std::size_t stop = std::min(text.size(), std::max(end, start + length));
+  if (stop == text.size()) return {start, stop};
+  const std::size_t word = WordBefore(text, stop).value_or(start);
+  return {start, std::max(end, word > start ? word : CharacterBefore(text, stop))};
 }
 
 // Copies text, drawing blanks together, and keeps track of where bytes go.
