@@ -110,7 +110,8 @@ int OnText(MD_TEXTTYPE type, const MD_CHAR* text, MD_SIZE size, void* reader) {
   return ReaderOf(reader).full() ? 1 : 0;
 }
 
-void Parse(std::string_view utf8, MarkdownReader& reader) {
+// Returns whether the parser got to the end, or as far as text is wanted.
+bool Parse(std::string_view utf8, MarkdownReader& reader) {
   MD_PARSER parser{};
   parser.flags = MD_DIALECT_GITHUB;
   parser.enter_block = OnEnterBlock;
@@ -118,7 +119,7 @@ void Parse(std::string_view utf8, MarkdownReader& reader) {
   parser.enter_span = OnSpan;
   parser.leave_span = OnSpan;
   parser.text = OnText;
-  md_parse(utf8.data(), static_cast<MD_SIZE>(utf8.size()), &parser, &reader);
+  return md_parse(utf8.data(), static_cast<MD_SIZE>(utf8.size()), &parser, &reader) >= 0;
 }
 
 class MarkdownExtractor : public Extractor {
@@ -140,7 +141,12 @@ class MarkdownExtractor : public Extractor {
     const auto decoded = DecodeText(source.Bytes());
     if (!decoded) return;
     MarkdownReader reader(out);
-    Parse(TakeFrontMatter(decoded->utf8, out), reader);
+    const std::string_view body = TakeFrontMatter(decoded->utf8, out);
+    if (Parse(body, reader)) return;
+    // Of marks alone there can be more than memory has room for: then the text is what it looks
+    // like.
+    out.text().Take();
+    out.text().Append(body);
   }
 };
 

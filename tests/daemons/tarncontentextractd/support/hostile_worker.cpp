@@ -131,6 +131,7 @@ class HostileExtractor : public Extractor {
     if (what == "endless") ClaimMuch();
     if (what == "ahead") AnswerTwice();
     if (what == "usedcrash" && files_seen > 1) raise(SIGKILL);
+    if (what == "overrule") Overrule(out);
     if (what == "good" || what == "usedcrash") out.text().Append(source.Bytes());
     out.Set(kTitleField, Try(what, source));
   }
@@ -138,6 +139,11 @@ class HostileExtractor : public Extractor {
  private:
   [[noreturn]] static void Spin() {
     for (volatile unsigned counter = 0;;) counter = counter + 1;
+  }
+  // Fields that are not a parser's to say.
+  static void Overrule(Extraction& out) {
+    out.Set("TARNMDPath", "/etc/passwd");
+    out.Set("TARNMDFSSize", "much");
   }
   static void Throw(Extraction& out) {
     out.text().Append("what was found before");

@@ -1,0 +1,295 @@
+#include "daemons/tarncontentextractd/service.h"
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <random>
+#include <thread>
+
+#include "common/error.h"
+#include "common/json.h"
+#include "daemons/tarncontentextractd/stamp.h"
+#include "tests/daemons/tarncontentextractd/support/extract_support.h"
+#include "tests/support/files.h"
+#include "tests/support/temp_dir.h"
+
+namespace quarry::extract {
+namespace {
+
+using std::chrono::seconds;
+
+WorkerPoolOptions Options(const std::vector<std::string>& command) {
+  WorkerPoolOptions options;
+  options.command = command;
+  options.workers = 2;
+  options.start_timeout = seconds(60);
+  options.file_timeout = seconds(60);
+  options.pause = std::chrono::hours(1);
+  return options;
+}
+
+class ServiceTest : public ::testing::Test {
+ protected:
+  explicit ServiceTest(const std::vector<std::string>& command = RealWorker())
+      : pool_(Options(command)), service_(pool_) {
+    test::WriteFile(dir_ / "page.html", "<!doctype html><title>A title</title><p>Some words");
+  }
+
+  Json::Value Ask(const std::string& request) {
+    Json::Value answer;
+    EXPECT_TRUE(fromString(answer, service_.Handle(request))) << request;
+    return answer;
+  }
+  // The code and the text of the error that the request is answered with.
+  std::string ErrorOf(const std::string& request) {
+    const Json::Value answer = Ask(request);
+    EXPECT_EQ(answer.getMemberNames(), (Json::Value::Members{"error", "success"})) << request;
+    EXPECT_FALSE(answer["success"].asBool());
+    return answer["error"]["code"].asString() + " " + answer["error"]["msg"].asString();
+  }
+  Json::Value Document(const std::string& path) { return service_.ParseFile(path, true); }
+  static bool HasContent(const Json::Value& document) {
+    return document.isMember("TARNMDTextContent");
+  }
+  static std::string StampOf(const std::string& path) {
+    struct stat status {};
+    EXPECT_EQ(lstat(path.c_str(), &status), 0);
+    return ContentStamp(status);
+  }
+
+  test::TempDir dir_;
+  WorkerPool pool_;
+  ExtractService service_;
+};
+
+TEST_F(ServiceTest, ADocumentHasAttributesAndContent) {
+  const std::string path = dir_ / "page.html";
+  const Json::Value answer = Ask("{\"command\":\"parse\",\"data\":{\"path\":\"" + path +
+                                 "\",\"options\":{\"need_meta\":true}}}");
+  EXPECT_TRUE(answer["success"].asBool());
+  EXPECT_EQ(answer.getMemberNames(), (Json::Value::Members{"data", "success"}));
+  const Json::Value& document = answer["data"];
+  EXPECT_EQ(document["TARNMDPath"].asString(), path);
+  EXPECT_EQ(document["TARNMDFSName"].asString(), "page.html");
+  EXPECT_EQ(document["TARNMDExtension"].asString(), "html");
+  EXPECT_EQ(document["TARNMDTitle"].asString(), "A title");
+  EXPECT_EQ(document["TARNMDTextContent"].asString(), "Some words");
+  EXPECT_EQ(document["QuarryContentStamp"].asString(), StampOf(path));
+}
+
+TEST_F(ServiceTest, WithoutNeedOfMetaNoWorkerIsAsked) {
+  for (const char* options :
+       {"", ",\"options\":{}", ",\"options\":null", ",\"options\":{\"need_meta\":false}"}) {
+    const Json::Value answer = Ask("{\"command\":\"parse\",\"data\":{\"path\":\"" +
+                                   (dir_ / "page.html") + "\"" + options + "}}");
+    EXPECT_EQ(answer["data"]["TARNMDFSName"].asString(), "page.html") << options;
+    EXPECT_FALSE(HasContent(answer["data"])) << options;
+    EXPECT_FALSE(answer["data"].isMember("QuarryContentStamp")) << options;
+  }
+  EXPECT_EQ(pool_.WorkerCount(), 0u);
+}
+
+TEST_F(ServiceTest, WhatHasNoContentHasAttributesAndAStamp) {
+  test::WriteFile(dir_ / "empty.txt", "");
+  test::MakeDirs(dir_ / "dir.d");
+  ASSERT_EQ(symlink("page.html", (dir_ / "link").c_str()), 0);
+  ASSERT_EQ(mkfifo((dir_ / "fifo").c_str(), 0600), 0);
+  for (const char* name : {"empty.txt", "dir.d", "link", "fifo"}) {
+    const Json::Value document = Document(dir_ / name);
+    EXPECT_EQ(document["TARNMDFSName"].asString(), name);
+    EXPECT_FALSE(HasContent(document)) << name;
+    EXPECT_EQ(document["QuarryContentStamp"].asString(), StampOf(dir_ / name));
+  }
+  EXPECT_EQ(Document("/dev/zero")["TARNMDFSName"].asString(), "zero");
+  EXPECT_TRUE(Document(dir_ / "dir.d")["TARNMDIsDir"].asBool());
+  EXPECT_EQ(pool_.WorkerCount(), 0u) << "nothing of it is ever opened";
+}
+
+TEST_F(ServiceTest, OtherDataHasAttributesAndAStamp) {
+  test::WriteFile(dir_ / "a.bin", std::string("\x7F"
+                                              "ELF\0\1\2\3\0\0\0\0",
+                                              12));
+  const Json::Value document = Document(dir_ / "a.bin");
+  EXPECT_FALSE(HasContent(document));
+  EXPECT_TRUE(document.isMember("QuarryContentStamp"));
+}
+
+TEST_F(ServiceTest, NamesAreOfAnyBytes) {
+  const std::string path = dir_ / "\xFF\xC3 \"\\\n\x01.TXT";
+  test::WriteFile(path, "words");
+  Json::Value request;
+  request["command"] = "parse";
+  request["data"]["path"] = path;
+  request["data"]["options"]["need_meta"] = true;
+  const Json::Value document = Ask(toString(request))["data"];
+  EXPECT_EQ(document["TARNMDPath"].asString(), path);
+  EXPECT_EQ(document["TARNMDTextContent"].asString(), "words");
+}
+
+TEST_F(ServiceTest, SlashesAtTheEndAreNotPartOfAName) {
+  EXPECT_EQ(Document(dir_.path() + "///")["TARNMDPath"].asString(), dir_.path());
+  EXPECT_EQ(Document("//")["TARNMDPath"].asString(), "/");
+  EXPECT_EQ(Document("/")["TARNMDParent"].asString(), "/");
+}
+
+TEST_F(ServiceTest, WhatIsNotThereIsAnError) {
+  const auto error_of = [this](const std::string& path) {
+    return ErrorOf("{\"command\":\"parse\",\"data\":{\"path\":\"" + path + "\"}}");
+  };
+  EXPECT_EQ(error_of(dir_ / "none"),
+            "914 Cannot open " + (dir_ / "none") + ": No such file or directory");
+  EXPECT_EQ(error_of(dir_ / "page.html/below"),
+            "914 Cannot open " + (dir_ / "page.html/below") + ": Not a directory");
+  EXPECT_EQ(error_of("relative"), "120 Not an absolute path: relative");
+  EXPECT_EQ(error_of(""), "120 Not an absolute path: ");
+  EXPECT_EQ(error_of("/v/\\u0000a"), "120 A path cannot hold a NUL byte");
+}
+
+struct Refusal {
+  const char* request;
+  const char* error;
+};
+
+TEST_F(ServiceTest, RequestsThatAreNoneAreRefused) {
+  const Refusal kCases[] = {
+      {"", "120 The request is not JSON"},
+      {"nonsense", "120 The request is not JSON"},
+      {"{\"command\":\"parse\"} x", "120 The request is not JSON"},
+      {"null", "120 Missing property: command, data=null"},
+      {"[]", "120 Not an object, data=[]"},
+      {"7", "120 Not an object, data=7"},
+      {"{}", "120 Missing property: command, data={}"},
+      {"{\"command\":[]}", "120 Not a string, data={\"command\":[]}"},
+      {"{\"command\":\"\"}", "120 Unknown command: "},
+      {"{\"command\":\"search\",\"data\":{}}", "120 Unknown command: search"},
+      {"{\"command\":\"parse\"}", "120 Missing property: data, data={\"command\":\"parse\"}"},
+      {"{\"command\":\"parse\",\"data\":[]}", "120 Not an object, data=[]"},
+      {"{\"command\":\"parse\",\"data\":\"/a\"}", "120 Not an object, data=\"/a\""},
+      {"{\"command\":\"parse\",\"data\":{}}", "120 Missing property: path, data={}"},
+      {"{\"command\":\"parse\",\"data\":{\"path\":{}}}", "120 Not a string, data={\"path\":{}}"},
+      {"{\"command\":\"parse\",\"data\":{\"path\":\"/\",\"options\":[]}}",
+       "120 Not an object, data=[]"},
+      {"{\"command\":\"parse\",\"data\":{\"path\":\"/\",\"options\":true}}",
+       "120 Not an object, data=true"},
+      {"{\"command\":\"parse\",\"data\":{\"path\":\"/\",\"options\":{\"need_meta\":\"yes\"}}}",
+       "120 Not a string, data={\"need_meta\":\"yes\"}"}};
+  for (const Refusal& each : kCases) EXPECT_EQ(ErrorOf(each.request), each.error) << each.request;
+  const std::string deep(100000, '[');
+  EXPECT_EQ(ErrorOf(deep), "120 The request is not JSON");
+}
+
+TEST_F(ServiceTest, RequestsChangedAtRandomAreAnswered) {
+  std::mt19937 random(9);
+  const std::string request = "{\"command\":\"parse\",\"data\":{\"path\":\"" +
+                              (dir_ / "page.html") + "\",\"options\":{\"need_meta\":false}}}";
+  for (int round = 0; round < 3000; ++round) {
+    std::string changed = request;
+    for (auto changes = 1 + random() % 4; changes > 0; --changes) {
+      changed[random() % changed.size()] = static_cast<char>(random());
+    }
+    EXPECT_TRUE(Ask(changed)["success"].isBool());
+  }
+}
+
+TEST_F(ServiceTest, AFileThatMayNotBeReadHasItsAttributes) {
+  ASSERT_EQ(chmod((dir_ / "page.html").c_str(), 0), 0);
+  const Json::Value document = Document(dir_ / "page.html");
+  EXPECT_EQ(document["TARNMDPrivilege"].asString(), "0000");
+  // Root reads it all the same.
+  EXPECT_EQ(HasContent(document), geteuid() == 0);
+  EXPECT_TRUE(document.isMember("QuarryContentStamp"));
+}
+
+// Here because the table of descriptors is full for a moment.
+TEST_F(ServiceTest, AFileThatCannotBeReadNowIsToBeTriedAgain) {
+  rlimit limit{};
+  ASSERT_EQ(getrlimit(RLIMIT_NOFILE, &limit), 0);
+  const int lowest_free = UniqueFd(open("/", O_PATH | O_CLOEXEC)).get();
+  // Enough to find the file, too few to read it.
+  const rlimit tight{static_cast<rlim_t>(lowest_free) + 1, limit.rlim_max};
+  ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &tight), 0);
+  const Json::Value document = Document(dir_ / "page.html");
+  ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &limit), 0);
+  EXPECT_EQ(document["TARNMDFSName"].asString(), "page.html");
+  EXPECT_FALSE(HasContent(document));
+  EXPECT_FALSE(document.isMember("QuarryContentStamp"));
+  EXPECT_TRUE(HasContent(Document(dir_ / "page.html")));
+}
+
+TEST_F(ServiceTest, ManyAskAtOnce) {
+  std::vector<std::thread> threads;
+  for (int t = 0; t < 6; ++t) {
+    threads.emplace_back([this, t] {
+      const std::string path = dir_ / (std::to_string(t) + ".txt");
+      test::WriteFile(path, "words of " + std::to_string(t));
+      for (int i = 0; i < 20; ++i) {
+        EXPECT_EQ(Document(path)["TARNMDTextContent"].asString(), "words of " + std::to_string(t));
+      }
+    });
+  }
+  for (std::thread& thread : threads) thread.join();
+}
+
+class HostileServiceTest : public ServiceTest {
+ protected:
+  HostileServiceTest() : ServiceTest(HostileWorker()) {}
+
+  std::string Hostile(const std::string& what) {
+    test::WriteFile(dir_ / ("file." + what), "some words");
+    return dir_ / ("file." + what);
+  }
+};
+
+TEST_F(HostileServiceTest, AFileThatKillsItsWorkerIsRememberedAndHasItsAttributes) {
+  const std::string bad = Hostile("crash");
+  const Json::Value document = Document(bad);
+  EXPECT_EQ(document["TARNMDFSSize"].asInt(), 10);
+  EXPECT_FALSE(HasContent(document));
+  EXPECT_EQ(document["QuarryContentStamp"].asString(), StampOf(bad));
+  EXPECT_TRUE(HasContent(Document(Hostile("good"))));
+  ASSERT_EQ(pool_.WorkerCount(), 1u);
+  EXPECT_EQ(toString(Document(bad)), toString(document));
+  EXPECT_EQ(pool_.WorkerCount(), 1u) << "no worker has seen it again";
+}
+
+TEST_F(HostileServiceTest, ABadFileThatChangesIsTriedAgain) {
+  const std::string bad = Hostile("crash");
+  EXPECT_FALSE(HasContent(Document(bad)));
+  ASSERT_TRUE(HasContent(Document(Hostile("good"))));
+  ASSERT_EQ(pool_.WorkerCount(), 1u);
+  test::WriteFile(bad, "other words");
+  EXPECT_FALSE(HasContent(Document(bad)));
+  EXPECT_EQ(pool_.WorkerCount(), 0u) << "it has killed once more";
+}
+
+TEST_F(HostileServiceTest, WhatAParserSaysOverrulesNoAttribute) {
+  const Json::Value document = Document(Hostile("overrule"));
+  EXPECT_EQ(document["TARNMDPath"].asString(), dir_ / "file.overrule");
+  EXPECT_EQ(document["TARNMDFSSize"].asInt(), 10);
+  EXPECT_TRUE(document["TARNMDFSSize"].isIntegral());
+}
+
+class BrokenServiceTest : public ServiceTest {
+ protected:
+  BrokenServiceTest() : ServiceTest(HostileWorker("open")) {}
+};
+
+TEST_F(BrokenServiceTest, WithoutWorkersThereAreAttributesAndNoStamp) {
+  const Json::Value document = Document(dir_ / "page.html");
+  EXPECT_EQ(document["TARNMDFSName"].asString(), "page.html");
+  EXPECT_FALSE(HasContent(document));
+  EXPECT_FALSE(document.isMember("QuarryContentStamp")) << "another time it may succeed";
+}
+
+TEST_F(ServiceTest, IsAnErrorWhileTheDaemonStops) {
+  pool_.Stop();
+  EXPECT_EQ(ErrorOf("{\"command\":\"parse\",\"data\":{\"path\":\"" + (dir_ / "page.html") +
+                    "\",\"options\":{\"need_meta\":true}}}"),
+            "502 The extractor is stopping");
+}
+
+}  // namespace
+}  // namespace quarry::extract
