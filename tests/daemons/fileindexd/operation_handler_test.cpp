@@ -206,6 +206,16 @@ TEST_F(OperationHandlerTest, AFileThatVanishesWhileItsAttributesAreReadIsRemoved
   EXPECT_EQ(0U, index_.All().count("/v/s/a.txt"));
 }
 
+TEST_F(OperationHandlerTest, AttributesOfAFileInADirectorysPlaceReplaceIt) {
+  disk_.WriteFile("/v/s/d/a.txt");
+  Run(true);
+  disk_.Remove("/v/s/d");
+  disk_.WriteFile("/v/s/d");
+  Queue(EVENT_ATTR, "/v/s/d");
+  EXPECT_THAT(CommandsOf(), ElementsAre("delete below /v/s/d", "upsert /v/s/d content"));
+  EXPECT_EQ(0U, index_.All().count("/v/s/d/a.txt"));
+}
+
 // Rename.
 
 TEST_F(OperationHandlerTest, RenameMovesTheDocument) {
@@ -253,6 +263,19 @@ TEST_F(OperationHandlerTest, RenameOutOfTheFoldersRemoves) {
   EXPECT_THAT(CommandsOf(), ::testing::Not(::testing::Contains(::testing::StartsWith("rename"))));
   EXPECT_EQ(0U, index_.All().count("/v/s/in/a.txt"));
   EXPECT_EQ(0U, index_.All().count("/v/s/a.txt"));
+}
+
+// A pass that is done again may find another file at the old place, which looks the same.
+TEST_F(OperationHandlerTest, RenameMovesNoDocumentOfAnotherFile) {
+  disk_.WriteFile("/v/s/b.txt");
+  disk_.WriteFile("/v/s/a.txt");
+  Run(true);
+  Document twin = index_.All()["/v/s/a.txt"];
+  twin.content_stamp = disk_.Peek("/v/s/b.txt").content_stamp;
+  index_.Put(twin);
+  index_.Delete("/v/s/b.txt");
+  Queue(EVENT_RENAME, "/v/s/b.txt", false, "/v/s/a.txt");
+  EXPECT_THAT(CommandsOf(), ElementsAre("upsert /v/s/a.txt content", "upsert /v/s/b.txt content"));
 }
 
 TEST_F(OperationHandlerTest, RenameOfWhatHasMovedOnRemovesIt) {
@@ -390,6 +413,22 @@ TEST_F(OperationHandlerTest, AFolderBehindAnUnwantedPlaceIsFoundByAWalkAroundIt)
   ExpectInLine();
   EXPECT_EQ(1U, index_.All().count("/v/s/@eaDir/f/a.txt"));
   EXPECT_EQ(0U, index_.All().count("/v/s/@eaDir/b.txt"));
+}
+
+TEST_F(OperationHandlerTest, DocumentsOutsideTheShareAreOrphans) {
+  index_.Put({"/elsewhere/s/a.txt", false, "", ""});
+  Queue(EVENT_OVERFLOW, "");
+  CommandsOf();
+  EXPECT_EQ(0U, index_.All().count("/elsewhere/s/a.txt"));
+}
+
+TEST_F(OperationHandlerTest, DocumentsOfPausedFoldersAreNoOrphans) {
+  SetFolders({Folder("/s"), PausedFolder("/s/p")});
+  index_.Put({"/v/s/p", true, "", ""});
+  index_.Put({"/v/s/p/gone.txt", false, "", ""});
+  Queue(EVENT_OVERFLOW, "");
+  EXPECT_THAT(CommandsOf(), ElementsAre("upsert /v/s"));
+  EXPECT_EQ(1U, index_.All().count("/v/s/p/gone.txt"));
 }
 
 TEST_F(OperationHandlerTest, OrphansAreFoundByAFullReindex) {

@@ -1,0 +1,28 @@
+#include "daemons/fileindexd/failure.h"
+
+#include <gtest/gtest.h>
+
+#include "daemons/tarnelasticd/engine_error.h"
+
+namespace quarry::fileindexd {
+namespace {
+
+TEST(FailureTest, TellsWhoseFaultItIs) {
+  EXPECT_EQ(Failure::kDocument, Classify(Error(914, "")));
+  EXPECT_EQ(Failure::kDocument, Classify(Error(120, "")));
+  EXPECT_EQ(Failure::kDocument, Classify(Error(engine::kMalformedRequest, "")));
+  EXPECT_EQ(Failure::kChannel, Classify(Error(913, "")));
+  EXPECT_EQ(Failure::kIndexMissing, Classify(Error(engine::kUnknownIndex, "")));
+  EXPECT_EQ(Failure::kIndexMissing, Classify(Error(engine::kDamagedIndex, "")));
+  for (const int code : {502, 916, 1003, 1400, 1401, 1406, 1407, 1408, 1413, 1414, 1415, -7}) {
+    EXPECT_EQ(Failure::kPass, Classify(Error(code, ""))) << code;
+  }
+}
+
+TEST(FailureTest, IsDescribedForPeople) {
+  EXPECT_EQ("The disk is full (code 1407)", Describe(Error(1407, "The disk is full")));
+  EXPECT_EQ("code 900", Describe(Error(900, "")));
+}
+
+}  // namespace
+}  // namespace quarry::fileindexd
