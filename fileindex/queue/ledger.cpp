@@ -1,7 +1,6 @@
 #include "fileindex/queue/ledger.h"
 
 #include <algorithm>
-#include <cstdint>
 #include <iterator>
 #include <string>
 
@@ -13,11 +12,6 @@ constexpr std::size_t kFewChildren = 8;
 
 bool IsWork(FileIndexOP kind) {
   return kind == OP_INDEX || kind == OP_ATTR || kind == OP_REINDEX;
-}
-
-// Kinds that no rule knows fare as OP_FULL_REINDEX does.
-std::size_t Slot(FileIndexOP kind) {
-  return std::min<std::size_t>(static_cast<std::uint32_t>(kind), OP_FULL_REINDEX);
 }
 
 // Appends the shorter to the longer, and leaves the result in `to`.
@@ -128,22 +122,22 @@ void Ledger::Enter(OPNode::RecordIndex& index, OP* rec) {
     return;
   }
   OPNode::RecordIndex::RecordSet& set = index.about[rec->node.get()];
-  OPNode::RecordIndex::OfKind& of_kind = set.kinds[Slot(rec->op)];
+  OPNode::RecordIndex::OfKind& of_kind = set.Of(rec->op);
   of_kind.recs.push_back(rec);
   of_kind.last = ++set.entered;
 }
 
 // All records of a kind have changed alike, or none has.
 void Ledger::Refile(OPNode::RecordIndex::RecordSet& set, FileIndexOP kind) {
-  OPNode::RecordIndex::OfKind& from = set.kinds[kind];
+  OPNode::RecordIndex::OfKind& from = set.Of(kind);
   if (from.recs.empty()) return;
   const FileIndexOP changed = from.recs.front()->op;
-  if (Slot(changed) == Slot(kind)) return;
+  OPNode::RecordIndex::OfKind& to = set.Of(changed);
+  if (&to == &from) return;
   if (changed == OP_NONE) {
     from.recs.clear();
     return;
   }
-  OPNode::RecordIndex::OfKind& to = set.kinds[Slot(changed)];
   to.last = to.recs.empty() ? from.last : std::max(to.last, from.last);
   Pour(from.recs, to.recs);
 }
@@ -186,7 +180,7 @@ FileIndexOP Ledger::TakeWork(OPNode& node) {
   OPNode::RecordIndex::RecordSet& own = Sift(node, nullptr).about[&node];
   std::size_t last = 0;
   for (const FileIndexOP kind : {OP_INDEX, OP_ATTR, OP_REINDEX}) {
-    OPNode::RecordIndex::OfKind& of_kind = own.kinds[kind];
+    OPNode::RecordIndex::OfKind& of_kind = own.Of(kind);
     if (of_kind.recs.empty()) continue;
     if (of_kind.last > last) work = kind;
     last = std::max(last, of_kind.last);

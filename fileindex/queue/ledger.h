@@ -7,8 +7,10 @@
 #ifndef QUARRY_FILEINDEX_QUEUE_LEDGER_H_
 #define QUARRY_FILEINDEX_QUEUE_LEDGER_H_
 
+#include <algorithm>
 #include <array>
 #include <cstddef>
+#include <cstdint>
 #include <memory>
 #include <string_view>
 #include <unordered_map>
@@ -40,6 +42,12 @@ struct OPNode::RecordIndex {
   };
   // Records about one node.
   struct RecordSet {
+    OfKind& Of(FileIndexOP kind) { return kinds[Slot(kind)]; }
+    // Kinds that no rule knows fare as OP_FULL_REINDEX does.
+    static std::size_t Slot(FileIndexOP kind) {
+      return std::min<std::size_t>(static_cast<std::uint32_t>(kind), OP_FULL_REINDEX);
+    }
+
     std::array<OfKind, OP_FULL_REINDEX + 1> kinds;
     std::size_t entered = 0;
   };
@@ -80,7 +88,7 @@ class Ledger {
     // Configuration updates come first: what becomes one is not to be merged with itself.
     for (const FileIndexOP kind :
          {OP_UPDATE_CFG, OP_DELETE, OP_INDEX, OP_ATTR, OP_REINDEX, OP_FULL_REINDEX}) {
-      for (OP* rec : own.kinds[kind].recs) {
+      for (OP* rec : own.Of(kind).recs) {
         if (!rule(*rec)) break;
       }
       Refile(own, kind);
