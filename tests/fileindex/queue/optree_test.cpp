@@ -87,6 +87,34 @@ TEST_F(OPTreeTest, FileThatCannotBeRead) {
   }
 }
 
+// Half a queue must not pass for a whole one.
+TEST_F(OPTreeTest, FileThatCannotBeReadToItsEnd) {
+  log_level = 6;
+  std::string lines;
+  while (lines.size() < 200'000) lines += Line(EVENT_MODIFY, "/a");
+  const QueueFile queue(lines);
+  errno = 0;
+  fake::FailSystemCall("read", 2, EIO);
+  try {
+    OPTree tree(queue.path());
+    FAIL();
+  } catch (const Error& error) {
+    EXPECT_EQ(error.code(), 502);
+    EXPECT_EQ(error.reason(), "Failed to open queue, reason=Input/output error");
+  }
+  EXPECT_EQ(AnyLines(fake::Logs()),
+            Strings{ErrorLine("BuildTree",
+                              "Failed [!input_stream], reason: Failed to open queue, "
+                              "reason=Input/output error [err: Input/output error]")});
+}
+
+TEST_F(OPTreeTest, InterruptedReadIsRepeated) {
+  const QueueFile queue(Line(EVENT_MODIFY, "/a"));
+  fake::FailSystemCall("read", 1, EINTR);
+  OPTree tree(queue.path());
+  EXPECT_EQ(HandedOut(tree), Strings{"index /a"});
+}
+
 TEST_F(OPTreeTest, EveryLineIsLoggedWhileDebugging) {
   const std::string a = Line(EVENT_MODIFY, "/a");
   const QueueFile queue(a + Line(EVENT_MODIFY, "/b"));

@@ -145,6 +145,14 @@ TEST_F(QueueMgrTest, SnapshotIsDeleted) {
   EXPECT_EQ(errno, ENOENT);
 }
 
+TEST_F(QueueMgrTest, SnapshotThatCannotBeDeletedIsReported) {
+  WriteTmp("old");
+  fake::FailSystemCall("unlink", 1, EACCES);
+  EXPECT_EQ(QueueMgr(live_).DeleteTmp(), -1);
+  EXPECT_EQ(errno, EACCES);
+  EXPECT_EQ(test::ReadFile(tmp_), "old");
+}
+
 // ---- Processing
 
 TEST_F(QueueMgrTest, NothingToProcess) {
@@ -360,6 +368,17 @@ TEST_F(QuestionTest, QueueThatCannotBeOpenedIsAnError) {
             fake::AnyLine(fake::LogHead("queue_mgr", 1, "FindQueue")) +
                 "Failed [!input_stream], reason: Failed to open queue, reason=Too many open files "
                 "[err: Too many open files]");
+}
+
+TEST_F(QuestionTest, QueueThatCannotBeReadToItsEndIsAnError) {
+  std::string lines;
+  while (lines.size() < 200'000) lines += Line(EVENT_MODIFY, "/s/b");
+  WriteLive(lines + Line(EVENT_REINDEX, "/s/a"));
+  EXPECT_TRUE(HasReindex("/s/a"));
+  fake::FailSystemCall("read", 2, EIO);
+  const Error error = Refusal([this] { HasReindex("/s/a"); });
+  EXPECT_EQ(error.code(), 502);
+  EXPECT_EQ(error.reason(), "Failed to open queue, reason=Input/output error");
 }
 
 // Another process renames the live queue between the two looks.
