@@ -26,6 +26,11 @@ enum EngineCode : int {
   kMovingIndex = 1415,  // its database is being replaced or moved
 };
 
+// Whether the error carries that code.
+inline bool HasCode(const Error& error, EngineCode code) {
+  return static_cast<int>(error.code()) == code;
+}
+
 }  // namespace quarry::engine
 
 #endif  // QUARRY_DAEMONS_TARNELASTICD_ENGINE_ERROR_H_

@@ -20,7 +20,7 @@ Index::Access::Access(Index* index, bool wait)
     : index_(index), lock_(index->gate_, std::defer_lock) {
   Lock(wait);
   if (index_->store_) return;
-  if (index_->ProblemOr(kStorageFailed).code() != ErrorCode{kDamagedIndex}) {
+  if (!HasCode(index_->ProblemOr(kStorageFailed), kDamagedIndex)) {
     lock_.unlock();
     index_->Open();
     Lock(wait);
@@ -77,7 +77,7 @@ void Index::Open() {
 
 bool Index::IsDamaged() {
   const std::optional<Error> problem = Problem();
-  if (problem) return problem->code() == ErrorCode{kDamagedIndex};
+  if (problem) return HasCode(*problem, kDamagedIndex);
   const std::shared_lock<std::shared_mutex> lock(gate_);
   if (!store_) return false;
   const std::lock_guard<std::mutex> writer_lock(writer_mutex_);
@@ -85,7 +85,7 @@ bool Index::IsDamaged() {
 }
 
 void Index::NoteDamage(const Error& error) {
-  if (error.code() == ErrorCode{kDamagedIndex}) SetProblem(error);
+  if (HasCode(error, kDamagedIndex)) SetProblem(error);
 }
 
 void Index::SetProblem(std::optional<Error> problem) {
@@ -172,7 +172,7 @@ void Index::CloseCommitted() {
   } catch (const Error& error) {
     CheckLost();
     // A database that is gone or broken has nothing that could be kept.
-    if (error.code() != ErrorCode{kDamagedIndex}) throw;
+    if (!HasCode(error, kDamagedIndex)) throw;
   }
   store_.reset();
 }

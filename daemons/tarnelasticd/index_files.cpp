@@ -224,7 +224,7 @@ std::shared_ptr<const Schema> LoadSchema(const std::string& directory) {
     return ReadSchema(&db);
   } catch (const Error& error) {
     // Whatever is wrong with what can be read, the file is not what this engine has written.
-    if (error.code() == ErrorCode{kBadMappings} || error.code() == ErrorCode{kStorageFailed}) {
+    if (HasCode(error, kBadMappings) || HasCode(error, kStorageFailed)) {
       throw Error(kDamagedIndex, error.reason());
     }
     throw;

@@ -9,7 +9,7 @@ namespace {
 
 // Whether an index, and not the query, may be at fault.
 bool IsFaultOfAnIndex(const Error& error) {
-  return error.code() == ErrorCode{kDamagedIndex} || error.code() == ErrorCode{kStorageFailed};
+  return HasCode(error, kDamagedIndex) || HasCode(error, kStorageFailed);
 }
 
 }  // namespace

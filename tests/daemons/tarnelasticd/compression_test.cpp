@@ -28,7 +28,7 @@ TEST(CompressionTest, RefusesWhatItHasNotMade) {
       Decompress(whole.substr(0, size));
       ADD_FAILURE() << size;
     } catch (const Error& error) {
-      EXPECT_EQ(error.code(), ErrorCode{kDamagedIndex});
+      EXPECT_TRUE(HasCode(error, kDamagedIndex));
     }
   }
   EXPECT_THROW(Decompress("no frame at all"), Error);
