@@ -321,6 +321,38 @@ TEST_P(SocketServerTest, FinishAnswersWhatIsInWork) {
   EXPECT_NE(access(path_.c_str(), F_OK), 0);
 }
 
+TEST_P(SocketServerTest, FinishAnswersWhatWasSentBeforeAnybodyLooked) {
+  SocketServer server(path_, Echo, Options());
+  RawPeer peers[] = {RawPeer(path_), RawPeer(path_), RawPeer(path_)};
+  for (RawPeer& peer : peers) peer.Send(MakeFrame("x"));
+  EXPECT_TRUE(server.Finish(10000));
+  for (RawPeer& peer : peers) {
+    EXPECT_EQ(peer.RecvFrame(), "echo:x");
+    EXPECT_TRUE(peer.IsClosed());
+  }
+}
+
+// Whoever asks again and again cannot put off the end.
+TEST_P(SocketServerTest, FinishIsNotHeldUpByAPeerThatGoesOn) {
+  SocketServer server(path_, Echo, Options());
+  std::atomic<bool> over{false};
+  std::thread chatty([&] {
+    RawPeer peer(path_);
+    try {
+      while (true) {
+        peer.Send(MakeFrame("x"));
+        peer.RecvFrame();
+      }
+    } catch (const std::runtime_error&) {
+      over = true;
+    }
+  });
+  for (int taken = 0; taken == 0;) taken = server.Step(-1);
+  EXPECT_TRUE(server.Finish(10000));
+  EXPECT_TRUE(WaitUntil([&] { return over.load(); }));
+  chatty.join();
+}
+
 TEST(SocketServerPoolTest, FinishGivesUpOnWhatTakesTooLong) {
   TempDir dir;
   std::promise<void> go;
