@@ -9,7 +9,6 @@
 #include <cerrno>
 #include <climits>
 #include <cstdio>
-#include <cstdlib>
 #include <memory>
 
 #include "common/unique_fd.h"
@@ -172,18 +171,12 @@ std::string NameBeside(const std::string& path, const char* what) {
   return path + suffix;
 }
 
-std::string RealPathOf(const std::string& path) {
-  const std::unique_ptr<char, decltype(&std::free)> real(realpath(path.c_str(), nullptr),
-                                                         &std::free);
-  return real == nullptr ? std::string() : std::string(real.get());
-}
-
 // Whether `to` would lie inside the directory `from`, so that the copy would never end.
 bool IsInside(const std::string& to, const std::string& from) {
   struct stat info {};
   if (lstat(from.c_str(), &info) != 0 || !S_ISDIR(info.st_mode)) return false;
-  const std::string source = RealPathOf(from);
-  const std::string parent = RealPathOf(ParentDirectory(to));
+  const std::string source = ResolvedPath(from);
+  const std::string parent = ResolvedPath(ParentDirectory(to));
   return !source.empty() && !parent.empty() && IsSameOrBelow(parent, source);
 }
 

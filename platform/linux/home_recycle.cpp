@@ -13,6 +13,7 @@
 #include <vector>
 
 #include "platform/include/recycle.h"
+#include "platform/linux/keep_errno.h"
 #include "platform/linux/last_error.h"
 #include "platform/linux/share_store.h"
 
@@ -26,6 +27,7 @@ constexpr char kAccountFile[] = "/etc/passwd";
 using Names = std::vector<std::string>;
 
 bool IsDirectory(const std::string& path) {
+  const KeepErrno keep;
   struct stat info {};
   return lstat(path.c_str(), &info) == 0 && S_ISDIR(info.st_mode);
 }
@@ -34,28 +36,34 @@ bool IsDirectory(const std::string& path) {
 bool ListDirectory(const std::string& path, Names* names) {
   const std::unique_ptr<DIR, int (*)(DIR*)> directory(opendir(path.c_str()), &closedir);
   if (directory == nullptr) return false;
+  const int before = errno;
   errno = 0;
   while (const dirent* entry = readdir(directory.get())) {
     const std::string name = entry->d_name;
     if (name != "." && name != "..") names->push_back(name);
   }
+  if (errno != 0) return false;
+  errno = before;
   std::sort(names->begin(), names->end());
-  return errno == 0;
+  return true;
 }
 
 // The accounts that this machine keeps itself; all others come from a directory service.
 bool LocalAccounts(std::set<std::string>* names) {
   const std::unique_ptr<FILE, int (*)(FILE*)> file(fopen(kAccountFile, "re"), &fclose);
   if (file == nullptr) return false;
+  const KeepErrno keep;  // the end of the file is an error to fgetpwent
   while (const passwd* entry = fgetpwent(file.get())) names->insert(entry->pw_name);
-  errno = 0;  // the end of the file is an error to fgetpwent
   return true;
 }
 
 // Appends the recycle bins of the homes that `wanted` accepts.
 template <typename Wanted>
 int EnumRecyclePaths(HLIBCSZLIST** list, Wanted wanted) {
-  if (list == nullptr) return QUARRY_PLATFORM_FAIL(kErrBadParameter);
+  if (list == nullptr) {
+    errno = EINVAL;
+    return QUARRY_PLATFORM_FAIL(kErrBadParameter);
+  }
   const ShareList shares = TryLoadShares();
   if (shares == nullptr) return -1;
   const auto homes = std::find_if(shares->begin(), shares->end(), [](const ShareRecord& share) {
@@ -69,7 +77,6 @@ int EnumRecyclePaths(HLIBCSZLIST** list, Wanted wanted) {
     if (!wanted(name) || !IsDirectory(path)) continue;
     if (HLIBCSzListPush(path.c_str(), list) < 0) return QUARRY_PLATFORM_FAIL(kErrSystem);
   }
-  errno = 0;
   return 0;
 }
 

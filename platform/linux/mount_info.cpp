@@ -5,9 +5,7 @@
 #include <unistd.h>
 
 #include <cstdio>
-#include <cstdlib>
 #include <fstream>
-#include <memory>
 #include <sstream>
 
 #include "platform/linux/keep_errno.h"
@@ -53,12 +51,6 @@ bool ParseLine(const std::string& line, Mount* mount) {
   mount->point = Unescape(point);
   mount->source = Unescape(source);
   return std::sscanf(device.c_str(), "%u:%u", &mount->device_major, &mount->device_minor) == 2;
-}
-
-std::string Resolve(const std::string& path) {
-  const std::unique_ptr<char, decltype(&std::free)> real(realpath(path.c_str(), nullptr),
-                                                         &std::free);
-  return real == nullptr ? std::string() : std::string(real.get());
 }
 
 // The kernel's own answer to the question of which mount holds a file; since Linux 5.8.
@@ -113,7 +105,7 @@ bool FindMount(const std::string& path, Mount* mount) {
   std::uint64_t id = 0;
   if (MountIdOf(path, &id)) found = MountWithId(mounts, id);
   if (found == nullptr) {
-    const std::string real = Resolve(path);
+    const std::string real = ResolvedPath(path);
     if (!real.empty()) found = MountHolding(mounts, real);
   }
   if (found == nullptr) return false;

@@ -3,6 +3,8 @@
 #include <cstddef>
 #include <cstdint>
 #include <cstdio>
+#include <cstdlib>
+#include <memory>
 
 namespace quarry::platform {
 namespace {
@@ -53,6 +55,12 @@ bool IsSameOrBelow(const std::string& path, const std::string& directory) {
   if (directory == "/") return !path.empty() && path.front() == '/';
   return path.compare(0, directory.size(), directory) == 0 &&
          (path.size() == directory.size() || path[directory.size()] == '/');
+}
+
+std::string ResolvedPath(const std::string& path) {
+  const std::unique_ptr<char, decltype(&std::free)> resolved(realpath(path.c_str(), nullptr),
+                                                             &std::free);
+  return resolved == nullptr ? std::string() : std::string(resolved.get());
 }
 
 std::string NameForPath(const std::string& path) {

@@ -1,4 +1,4 @@
-// Naming files after paths.
+// Paths, and naming files after them.
 
 #ifndef QUARRY_PLATFORM_LINUX_PATH_NAME_H_
 #define QUARRY_PLATFORM_LINUX_PATH_NAME_H_
@@ -13,6 +13,10 @@ bool IsPlainAbsolutePath(const std::string& path);
 
 // Whether `path` is `directory` or lies below it. Both are in their shortest form.
 bool IsSameOrBelow(const std::string& path, const std::string& directory);
+
+// The path without links, ".", ".." or a "/" at its end, or "", with errno set, when there is no
+// such place.
+std::string ResolvedPath(const std::string& path);
 
 // One path component that stands for `path`, a plain absolute path: readable, at most 240 bytes,
 // and different for different paths. "/volume1/photo" is "volume1+photo". Bytes with a meaning of

@@ -5,8 +5,6 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <climits>
-#include <cstdlib>
 #include <cstring>
 #include <memory>
 
@@ -43,11 +41,10 @@ void RequireDirectory(const std::string& path) {
   struct stat info {};
   if (stat(path.c_str(), &info) != 0) Refuse("\"" + path + "\": " + std::strerror(errno) + ".");
   if (!S_ISDIR(info.st_mode)) Refuse("\"" + path + "\" is no directory.");
-  const std::unique_ptr<char, decltype(&std::free)> real(realpath(path.c_str(), nullptr),
-                                                         &std::free);
-  if (real == nullptr) SystemFailure("Cannot resolve \"" + path + "\"");
-  if (path != real.get()) {
-    Refuse("\"" + path + "\" leads through a link; the directory is \"" + real.get() + "\".");
+  const std::string resolved = ResolvedPath(path);
+  if (resolved.empty()) SystemFailure("Cannot resolve \"" + path + "\"");
+  if (path != resolved) {
+    Refuse("\"" + path + "\" leads through a link; the directory is \"" + resolved + "\".");
   }
 }
 

@@ -33,8 +33,9 @@ TEST(PlatformLibraryTest, OffersEveryFunction) {
   EXPECT_EQ(
       CountOf(HLIBCSzListAlloc, HLIBCSzListFree, HLIBCSzListPush, HLIBCSzListCount, HLIBCSzListGet,
               TARN::TARNOTIFYD::MonitorQueue::Upsert, TARN::TARNOTIFYD::MonitorQueue::Delete,
-              TARNShareIsShareRecycle, TARNRecycleUserHomePathIsExist),
-      9);
+              TARNShareIsShareRecycle, TARNRecycleUserHomePathIsExist,
+              TARNRecycleHomeEnumRecyclePath, TARNRecycleHomeEnumRecyclePathForAuthType),
+      11);
   EXPECT_EQ(CountOf(HLIBServiceStart, HLIBServiceStop, HLIBServiceRestart, HLIBServicectlStart,
                     HLIBServicectlStop, TARNSMBIsEnableSpotlight, TARNSMBSetSpotlight, HLIBCExecl,
                     HLIBCExec),

@@ -56,6 +56,20 @@ TEST_F(ErrnoTest, OfPlaces) {
             0);
 }
 
+TEST_F(ErrnoTest, OfRecycleBins) {
+  HLIBCSZLIST* list = HLIBCSzListAlloc(0);
+  EXPECT_EQ(Untouched([&] { return TARNRecycleHomeEnumRecyclePath(&list); }), 0);
+  const std::string homes = Add("homes").path;
+  test::MakeDirs(homes + "/alice/#recycle");
+  test::MakeDirs(homes + "/bob");
+  EXPECT_EQ(Untouched([&] { return TARNRecycleHomeEnumRecyclePath(&list); }), 0);
+  EXPECT_EQ(HLIBCSzListCount(list), 1);
+  EXPECT_EQ(
+      Untouched([&] { return TARNRecycleHomeEnumRecyclePathForAuthType(&list, AUTH_TYPE_LOCAL); }),
+      0);
+  HLIBCSzListFree(list);
+}
+
 TEST_F(ErrnoTest, OfCopies) {
   test::WriteFile(volume_ / "a", "text");
   TARNCOPYARGS args{};

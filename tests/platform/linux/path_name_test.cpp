@@ -1,10 +1,15 @@
 #include "platform/linux/path_name.h"
 
 #include <gtest/gtest.h>
+#include <unistd.h>
 
+#include <cerrno>
 #include <map>
 #include <random>
 #include <string>
+
+#include "tests/support/files.h"
+#include "tests/support/temp_dir.h"
 
 namespace quarry::platform {
 namespace {
@@ -66,6 +71,15 @@ TEST(NameForPathTest, TellsAllPathsApart) {
     EXPECT_EQ(it->second, path);
   }
   EXPECT_GT(names.size(), 10000u);
+}
+
+TEST(ResolvedPathTest, HasNoLinksAndExists) {
+  test::TempDir dir;
+  test::MakeDirs(dir / "a/b");
+  ASSERT_EQ(symlink("a", (dir / "link").c_str()), 0);
+  EXPECT_EQ(ResolvedPath(dir / "link/b/../b/."), dir / "a/b");
+  EXPECT_EQ(ResolvedPath(dir / "missing"), "");
+  EXPECT_EQ(errno, ENOENT);
 }
 
 TEST(NameForPathTest, TellsLongPathsApartByTheirLastByte) {
