@@ -161,7 +161,7 @@ void ShareRename(const std::string& share_from, const std::string& share_to) {
   const std::string path = share.GetPath();
   // Only the last component is the share's: the volume may have a directory of the same name.
   const std::string path_old =
-      Dirname(path) + ReplacePathShare("/" + Basename(path), share_from, share_to);
+      Dirname(path) + ReplacePathShare(std::string(1, '/') + Basename(path), share_from, share_to);
   AddCustomEvent(EVENT_RENAME, path, path_old, Json::Value());
 }
 
