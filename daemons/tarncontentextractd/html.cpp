@@ -115,10 +115,7 @@ class HtmlReader {
 };
 
 struct ContextCloser {
-  void operator()(htmlParserCtxtPtr context) const {
-    if (context->myDoc != nullptr) xmlFreeDoc(context->myDoc);
-    htmlFreeParserCtxt(context);
-  }
+  void operator()(htmlParserCtxtPtr context) const { htmlFreeParserCtxt(context); }
 };
 using Context = std::unique_ptr<htmlParserCtxt, ContextCloser>;
 
@@ -162,9 +159,10 @@ void Parse(std::string_view utf8, HtmlReader& reader) {
   Session session{&reader, context.get()};
   *context->sax = Handler();
   context->userData = &session;
-  htmlCtxtReadMemory(context.get(), utf8.data(), static_cast<int>(utf8.size()), nullptr, "UTF-8",
-                     HTML_PARSE_RECOVER | HTML_PARSE_NOERROR | HTML_PARSE_NOWARNING |
-                         HTML_PARSE_NONET | HTML_PARSE_IGNORE_ENC | HTML_PARSE_COMPACT);
+  xmlFreeDoc(htmlCtxtReadMemory(context.get(), utf8.data(), static_cast<int>(utf8.size()), nullptr,
+                                "UTF-8",
+                                HTML_PARSE_RECOVER | HTML_PARSE_NOERROR | HTML_PARSE_NOWARNING |
+                                    HTML_PARSE_NONET | HTML_PARSE_IGNORE_ENC | HTML_PARSE_COMPACT));
   reader.Finish();
 }
 

@@ -52,9 +52,9 @@ class Walk {
 
   // The next component, "" at the end.
   std::string TakeComponent() {
-    at_ = std::min(rest_.find_first_not_of('/', at_), rest_.size());
-    const std::size_t end = std::min(rest_.find('/', at_), rest_.size());
-    return rest_.substr(std::exchange(at_, end), end - at_);
+    const std::size_t start = std::min(rest_.find_first_not_of('/', at_), rest_.size());
+    at_ = std::min(rest_.find('/', start), rest_.size());
+    return rest_.substr(start, at_ - start);
   }
 
   // The directory `name` in the place reached; where that is a link, the place where the way goes
