@@ -79,6 +79,7 @@ Json::Value ToJson(const std::vector<ShareRecord>& shares) {
     entry["read_only"] = share.read_only;
     entry["hide_unreadable"] = share.hide_unreadable;
     entry["recycle_bin"] = share.recycle_bin;
+    if (!share.moved_from.empty()) entry["moved_from"] = share.moved_from;
     list.append(entry);
   }
   Json::Value root;
@@ -99,6 +100,30 @@ void MakeStateDirectories() {
     // What lies there tells of files that not everybody may see.
     if (!MakeDirectories(directory, 0750)) SystemFailure("Cannot make " + directory);
   }
+}
+
+ShareRecord* Find(std::vector<ShareRecord>& shares, const std::string& name) {
+  const auto found = std::find_if(shares.begin(), shares.end(),
+                                  [&](const ShareRecord& share) { return share.name == name; });
+  return found == shares.end() ? nullptr : &*found;
+}
+
+// The record of a share that is to live at `new_path`.
+ShareRecord MovedTo(const ShareRecord& share, const std::string& new_path) {
+  if (!share.moved_from.empty()) {
+    Refuse("The share \"" + share.name + "\" is still on its way from \"" + share.moved_from +
+           "\".");
+  }
+  ShareRecord moved = share;
+  moved.path = new_path;
+  moved.name = new_path.substr(new_path.rfind('/') + 1);
+  moved.moved_from = share.path;
+  ValidateShare(moved);
+  if (IsSameOrBelow(new_path, share.path)) {
+    Refuse("\"" + new_path + "\" lies in the share itself.");
+  }
+  RequireDirectory(new_path);
+  return moved;
 }
 
 // The lock under which the file is read and replaced; its directory is made first.
@@ -142,7 +167,9 @@ void AddShare(const ShareRecord& share) {
   bool known = false;
   for (ShareRecord& other : shares) {
     if (other.name == share.name && other.path == share.path) {
+      const std::string moved_from = other.moved_from;
       other = share;
+      other.moved_from = moved_from;
       known = true;
     } else {
       RequireNoConflict(share, other);
@@ -162,6 +189,31 @@ bool RemoveShare(const std::string& name) {
   shares.erase(end, shares.end());
   Save(shares);
   return true;
+}
+
+void ReplaceSharePath(const std::string& name, const std::string& new_path,
+                      const std::function<void()>& prepare) {
+  const auto lock = LockShares();
+  std::vector<ShareRecord> shares = ReadShares();
+  ShareRecord* const known = Find(shares, name);
+  if (known == nullptr) Refuse("There is no share called \"" + name + "\".");
+  const ShareRecord moved = MovedTo(*known, new_path);
+  for (const ShareRecord& other : shares) {
+    if (&other != known) RequireNoConflict(moved, other);
+  }
+  MakeStateDirectories();
+  prepare();
+  *known = moved;
+  Save(shares);
+}
+
+void EndShareMove(const std::string& name) {
+  const auto lock = LockShares();
+  std::vector<ShareRecord> shares = ReadShares();
+  ShareRecord* share = Find(shares, name);
+  if (share == nullptr || share->moved_from.empty()) return;
+  share->moved_from.clear();
+  Save(shares);
 }
 
 }  // namespace quarry::platform

@@ -46,6 +46,7 @@ ShareRecord RecordOf(const Json::Value& share) {
   record.read_only = FlagOf(share, "read_only");
   record.hide_unreadable = FlagOf(share, "hide_unreadable");
   record.recycle_bin = FlagOf(share, "recycle_bin");
+  if (share.isMember("moved_from")) record.moved_from = TextOf(share, "moved_from");
   try {
     ValidateShare(record);
   } catch (const Error& error) {
