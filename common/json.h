@@ -24,7 +24,7 @@ QUARRY_EXPORT std::string toString(const Json::Value& value);
 
 // Parses the whole file as fromString does. Returns false, and leaves `out` null, when the file is
 // not a regular file (after links), is larger than 64 MiB, cannot be read or is not JSON. Errno is
-// set unless the text is the reason.
+// set, but stays as it was when the text is the reason and on success.
 QUARRY_EXPORT bool fromFile(Json::Value& out, const std::string& path);
 
 // Replaces the file by the text of `value`, whole and durably: readers see the old or the new text,

@@ -137,9 +137,13 @@ bool Replace(const std::string& path, const std::string& text) {
 }  // namespace
 
 bool fromFile(Json::Value& out, const std::string& path) {
+  const int saved_errno = errno;
   std::string text;
   const UniqueFd file = OpenRegular(path);
-  if (file.valid() && ReadAll(file.get(), text)) return fromString(out, text);
+  if (file.valid() && ReadAll(file.get(), text)) {
+    errno = saved_errno;
+    return fromString(out, text);
+  }
   out = Json::Value();
   return false;
 }

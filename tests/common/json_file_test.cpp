@@ -146,6 +146,17 @@ TEST_F(JsonFileTest, InterruptedReadGoesOn) {
   EXPECT_EQ(read.size(), 2u);
 }
 
+TEST_F(JsonFileTest, ErrnoOfAnInterruptedReadIsNoPartOfTheAnswer) {
+  for (const std::string text : {"[1,2]", "[1,"}) {
+    WriteFile(path_, text);
+    fake::FailSystemCall("read", 1, EINTR);
+    Json::Value read;
+    errno = EAGAIN;
+    EXPECT_EQ(fromFile(read, path_), text == "[1,2]");
+    EXPECT_EQ(errno, EAGAIN) << text;
+  }
+}
+
 TEST_F(JsonFileTest, FileLongerThanOneReadIsWhole) {
   Json::Value value;
   for (int i = 0; i < 50000; ++i) value.append(i);
