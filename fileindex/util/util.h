@@ -39,10 +39,10 @@ QUARRY_EXPORT void GetShareNamePathByFullPath(std::string& share_name, std::stri
 QUARRY_EXPORT bool IsFullPathInRecycleBin(const std::string& full_path);
 
 // Whether the place may hold an indexed folder: it exists on a local file system in a share that
-// may be indexed, is written canonically, and is neither a snapshot, a recycle bin nor a mount
-// point. Never says why not. Throws Error 502 when no share holds a path that has passed the tests
-// of its file system, or the platform cannot tell a property of the share, and Error 800 when the
-// share has vanished meanwhile.
+// may be indexed, is written canonically, and is neither a snapshot, a recycle bin nor the mount
+// point of something foreign. Never says why not. Throws Error 502 when no share holds a path that
+// has passed the tests of its file system, or the platform cannot tell a property of the share, and
+// Error 800 when the share has vanished meanwhile.
 QUARRY_EXPORT bool CanFullPathBeIndexed(const std::string& full_path);
 // The same of a share path. Throws also as GetFullPath does.
 QUARRY_EXPORT bool CanPathBeIndexed(const std::string& share_path);

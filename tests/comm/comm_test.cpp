@@ -274,6 +274,15 @@ TEST_F(CommTest, AFailedElementIsLoggedWithErrno) {
                           Site(49) + R"(Compound failed: {"command":"b"} (501) worse)"));
 }
 
+TEST_F(CommTest, AnElementThatDoesNotSayWhyItFailedIsLoggedToo) {
+  fake::QueueReply(
+      std::string(R"({"success":true,"has_fail":true,"data":[{"success":false},{}]})"));
+  Json::Value response;
+  SendRequestImpl(response, Parse(kBatch));
+  EXPECT_THAT(fake::Logs(), ElementsAre(Site(49) + R"(Compound failed: {"command":"a"} (0) )",
+                                        Site(49) + R"(Compound failed: {"command":"b"} (0) )"));
+}
+
 TEST_F(CommTest, ABusyElementFailsTheBatch) {
   for (const int code : {1400, 1401}) {
     fake::ClearLogs();

@@ -398,6 +398,7 @@ TEST_F(CommunicationTest, WithoutASocketFiveAttemptsAreMade) {
   EXPECT_EQ(error.reason(), Reason("write", ENOTCONN));
   EXPECT_THAT(fake::Sleeps(), ElementsAre(seconds(1), seconds(1), seconds(1), seconds(1)));
   EXPECT_THAT(fake::Logs(), IsEmpty());
+  EXPECT_EQ(fake::SystemCallCount("close"), 1);
 }
 
 TEST_F(CommunicationTest, ADaemonThatStartsMeanwhileIsReached) {
@@ -474,6 +475,7 @@ TEST_F(CommunicationTest, NoSendTimeout) {
                 "Failed [0 > setsockopt(fd_socket, SOL_SOCKET, SO_SNDTIMEO, (char *)&timeout, "
                 "sizeof(timeout))], reason: " +
                 Reason("setsockopt", ENOPROTOOPT) + " [err: " + strerror(ENOPROTOOPT) + "]");
+  EXPECT_EQ(fake::SystemCallCount("close"), 1);
 }
 
 TEST_F(CommunicationTest, ADaemonThatStopsReadingFailsTheWrite) {
@@ -482,6 +484,7 @@ TEST_F(CommunicationTest, ADaemonThatStopsReadingFailsTheWrite) {
       Thrown([] { SendCommandToDaemon("c", Json::Value(std::string(4000000, 'x'))); });
   EXPECT_EQ(error.code(), 502);
   EXPECT_EQ(error.reason(), Reason("write", EAGAIN));
+  EXPECT_EQ(fake::SystemCallCount("close"), 1);
 }
 
 }  // namespace

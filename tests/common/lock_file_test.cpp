@@ -184,6 +184,26 @@ TEST_F(LockFileTest, DescriptorIsNotInheritedByPrograms) {
   EXPECT_TRUE(found);
 }
 
+TEST_F(LockFileTest, LockIsGivenUpThoughAProcessKeepsACopyOfTheDescriptor) {
+  auto lock = std::make_unique<LockFile>(path_, true);
+  int finish[2];
+  ASSERT_EQ(pipe(finish), 0);
+  const pid_t child = fork();
+  ASSERT_GE(child, 0);
+  if (child == 0) {
+    ::close(finish[1]);
+    char byte = 0;
+    _exit(read(finish[0], &byte, 1) == 0 ? 0 : 1);
+  }
+  ::close(finish[0]);
+  lock.reset();
+  EXPECT_EQ(Take(true), "none");
+  ::close(finish[1]);
+  int status = 0;
+  ASSERT_EQ(waitpid(child, &status, 0), child);
+  EXPECT_EQ(status, 0);
+}
+
 TEST_F(LockFileTest, FileRemovedBeforeTheLockIsTakenAnew) {
   int removed = 0;
   fake::OnSystemCall("flock", [&] {

@@ -4,6 +4,8 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <string>
+#include <vector>
 
 #include "common/error.h"
 #include "common/lock_file.h"
@@ -320,6 +322,43 @@ TEST_F(UtilTest, APathOutsideEveryShareThrows) {
 TEST_F(UtilTest, TheFileSystemIsAskedBeforeTheShare) {
   fake::SetFSType("/", 12);
   EXPECT_FALSE(CanFullPathBeIndexed("/outside every share"));
+}
+
+// Each test in turn is the first that fails, and all that come later would fail too.
+TEST_F(UtilTest, TestsAreMadeInOrderAndTheFirstThatFailsEndsThem) {
+  const std::string path = Photo("/#snapshot/#recycle");  // missing, so not canonical
+  fake::SetRemoteFSType(20);
+  fake::SetImageFSType(20);
+  fake::SetFSType(Photo(), 20);
+  fake::AddSnapshot(path);
+  fake::AddShareRecycle(path);
+  fake::AddMountPoint(path);
+  fake::AddShare({.name = "photo", .path = Photo(), .encrypted = true});
+  std::vector<std::string> asked;
+  fake::OnCall([&asked](const std::string& function) { asked.push_back(function); });
+  const auto last_asked = [&](const std::string& to_pass, int result) {
+    if (!to_pass.empty()) fake::FailEveryCall(to_pass, {result});
+    asked.clear();
+    EXPECT_FALSE(CanFullPathBeIndexed(path));
+    if (asked.back() == "TARNShareFree") asked.pop_back();
+    return asked.back();
+  };
+  EXPECT_EQ(last_asked("", 0), "HLIBFhsPathInSnapshot");
+  fake::FailCall("TARNGetFSType");
+  EXPECT_EQ(last_asked("HLIBFhsPathInSnapshot", -1), "TARNGetFSType");
+  EXPECT_EQ(last_asked("", 0), "TARNFSIsRemoteFS");
+  EXPECT_EQ(last_asked("TARNFSIsRemoteFS", 0), "TARNFSIsImageFS");
+  fake::SetFSType(Photo(), 12);
+  EXPECT_EQ(last_asked("TARNFSIsImageFS", 0), "TARNFSIsImageFS");
+  fake::SetFSType(Photo(), 20);
+  EXPECT_EQ(last_asked("", 0), "HLIBShareIsReadOnlyGet");
+  fake::AddShare({.name = "photo", .path = Photo()});
+  EXPECT_EQ(last_asked("", 0), "TARNShareIsShareRecycle");
+  EXPECT_EQ(last_asked("TARNShareIsShareRecycle", 0), "HLIBShareIsEncryptionGet");
+  // What is left is that the path does not exist.
+  EXPECT_EQ(last_asked("TARNFSDirIsMntPoint", 0), "TARNFSDirIsMntPoint");
+  test::MakeDirs(path);
+  EXPECT_TRUE(CanFullPathBeIndexed(path));
 }
 
 TEST_F(UtilTest, RecycleBinsMayNot) {
