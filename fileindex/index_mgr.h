@@ -1,9 +1,9 @@
 // Managing what is indexed: the operations behind the administrator's user interface.
 //
-// Success is a normal return, every failure a thrown Error. All paths are share paths, such as
-// /share/dir. Each operation loads its state anew and keeps none; all may block on lock files and
-// on daemons. Any thread may call them, but the effective user of the process is switched while
-// state is saved.
+// Success is a normal return, every failure a thrown Error. Paths are share paths, such as
+// /share/dir, unless they are called full or absolute. Each operation loads its state anew and
+// keeps none; all may block on lock files and on daemons. Any thread may call them, but the
+// effective user of the process is switched while state is saved.
 
 #ifndef QUARRY_FILEINDEX_INDEX_MGR_H_
 #define QUARRY_FILEINDEX_INDEX_MGR_H_

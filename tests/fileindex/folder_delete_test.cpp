@@ -241,6 +241,7 @@ TEST_F(FolderDeleteTest, AFolderOfAVanishedShareIsRefused) {
 
 TEST_F(FolderDeleteTest, ALockThatCannotBeHad) {
   test::MakeDirs(kFolderLock);
+  test::WriteFile(kFileIndexFoldersCfgPath, "[");  // looked at under the lock only
   Begin();
   std::string failure;
   try {

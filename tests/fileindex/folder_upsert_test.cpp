@@ -263,6 +263,35 @@ TEST_F(FolderRefusalTest, AFolderThatIsThereAlready) {
                 {logged + "/music"});
 }
 
+TEST_F(FolderRefusalTest, EachCheckComesBeforeTheNext) {
+  std::vector<Json::Value> records = {Record("/photo/gone"), Record("/photo/a")};
+  for (int i = 2; i < 1000; ++i) records.push_back(Record("/photo/" + std::to_string(i)));
+  SaveList(records);
+  fake::SetQuota(false, 0x2900);
+  const auto failure_of = [](const Json::Value& list) {
+    return FailureOf([&] { FolderAdd(list, false); }).substr(0, 3);
+  };
+  Begin();
+  EXPECT_EQ(failure_of(Json::Value(5)), "120");
+  EXPECT_EQ(failure_of(Array({Record("/photo/gone")})), "903");
+  EXPECT_EQ(failure_of(Array({Record("/photo/a")})), "901");
+  EXPECT_EQ(failure_of(Array({Record("/photo/b")})), "900");
+  EXPECT_THAT(effects_->All(), IsEmpty());
+}
+
+TEST_F(FolderRefusalTest, UpdaterModeAcceptsNothingElse) {
+  SaveList({Record("/photo/gone")});
+  Begin();
+  EXPECT_EQ(FailureOf([] { FolderAdd(Array({Record("/photo/gone")}), true); }),
+            "901 Duplicated ID: /photo/gone");
+  fake::SetQuota(false, 0x2400);
+  for (const auto& operation : {&FolderAdd, &FolderSet}) {
+    EXPECT_EQ(FailureOf([&] { operation(Array({Record("/photo/a")}), true); }),
+              "1003 Share (photo) space not enough");
+  }
+  EXPECT_THAT(effects_->All(), IsEmpty());
+}
+
 TEST_F(FolderRefusalTest, OneFolderTooMany) {
   std::vector<Json::Value> records;
   for (int i = 0; i < 1000; ++i) records.push_back(Record("/photo/" + std::to_string(i)));
@@ -325,6 +354,7 @@ TEST_F(FolderRefusalTest, AListThatCannotBeLoaded) {
 
 TEST_F(FolderRefusalTest, ALockThatCannotBeHad) {
   test::MakeDirs(kFolderLock);
+  test::WriteFile(kFileIndexFoldersCfgPath, "[");  // looked at under the lock only
   Begin();
   std::string failure;
   try {

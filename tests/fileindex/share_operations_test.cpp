@@ -432,6 +432,13 @@ TEST_F(ShareClearPausedTest, AnArgumentIsMissing) {
                 [] { ShareClearPaused("photo", ""); });
 }
 
+TEST_F(ShareClearPausedTest, AListThatCannotBeLoadedKeepsEverything) {
+  test::WriteFile(kFileIndexFoldersCfgPath, "[");
+  Begin();
+  EXPECT_EQ(FailureOf([&] { Clear(); }), "504 Cannot load json: " + kFileIndexFoldersCfgPath);
+  EXPECT_THAT(effects_->All(), IsEmpty());
+}
+
 TEST_F(ShareClearPausedTest, EverySingleFailureEndsIt) {
   ExpectEveryFailureToEndIt(
       [] {

@@ -351,8 +351,11 @@ TEST_F(FolderTest, GetStatusFailsWithTheStatusFile) {
   test::WriteFile(kFileIndexStatusCfgPath, "broken");
   EXPECT_EQ(FailureOf([] { StatusOf(Sample()); }),
             "504 Cannot load json: " + kFileIndexStatusCfgPath);
+  const Folder gone("/photo/gone", "", true, true, true, true, false, false);
+  EXPECT_EQ(FailureOf([&] { StatusOf(gone); }), "504 Cannot load json: " + kFileIndexStatusCfgPath);
   test::WriteFile(kFileIndexStatusCfgPath, R"({"share":"x"})");
   EXPECT_EQ(FailureOf([] { StatusOf(Sample()); }), "120 Not an object, data=\"x\"");
+  EXPECT_EQ(StatusOf(gone), R"({"desc":"invalid_path","text":"error"})");
 }
 
 TEST_F(FolderTest, NoAdditionalGivesTheRecord) {

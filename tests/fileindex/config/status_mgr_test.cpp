@@ -319,6 +319,7 @@ TEST_F(StatusMgrTest, ALockThatCannotBeHadChangesNothing) {
   test::MakeDirs(kLock);  // a directory is no lock file
   StatusMgr status;
   EXPECT_EQ(CodeOf([&] { status.Pause(0); }), 506);
+  EXPECT_EQ(CodeOf([&] { status.Pause(-1); }), 506);
   EXPECT_EQ(CodeOf([&] { status.Resume(); }), 506);
   EXPECT_EQ(CodeOf([&] { status.SetShareStatus("a", 1); }), 506);
   EXPECT_EQ(CodeOf([&] { status.UnsetShareStatus("a", 1); }), 506);
