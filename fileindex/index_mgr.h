@@ -71,8 +71,8 @@ QUARRY_EXPORT void FolderDelete(const Json::Value& path_list);
 // and saving the list throws, and what the engine, the index daemon and AddCustomEvent report.
 
 // A share that has got a new name: its folders, its index and its documents follow. To be called
-// when the platform knows it by the new name. Throws Error 120 for an empty name, with nothing
-// changed; 800, with the list saved, when the share is not known.
+// when the platform knows it by the new name. Throws Error 120 when a name is empty or the new
+// one has a NUL byte, with nothing changed; 800, with the list saved, when the share is not known.
 QUARRY_EXPORT void ShareRename(const std::string& share_from, const std::string& share_to);
 
 // A share that has moved from one full path to another: its index and its documents follow. Without
@@ -108,8 +108,8 @@ QUARRY_EXPORT void HomeDisable(AUTH_TYPE auth);
 QUARRY_EXPORT void HomeEnable(AUTH_TYPE auth);
 
 // An account that has got a new name, and its home folder with it: folders in /homes/`user_from`
-// follow, and so do its documents. Throws Error 120 for an empty name, with nothing changed; 800,
-// with the list saved, when there are no home folders.
+// follow, and so do its documents. Throws Error 120 when a name is empty or the new one has a NUL
+// byte, with nothing changed; 800, with the list saved, when there are no home folders.
 QUARRY_EXPORT void UserRename(const std::string& user_from, const std::string& user_to);
 
 // Refreshes the engine's term suggestions of the indexes named so, from all that they hold. Names

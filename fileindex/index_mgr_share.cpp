@@ -151,6 +151,8 @@ void ShareRename(const std::string& share_from, const std::string& share_to) {
   if (share_to.empty()) {
     Fail(QUARRY_SITE("index_mgr"), "share_to.empty()", kErrorBadParameter, "Missing share_to");
   }
+  // A name with a NUL byte is refused here: once saved, it would fail every question about shares.
+  GetShareNameByPath(std::string(1, '/') + share_to);
   for (const FolderPtr& folder : folder_mgr.GetFolders()) {
     if (folder->GetShare() == share_from) folder->SetShare(share_to);
   }

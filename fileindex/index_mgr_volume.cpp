@@ -172,6 +172,8 @@ void UserRename(const std::string& user_from, const std::string& user_to) {
   }
   const std::string home_from = kHomes + user_from;
   const std::string home_to = kHomes + user_to;
+  // A name with a NUL byte is refused here: once saved, it would fail every question about shares.
+  GetShareNameByPath(home_to);
   const FolderMgr folder_mgr;
   for (const FolderPtr& folder : folder_mgr.GetFolders()) {
     const std::string path = folder->GetPath();

@@ -219,6 +219,13 @@ TEST_F(ShareRenameTest, ANameIsMissing) {
   EXPECT_EQ(FailureOf([] { ShareRename("", ""); }).substr(0, 3), "504");
 }
 
+TEST_F(ShareRenameTest, ANewNameWithANulByteIsRefusedBeforeItIsSaved) {
+  Begin();
+  const std::string name("pic\0tures", 9);
+  EXPECT_EQ(FailureOf([&] { ShareRename("photo", name); }), "120 /" + name);
+  EXPECT_THAT(effects_->All(), IsEmpty());
+}
+
 TEST_F(ShareRenameTest, AShareThatThePlatformDoesNotKnowLeavesTheListSaved) {
   Begin();
   EXPECT_EQ(FailureOf([] { ShareRename("music", "tunes"); }).substr(0, 3), "800");

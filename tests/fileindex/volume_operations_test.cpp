@@ -310,6 +310,14 @@ TEST_F(UserRenameTest, ANameIsMissing) {
   ExpectRefused("UserRename", "user_to.empty()", "Missing user_to", [] { UserRename("ann", ""); });
 }
 
+TEST_F(UserRenameTest, ANewNameWithANulByteIsRefusedBeforeItIsSaved) {
+  Begin();
+  const std::string name("jo\0an", 5);
+  EXPECT_EQ(FailureOf([&] { UserRename("ann", name); }), "120 /homes/" + name);
+  EXPECT_THAT(effects_->All(), IsEmpty());
+  EXPECT_THAT(Logs(), IsEmpty());
+}
+
 TEST_F(UserRenameTest, WithoutHomeFoldersTheListIsSaved) {
   fake::RemoveShare("homes");
   Begin();
