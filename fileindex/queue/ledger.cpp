@@ -22,9 +22,34 @@ void Pour(std::vector<T>& from, std::vector<T>& to) {
   from.clear();
 }
 
+using Records = std::vector<std::shared_ptr<OP>>;
+
+void Append(Records& from, Records& to) {
+  to.insert(to.end(), std::make_move_iterator(from.begin()), std::make_move_iterator(from.end()));
+  from.clear();
+}
+
+void AppendReversed(Records& from, Records& to) {
+  to.insert(to.end(), std::make_move_iterator(from.rbegin()), std::make_move_iterator(from.rend()));
+  from.clear();
+}
+
+// Appends one list to another, each with its front. Only the shorter one's records are touched.
+void Join(Records& list, Records& front, Records& later, Records& later_front) {
+  if (list.size() + front.size() >= later.size() + later_front.size()) {
+    AppendReversed(later_front, list);
+    Append(later, list);
+    return;
+  }
+  AppendReversed(list, later_front);
+  Append(front, later_front);
+  list.swap(later);
+  front.swap(later_front);
+}
+
 // Appends the records of `later` to those of `set`.
 template <typename RecordSet>
-void Append(RecordSet& set, RecordSet& later) {
+void AppendSet(RecordSet& set, RecordSet& later) {
   for (std::size_t kind = 0; kind < set.kinds.size(); ++kind) {
     if (later.kinds[kind].recs.empty()) continue;
     set.kinds[kind].last = set.entered + later.kinds[kind].last;
@@ -171,7 +196,7 @@ OPNode::RecordIndex& Ledger::SiftSettled(OPNode& node) {
 
 FileIndexOP Ledger::TakeWork(OPNode& node) {
   FileIndexOP work = OP_NONE;
-  if (IsShort(node.ops)) {
+  if (IsShort(node)) {
     for (const std::shared_ptr<OP>& rec : node.ops) {
       if (rec->node.get() == &node && IsWork(rec->op)) work = std::exchange(rec->op, OP_NONE);
     }
@@ -191,7 +216,7 @@ FileIndexOP Ledger::TakeWork(OPNode& node) {
 }
 
 bool Ledger::HasPending(OPNode& node) {
-  if (IsShort(node.ops)) {
+  if (IsShort(node)) {
     return std::any_of(node.ops.begin(), node.ops.end(),
                        [](const auto& rec) { return rec->op != OP_NONE; });
   }
@@ -201,7 +226,7 @@ bool Ledger::HasPending(OPNode& node) {
 
 Ledger::Bundle Ledger::Take(OPNode& node) {
   Bundle bundle;
-  if (!IsShort(node.ops)) {
+  if (!IsShort(node)) {
     SiftSettled(node);
     bundle.index = std::move(node.record_index_);
   }
@@ -218,28 +243,39 @@ void Ledger::Merge(OPNode::RecordIndex& index, OPNode::RecordIndex& later) {
   for (auto& [node, set] : later.about) {
     const auto [entry, is_new] = index.about.try_emplace(node);
     if (swapped && !is_new) std::swap(entry->second, set);
-    Append(entry->second, set);
+    AppendSet(entry->second, set);
   }
   index.renames += later.renames;
 }
 
-void Ledger::Receive(OPNode& node, Bundle bundle, const OP* current) {
-  if (bundle.index || !IsShort(node.ops)) {
-    OPNode::RecordIndex& index = Sift(node, current);
-    if (bundle.index) {
-      Merge(index, *bundle.index);
-    } else {
-      for (const auto& rec : bundle.ops) Enter(index, rec.get());
-    }
-    index.seen = node.ops.size() + bundle.ops.size();
-    Pour(bundle.ops, node.ops);  // of a long list only the index keeps the order that rules see
-    return;
+bool Ledger::Receive(OPNode& node, Bundle bundle, const OP* current) {
+  if (!bundle.index && IsShort(node)) {
+    Append(bundle.ops, node.ops);
+    return false;
   }
-  node.ops.insert(node.ops.end(), std::make_move_iterator(bundle.ops.begin()),
-                  std::make_move_iterator(bundle.ops.end()));
+  OPNode::RecordIndex& index = Sift(node, current);
+  if (bundle.index) {
+    Merge(index, *bundle.index);
+    Join(node.ops, index.front, bundle.ops, bundle.index->front);
+  } else {
+    for (const auto& rec : bundle.ops) Enter(index, rec.get());
+    Append(bundle.ops, node.ops);
+  }
+  index.seen = node.ops.size();
+  return HasFront(node);
+}
+
+void Ledger::Settle(OPNode& node) {
+  if (!HasFront(node)) return;
+  OPNode::RecordIndex& index = *node.record_index_;
+  index.seen += index.front.size();
+  std::reverse(index.front.begin(), index.front.end());
+  Append(node.ops, index.front);
+  node.ops = std::exchange(index.front, {});
 }
 
 void Ledger::Forget(OPNode& node) {
+  Settle(node);
   node.record_index_.reset();
   Touch(node);
 }

@@ -55,6 +55,7 @@ struct OPNode::RecordIndex {
   std::size_t seen = 0;  // how many entries of the list are accounted for
   std::unordered_map<const OPNode*, RecordSet> about;  // moved ones are about where they came from
   std::size_t renames = 0;
+  std::vector<std::shared_ptr<OP>> front;  // what stands before the list, last first, see Settle
   OP* unsettled = nullptr;  // in the list, but of a kind that the event being folded may yet change
 };
 
@@ -78,7 +79,7 @@ class Ledger {
   // is may speak for all of its kind, which are not shown then.
   template <typename Rule>
   static void ForEachOwn(OPNode& node, const OP* current, Rule rule) {
-    if (IsShort(node.ops)) {
+    if (IsShort(node)) {
       for (const std::shared_ptr<OP>& rec : node.ops) {
         if (rec->node.get() == &node && rec.get() != current && rec->op != OP_NONE) rule(*rec);
       }
@@ -108,7 +109,13 @@ class Ledger {
     std::unique_ptr<OPNode::RecordIndex> index;  // for a long list
   };
   static Bundle Take(OPNode& node);
-  static void Receive(OPNode& node, Bundle bundle, const OP* current);
+  // Appends the bundle's records to the node's list. Says whether the list is to be settled: what
+  // was there before a longer bundle is kept beside the list, so that one that is moved to and fro
+  // is not shifted each time.
+  static bool Receive(OPNode& node, Bundle bundle, const OP* current);
+
+  // Puts what is kept beside the node's list back before it.
+  static void Settle(OPNode& node);
 
   // Forgets what is known about the node's list, for someone else may have changed its records.
   static void Forget(OPNode& node);
@@ -117,7 +124,10 @@ class Ledger {
   static void Dismantle(OPNode& node, std::vector<std::shared_ptr<OPNode>>& orphans);
 
  private:
-  static bool IsShort(const std::vector<std::shared_ptr<OP>>& ops) { return ops.size() <= 32; }
+  static bool HasFront(const OPNode& node) {
+    return node.record_index_ && !node.record_index_->front.empty();
+  }
+  static bool IsShort(const OPNode& node) { return node.ops.size() <= 32 && !HasFront(node); }
   static OPNode::ChildIndex& Children(OPNode& node);
   static const std::shared_ptr<OPNode>* Find(OPNode& node, std::string_view name);
   static void Adopt(OPNode& node);

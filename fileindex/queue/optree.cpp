@@ -119,14 +119,21 @@ void OPTree::BuildTree() {
   if (input.failed()) {
     Fail(QUARRY_SITE("optree"), "!input_stream", kErrorSystem, OpenFailure());
   }
+  building_ = true;
+  InsertLines(input);
+  building_ = false;
+  Settle();
+  // Half a queue must not pass for a whole one: the rest would be deleted with it.
+  if (input.failed()) {
+    Fail(QUARRY_SITE("optree"), "!input_stream", kErrorSystem, OpenFailure());
+  }
+}
+
+void OPTree::InsertLines(QueueReader& input) {
   std::string line;
   while (input.Next(line)) {
     InsertLine(line);
     if (crashed) return;
-  }
-  // Half a queue must not pass for a whole one: the rest would be deleted with it.
-  if (input.failed()) {
-    Fail(QUARRY_SITE("optree"), "!input_stream", kErrorSystem, OpenFailure());
   }
 }
 
@@ -223,10 +230,18 @@ void OPTree::HandleRename(std::shared_ptr<OPNode> node, std::shared_ptr<OP> rec)
   if (source != node) {
     CancelReplaced(*node, rec.get());
     // An old path without components names nothing that could have been moved.
-    if (source != root) carriers = Relocation(*source, *node).Deliver(rec.get());
+    if (source != root) {
+      carriers = Relocation(*source, *node).Deliver(rec.get(), unsettled_);
+    }
   }
   Attach(node, rec);
   for (const std::shared_ptr<OP>& carrier : carriers) Attach(carrier->node, carrier);
+  if (!building_) Settle();
+}
+
+void OPTree::Settle() {
+  for (OPNode* node : unsettled_) Ledger::Settle(*node);
+  unsettled_.clear();
 }
 
 void OPTree::TraverseNodeDescendant(std::shared_ptr<OPNode> node,

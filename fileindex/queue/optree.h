@@ -34,6 +34,7 @@ enum FileIndexOP : std::int32_t {
 
 class OPNode;
 class OPTree;
+class QueueReader;
 struct RuleRow;
 
 // One pending operation. A tree shares its records with the consumer; coalescing changes them in
@@ -80,8 +81,7 @@ class QUARRY_EXPORT OPNode : public std::enable_shared_from_this<OPNode> {
   std::string name;                               // empty for the root
   std::shared_ptr<OPNode> parent;                 // null for the root
   std::vector<std::shared_ptr<OPNode>> children;  // in order of creation
-  // In order of attachment; a rename that moves more than 32 may put them before what was there.
-  std::vector<std::shared_ptr<OP>> ops;
+  std::vector<std::shared_ptr<OP>> ops;           // in order of attachment
 
  private:
   friend class Ledger;  // finds children and records without walking long lists
@@ -121,7 +121,8 @@ class QUARRY_EXPORT OPTree {
 
   // Folds one event into the tree. Throws Error 120 when one of its paths holds a NUL byte, and
   // when a configuration change cannot be merged because one of the two is neither an object nor
-  // null.
+  // null. A rename that appends many records to a few costs time in proportion to both; BuildTree
+  // puts such lists in order once, at its end.
   void InsertEvent(std::shared_ptr<Event> event);
 
   // The node of a path, created with all nodes above it as needed; empty components do not count.
@@ -162,10 +163,15 @@ class QUARRY_EXPORT OPTree {
   struct Empty {};
   OPTree(const std::string& path, Empty);
 
+  void InsertLines(QueueReader& input);
   void InsertLine(const std::string& line);
   void Attach(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& rec);
   void Fold(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& rec,
             const RuleRow& rules);
+  void Settle();
+
+  std::vector<OPNode*> unsettled_;  // nodes whose lists are not in order yet
+  bool building_ = false;           // nobody looks at the lists yet
 };
 
 }  // namespace fileindex

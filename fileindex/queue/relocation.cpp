@@ -49,12 +49,13 @@ OPNode& Relocation::Target(std::size_t index) {
   return *stops_[index].to;
 }
 
-std::vector<std::shared_ptr<OP>> Relocation::Deliver(const OP* current) {
+std::vector<std::shared_ptr<OP>> Relocation::Deliver(const OP* current,
+                                                     std::vector<OPNode*>& unsettled) {
   std::vector<std::shared_ptr<OP>> carriers;
   for (std::size_t i = 0; i < stops_.size(); ++i) {
     if (!stops_[i].loaded) continue;
     OPNode& to = Target(i);
-    Ledger::Receive(to, std::move(stops_[i].bundle), current);
+    if (Ledger::Receive(to, std::move(stops_[i].bundle), current)) unsettled.push_back(&to);
     if (stops_[i].carried == OP_NONE) continue;
     carriers.push_back(
         std::make_shared<OP>(to.shared_from_this(), stops_[i].carried, "", Json::Value()));

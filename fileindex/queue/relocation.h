@@ -22,9 +22,10 @@ class Relocation {
   // differ.
   Relocation(OPNode& source, OPNode& destination);
 
-  // Hands all records to their new nodes. Returns the work to be done there, one record per node,
-  // parents first, not attached yet.
-  std::vector<std::shared_ptr<OP>> Deliver(const OP* current);
+  // Hands all records to their new nodes and adds those whose lists are to be settled to
+  // `unsettled`. Returns the work to be done there, one record per node, parents first, not
+  // attached yet.
+  std::vector<std::shared_ptr<OP>> Deliver(const OP* current, std::vector<OPNode*>& unsettled);
 
  private:
   struct Stop {

@@ -159,15 +159,21 @@ TEST_F(BoundsTest, RenamesOntoOnePlaceAndItsDeletionInTurn) {
   EXPECT_EQ(Pending(), 100'001);
 }
 
+// Each time a long list comes behind a short one.
 TEST_F(BoundsTest, RenamesToAndFroWithDeletionsInTurn) {
+  std::string lines;
   for (int i = 0; i < 50'000; ++i) {
-    Insert(EVENT_DELETE, "/s/g");
-    Insert(EVENT_RENAME, "/s/g", "/s/f");
-    Insert(EVENT_DELETE, "/s/f");
-    Insert(EVENT_RENAME, "/s/f", "/s/g");
+    lines += Line(EVENT_DELETE, "/s/g") + RenameLine("/s/f", "/s/g");
+    lines += Line(EVENT_DELETE, "/s/f") + RenameLine("/s/g", "/s/f");
   }
-  EXPECT_EQ(Pending(), 100'000);
-  EXPECT_EQ(tree_.ops.size(), 200'000u);
+  const QueueFile queue(lines);
+  OPTree tree(queue.path());
+  EXPECT_EQ(tree.ops.size(), 200'000u);
+  const auto& moved = tree.GetNodeByPath("/s/f")->ops;
+  ASSERT_EQ(moved.size(), 200'000u);
+  EXPECT_EQ(Text(*moved[0]), "none /s/f");
+  EXPECT_EQ(Text(*moved[1]), "none /s/g");
+  EXPECT_EQ(Text(*moved.back()), "rename /s/g -> /s/f");
 }
 
 TEST_F(BoundsTest, SavingByRenamingInTurn) {

@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <memory>
+#include <sstream>
 #include <string>
 #include <vector>
 
@@ -228,6 +229,38 @@ TEST_F(RenameTest, LongListsAreMovedWhole) {
   ASSERT_EQ(handed_out.size(), 104u);
   EXPECT_EQ(Strings(handed_out.begin() + 100, handed_out.end()),
             (Strings{"delete /d/a", "index /e/a", "rename /d -> /e", "index /d/a"}));
+}
+
+// However many there are, and whether or not there were fewer at the new place.
+TEST_F(RenameTest, MovedRecordsComeBehindThoseThatAreThere) {
+  std::string lines;
+  Strings there;
+  Strings moved;
+  const auto rename = [&lines](const std::string& from, const std::string& to, Strings& list) {
+    lines += RenameLine(from, to);
+    list.push_back("rename " + from + " -> " + to);
+  };
+  for (int i = 0; i < 3; ++i) rename("/x" + std::to_string(i), "/b", there);
+  for (int i = 0; i < 40; ++i) rename("/y" + std::to_string(i), "/a", moved);
+  rename("/a", "/b", moved);
+  there.insert(there.end(), moved.begin(), moved.end());
+  // And again, with records on either side of the long list.
+  Strings again;
+  rename("/z", "/c", again);
+  lines += RenameLine("/b", "/c");
+  there.insert(there.begin(), again.begin(), again.end());
+  there.push_back("rename /b -> /c");
+
+  const QueueFile queue(lines);
+  OPTree built(queue.path());
+  EXPECT_EQ(At(built, "/c"), there);
+  const QueueFile empty;
+  OPTree tree(empty.path());
+  std::istringstream input(lines);
+  for (std::string line; std::getline(input, line);) {
+    tree.InsertEvent(std::make_shared<Event>(line));
+  }
+  EXPECT_EQ(At(tree, "/c"), there);
 }
 
 TEST_F(RenameTest, LastOfSeveralKindsIsCarriedFromALongListToo) {
