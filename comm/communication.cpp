@@ -156,7 +156,6 @@ void BufferWrite(int fd, unsigned int len, const unsigned char* buf) {
   const SigpipeGuard guard;
   InterruptionBudget budget;
   for (unsigned int done = 0; done < len;) {
-    errno = 0;
     const ssize_t count = write(fd, buf + done, std::min(len - done, kPieceBytes));
     if (count > 0) {
       done += static_cast<unsigned int>(count);

@@ -6,6 +6,7 @@
 #include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/syscall.h>
+#include <sys/time.h>
 #include <sys/un.h>
 #include <unistd.h>
 
@@ -30,15 +31,19 @@
 namespace {
 
 std::atomic<bool> fail_setsockopt{false};
+std::atomic<int> receive_timeouts{0};
+timeval send_timeout{};
 
 }  // namespace
 
-// Takes the C library's place in this program, so that its failure can be watched.
+// Takes the C library's place in this program, so that it can be watched and made to fail.
 extern "C" int setsockopt(int fd, int level, int name, const void* value, socklen_t size) noexcept {
   if (fail_setsockopt) {
     errno = ENOPROTOOPT;
     return -1;
   }
+  if (name == SO_RCVTIMEO) ++receive_timeouts;
+  if (name == SO_SNDTIMEO) memcpy(&send_timeout, value, sizeof(send_timeout));
   return static_cast<int>(syscall(SYS_setsockopt, fd, level, name, value, size));
 }
 
@@ -145,6 +150,14 @@ TEST_F(CommunicationTest, ReadAndWriteFailures) {
   EXPECT_EQ(write_error.code(), 502);
   EXPECT_EQ(write_error.reason(), Reason("write", EBADF));
   EXPECT_THAT(fake::Logs(), IsEmpty());
+}
+
+TEST_F(CommunicationTest, BuffersThatPassLeaveErrnoAlone) {
+  const Pipe pipe;
+  errno = EIO;
+  Write(pipe.writer.get(), "ab");
+  EXPECT_EQ(Read(pipe.reader.get(), 2), "ab");
+  EXPECT_EQ(errno, EIO);
 }
 
 TEST_F(CommunicationTest, AWriteThatWritesNothingFails) {
@@ -476,6 +489,14 @@ TEST_F(CommunicationTest, NoSendTimeout) {
                 "sizeof(timeout))], reason: " +
                 Reason("setsockopt", ENOPROTOOPT) + " [err: " + strerror(ENOPROTOOPT) + "]");
   EXPECT_EQ(fake::SystemCallCount("close"), 1);
+}
+
+TEST_F(CommunicationTest, OnlySendingIsLimitedToASecond) {
+  send_timeout = {};
+  SentTo("c", Json::Value(), LengthOf(0));
+  EXPECT_EQ(send_timeout.tv_sec, 1);
+  EXPECT_EQ(send_timeout.tv_usec, 0);
+  EXPECT_EQ(receive_timeouts, 0);
 }
 
 TEST_F(CommunicationTest, ADaemonThatStopsReadingFailsTheWrite) {

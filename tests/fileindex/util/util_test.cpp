@@ -207,6 +207,8 @@ TEST_F(UtilTest, PreservedNames) {
   for (const char* name : {".DS_Store2", ".ds_store", "DS_Store", "", "a", "x/.DS_Store"}) {
     EXPECT_FALSE(IsSystemPreservedFileName(name)) << name;
   }
+  fake::FailCall("TARNEAIsHiddenDir", 1, {2});
+  EXPECT_FALSE(IsSystemPreservedFileName("@meta"));
   fake::FailEveryCall("TARNEAIsHiddenDir");
   EXPECT_FALSE(IsSystemPreservedFileName("@meta"));
   EXPECT_TRUE(IsSystemPreservedFileName(".DS_Store"));
@@ -239,9 +241,11 @@ TEST_F(UtilTest, RecycleBinOfAHome) {
   const std::string homes = AddShare("homes");
   fake::AddHomeRecycle(homes + "/tester/bin");
   fake::AddHomeRecycle(Photo("/tester/bin"));
+  fake::AddHomeRecycle(AddShare("homes2") + "/tester/bin");
   EXPECT_TRUE(IsFullPathInRecycleBin(homes + "/tester/bin/a"));
   EXPECT_FALSE(IsFullPathInRecycleBin(homes + "/tester/a"));
   EXPECT_FALSE(IsFullPathInRecycleBin(Photo("/tester/bin/a")));
+  EXPECT_FALSE(IsFullPathInRecycleBin(volume_ + "/homes2/tester/bin/a"));
   EXPECT_THAT(fake::CallsOf("TARNRecycleUserHomePathIsExist"),
               ElementsAre("TARNRecycleUserHomePathIsExist(" + homes + "/tester/bin/a, 11)",
                           "TARNRecycleUserHomePathIsExist(" + homes + "/tester/a, 11)"));
@@ -383,9 +387,11 @@ TEST_F(UtilTest, TheTopOfAnEncryptionShareMay) {
   EXPECT_EQ(Thrown([&] { CanFullPathBeIndexed(Photo()); }).code(), 502);
 }
 
-TEST_F(UtilTest, AMountPointThatCannotBeToldIsNone) {
-  fake::FailCall("TARNFSDirIsMntPoint");
-  EXPECT_TRUE(CanFullPathBeIndexed(Photo()));
+TEST_F(UtilTest, OnlyTheAnswerOneTellsAMountPoint) {
+  for (const int answer : {-1, 0, 2}) {
+    fake::FailCall("TARNFSDirIsMntPoint", 1, {answer});
+    EXPECT_TRUE(CanFullPathBeIndexed(Photo())) << answer;
+  }
 }
 
 TEST_F(UtilTest, OnlyCanonicalPathsMay) {
