@@ -1,6 +1,7 @@
 #include "cli/folder_status.h"
 
 #include "cli/problem.h"
+#include "cli/share_plan.h"
 #include "cli/system.h"
 #include "common/json.h"
 #include "daemons/common/client.h"
@@ -32,6 +33,17 @@ std::string State(const fileindex::Folder& folder, const std::string& daemon_sta
   return text == "processing" && daemon_state == "retrying" ? daemon_state : text;
 }
 
+// A share that was on its way to a new name or place when that was cut short is not known either.
+std::string WhyUnknown(const fileindex::Folder& folder, const Error& error) {
+  try {
+    const std::string move = UnfinishedMove(platform::ReadShares(), folder.GetShare());
+    if (!move.empty()) return "its share is being moved; end that with: " + move;
+  } catch (const Error&) {
+    // What the folder's own state says is nearer to the cause.
+  }
+  return Explain(error);
+}
+
 }  // namespace
 
 Json::Value IndexDaemonReport() {
@@ -50,7 +62,7 @@ Json::Value FolderStatus(const fileindex::Folder& folder, const Json::Value& rep
     status["state"] = State(folder, status["state"].asString());
   } catch (const Error& error) {
     status["state"] = "error";
-    status["last_error"] = Explain(error);
+    status["last_error"] = WhyUnknown(folder, error);
   }
   return status;
 }
@@ -58,9 +70,10 @@ Json::Value FolderStatus(const fileindex::Folder& folder, const Json::Value& rep
 std::string StateInWords(const Json::Value& status) {
   const std::string state = status["state"].asString();
   const std::string error = status["last_error"].asString();
+  const std::string path = status["path"].asString();
   if (state == "invalid_path")
     return "cannot be indexed any longer (moved, unmounted or read-only)";
-  if (state == "need_reindex") return "needs a reindex";
+  if (state == "need_reindex") return "needs a reindex: quarry folder reindex " + path;
   if (state == "finished") return "up to date";
   if (state == "processing") return "indexing";
   if (state == "retrying") return "will try again: " + error;

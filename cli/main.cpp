@@ -76,6 +76,11 @@ int main(int argc, char** argv) {
   quarry::cli::AddSearchCommand(app);
   quarry::cli::AddStatusCommand(app);
   quarry::cli::AddQueueCommand(app);
+  quarry::cli::AddPauseCommands(app);
+  quarry::cli::AddVolumeCommand(app);
+  quarry::cli::AddHomeCommand(app);
+  quarry::cli::AddUserCommand(app);
+  quarry::cli::AddSuggestCommand(app);
   quarry::cli::AddCompletionCommand(app);
   return Run(app, argc, argv);
 }

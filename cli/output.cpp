@@ -8,7 +8,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <ctime>
-#include <ostream>
+#include <iostream>
 
 namespace quarry::cli {
 namespace {
@@ -64,6 +64,14 @@ void PrintJson(std::ostream& out, const Json::Value& value) {
   builder["indentation"] = "  ";
   builder["emitUTF8"] = true;
   out << Json::writeString(builder, value) << '\n';
+}
+
+void PrintDone(bool json, const std::string& sentence, const Json::Value& result) {
+  if (json) {
+    PrintJson(std::cout, result);
+  } else {
+    std::cout << Printable(sentence) << '\n';
+  }
 }
 
 std::string HumanSize(std::uint64_t bytes) {

@@ -19,6 +19,9 @@ std::string Printable(const std::string& text);
 // Rows of cells in columns, two blanks apart, the first row a heading.
 void PrintTable(std::ostream& out, const std::vector<std::vector<std::string>>& rows);
 
+// What a command has done: the sentence for a person, or with `json` the result.
+void PrintDone(bool json, const std::string& sentence, const Json::Value& result);
+
 // The document with line breaks and indentation, and a newline at its end.
 void PrintJson(std::ostream& out, const Json::Value& value);
 

@@ -15,7 +15,17 @@ void AddSearchCommand(CLI::App& app);
 void AddStatusCommand(CLI::App& app);
 void AddQueueCommand(CLI::App& app);
 void AddIndexCommand(CLI::App& app);
+void AddVolumeCommand(CLI::App& app);
+void AddHomeCommand(CLI::App& app);
+void AddUserCommand(CLI::App& app);
+void AddPauseCommands(CLI::App& app);
+void AddSuggestCommand(CLI::App& app);
 void AddCompletionCommand(CLI::App& app);
+
+// Parts of the commands "folder" and "share".
+void AddFolderWorkCommands(CLI::App& folder);
+void AddShareMoveCommands(CLI::App& share);
+void AddSharePauseCommands(CLI::App& share);
 
 // A "--json" option of `command`. The reference stays valid as long as the application.
 const bool& JsonOption(CLI::App& command);

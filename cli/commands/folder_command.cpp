@@ -192,6 +192,7 @@ void AddFolderCommand(CLI::App& app) {
   get->callback([path, &get_json] { Get(*path, get_json); });
 
   AddListCommand(*folder);
+  AddFolderWorkCommands(*folder);
 }
 
 }  // namespace quarry::cli

@@ -2,12 +2,16 @@
 #include <memory>
 
 #include "cli/commands/commands.h"
+#include "cli/folder_lock.h"
+#include "cli/folders.h"
 #include "cli/layout.h"
 #include "cli/output.h"
 #include "cli/problem.h"
+#include "cli/share_plan.h"
 #include "cli/shares.h"
 #include "common/sdk/share.h"
 #include "fileindex/config/folder_mgr.h"
+#include "platform/linux/share_move.h"
 
 namespace quarry::cli {
 namespace {
@@ -70,6 +74,29 @@ void List(bool json) {
   PrintTable(std::cout, rows);
 }
 
+// What still needs the share is named, not taken away with it.
+void Remove(const std::string& name, bool json) {
+  const FolderLock lock;
+  const auto shares = platform::ReadShares();
+  const platform::ShareRecord share = RequireShare(shares, name);
+  const std::string unfinished = UnfinishedMove(shares, name);
+  if (!unfinished.empty()) throw Problem("The share is being moved. End that: " + unfinished);
+  std::string paths;
+  for (const auto& folder : AllFolders()) {
+    if (folder->GetShare() == name) paths += " " + folder->GetPath();
+  }
+  if (!paths.empty()) {
+    throw Problem("The share \"" + name +
+                  "\" is indexed. Delete its folders first: " + "quarry folder delete" + paths);
+  }
+  platform::RemoveShare(name);
+  platform::RemoveQueue(share.path);
+  Json::Value result;
+  result["name"] = name;
+  result["path"] = share.path;
+  PrintDone(json, "Removed the share " + name + "; its files stay at " + share.path + ".", result);
+}
+
 }  // namespace
 
 void AddShareCommand(CLI::App& app) {
@@ -89,6 +116,16 @@ void AddShareCommand(CLI::App& app) {
   const bool& list_json = JsonOption(*list);
   Examples(*list, "  quarry share list");
   list->callback([&list_json] { List(list_json); });
+
+  CLI::App* remove = share->add_subcommand("remove", "Forget a share; its files stay");
+  auto name = std::make_shared<std::string>();
+  remove->add_option("NAME", *name, "The share's name")->required();
+  const bool& remove_json = JsonOption(*remove);
+  Examples(*remove, "  quarry share remove Music");
+  remove->callback([name, &remove_json] { Remove(*name, remove_json); });
+
+  AddShareMoveCommands(*share);
+  AddSharePauseCommands(*share);
 }
 
 }  // namespace quarry::cli
