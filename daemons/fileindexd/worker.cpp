@@ -69,6 +69,7 @@ Worker::Milliseconds Worker::Step() {
   if (gate_.Stopping()) return milliseconds(0);
   try {
     RefreshLayout();
+    pass_began_ = false;
     ClaimReindex();
     if (gate_.Paused() || layout_.rules->AllPaused()) return kPoll;
     FollowRoot();
@@ -96,8 +97,7 @@ void Worker::RefreshLayout() {
   if (!reload_.exchange(false)) return;
   try {
     ShareLayout layout = parts_.host->Load();
-    // While a folder was paused nobody watched it.
-    if (layout_.rules && HasNewlyActive(*layout_.rules, *layout.rules)) CompareAll();
+    if (layout_.rules && MustCompareAfter(*layout.rules)) CompareAll();
     if (layout.root != layout_.root) root_ = Identity();
     layout_ = std::move(layout);
     progress_.SetFolders(layout_.rules);
@@ -105,6 +105,12 @@ void Worker::RefreshLayout() {
     reload_ = true;
     throw;
   }
+}
+
+// While a folder was paused nobody watched it. And the event of a folder that changes is not queued
+// while a reindex waits, be it the one that the pass has just gone over by the old folders.
+bool Worker::MustCompareAfter(const FolderRules& now) const {
+  return HasNewlyActive(*layout_.rules, now) || (pass_began_ && now != *layout_.rules);
 }
 
 Survey::Rules Worker::CurrentRules() {
@@ -142,6 +148,7 @@ bool Worker::HasWork() const {
 void Worker::RunOnePass() {
   CheckShareIsThere();
   const std::uint64_t asked = compares_asked_;
+  pass_began_ = true;
   const PassSetup setup{layout_.queue_path, layout_.root,  *parts_.index,  survey_, gate_,
                         progress_,          *parts_.slots, parts_.threads, root_};
   if (RunPass(setup, MustCompare()) == PassResult::kAgain) {

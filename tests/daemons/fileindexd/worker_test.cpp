@@ -6,6 +6,7 @@
 #include <thread>
 
 #include "daemons/tarnelasticd/engine_error.h"
+#include "fileindex/queue/queue_mgr.h"
 #include "tests/daemons/fileindexd/share_fixture.h"
 #include "tests/daemons/fileindexd/shared_parts.h"
 #include "tests/support/files.h"
@@ -15,6 +16,7 @@ namespace {
 
 using fileindex::EVENT_CREATE;
 using fileindex::EVENT_MODIFY;
+using fileindex::EVENT_REINDEX;
 using std::chrono::milliseconds;
 using ::testing::Contains;
 using ::testing::HasSubstr;
@@ -353,6 +355,53 @@ TEST_F(WorkerTest, AFolderThatIsNoLongerPausedBehindTheWalkIsCompared) {
   while (worker_->Step() == milliseconds(0)) {
   }
   EXPECT_EQ(1U, index_.All().count("/v/s/a/1.txt"));
+}
+
+// While a reindex waits, and be it one that is being worked on, the event of a changed folder is
+// not queued: what lies behind the walk was judged by the old folders.
+class ReindexTest : public WorkerTest {
+ protected:
+  ReindexTest() {
+    host_.SetFolders({DocumentFolder("/s")});
+    disk_.WriteFile("/v/s/a/1.mp3");
+    disk_.WriteFile("/v/s/b/2.mp3");
+    worker_->Step();
+    Queue(EVENT_REINDEX, "/v/s", true);
+  }
+
+  // Works the reindex off, and has all kinds wanted from the first command `when` on.
+  void ChangeFoldersAt(const std::string& when) {
+    bool changed = false;
+    index_.SetHook([&](const std::string& command) {
+      if (changed || command != when) return;
+      changed = true;
+      EXPECT_TRUE(fileindex::QueueMgr(QueuePath()).IsReindexWaitingFor("/v/s"));
+      host_.SetFolders({Folder("/s")});
+      worker_->Reload();
+    });
+    while (worker_->Step() == milliseconds(0)) {
+    }
+    index_.SetHook(nullptr);
+    EXPECT_TRUE(changed);
+  }
+};
+
+TEST_F(ReindexTest, FoldersThatChangeBehindTheWalkAreCompared) {
+  ChangeFoldersAt("children /v/s/a");
+  ExpectInLine();
+}
+
+TEST_F(ReindexTest, FoldersThatChangeAfterTheWalkAreCompared) {
+  ChangeFoldersAt("commit");
+  ExpectInLine();
+}
+
+TEST_F(WorkerTest, FoldersThatChangeWhileNothingIsDoneAreLeftToTheirEvent) {
+  worker_->Step();
+  EXPECT_TRUE(IsAtRest());
+  host_.SetFolders({DocumentFolder("/s")});
+  worker_->Reload();
+  EXPECT_TRUE(IsAtRest());
 }
 
 TEST_F(WorkerTest, LoadsTheFoldersOnlyWhenTheyMayHaveChanged) {
