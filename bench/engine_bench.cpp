@@ -9,6 +9,7 @@
 #include <memory>
 #include <random>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "common/json.h"
@@ -37,12 +38,18 @@ class TextMaker {
     return text;
   }
 
+  // Syllables, as the hash of the index's words is made for words that people use.
   static std::string WordNumber(std::size_t number) {
+    constexpr std::string_view kFirst = "bcdfghjklmnprstvwxyz";
+    constexpr std::string_view kSecond = "aeiou";
+    constexpr std::string_view kLast = "nrslt";
     std::string word;
-    for (std::size_t rest = number + 26; rest > 0; rest /= 26) {
-      word += static_cast<char>('a' + rest % 26);
+    for (std::size_t rest = number + 500; rest > 0; rest /= 500) {
+      word += kFirst[rest % 20];
+      word += kSecond[rest / 20 % 5];
+      if (rest / 100 % 5 > 0) word += kLast[rest / 100 % 5];
     }
-    return word + "xy";
+    return word;
   }
 
  private:

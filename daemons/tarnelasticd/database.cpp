@@ -190,6 +190,12 @@ void Database::Execute(const std::string& sql) {
   if (result != SQLITE_OK) ThrowSqlite(handle(), result, "The index's database failed");
 }
 
+void Database::EmptyLog() noexcept {
+  sqlite3_busy_timeout(handle(), 0);
+  sqlite3_wal_checkpoint_v2(handle(), "main", SQLITE_CHECKPOINT_TRUNCATE, nullptr, nullptr);
+  sqlite3_busy_timeout(handle(), kBusyTimeoutMs);
+}
+
 bool Database::HasMoved() const {
   int moved = 0;
   sqlite3_file_control(handle(), "main", SQLITE_FCNTL_HAS_MOVED, &moved);

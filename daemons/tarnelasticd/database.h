@@ -76,6 +76,9 @@ class Database {
   void Execute(const std::string& sql);
   // Whether a transaction is open. SQLite ends one by itself after some failures.
   bool InTransaction() const { return sqlite3_get_autocommit(db_.get()) == 0; }
+  // Writes the log back into the database and cuts it to nothing, if nobody reads just now. Never
+  // waits; a failure is left to the next commit.
+  void EmptyLog() noexcept;
   // Whether the file that is open is no longer the one at its path.
   bool HasMoved() const;
 

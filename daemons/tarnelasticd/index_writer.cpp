@@ -14,6 +14,8 @@ namespace {
 
 constexpr std::int64_t kDeleteChunk = 500;
 
+constexpr std::size_t kLargeTransaction = std::size_t{4} << 20;
+
 // Roughly what one row costs beside its text.
 constexpr std::size_t kRowBytes = 512;
 
@@ -162,6 +164,7 @@ bool IndexWriter::IsOld() const {
 void IndexWriter::CommitNow() {
   // Whoever removes the file under us must not be told that documents are safe in it.
   if (db_.HasMoved()) throw Error(kDamagedIndex, "The index's database has been removed");
+  transaction_bytes_ += buffer_.bytes();
   buffer_.Flush(*schema_, &db_, tokenizer_);
   if (terms_requested_) RebuildTerms();
   db_.Prepare("INSERT OR REPLACE INTO meta(key,value) VALUES('documents',?1)")
@@ -170,6 +173,8 @@ void IndexWriter::CommitNow() {
   db_.Execute("COMMIT");
   terms_requested_ = false;
   uncommitted_ = false;
+  // Else the log stays as large as the transaction was for as long as nobody writes.
+  if (transaction_bytes_ >= kLargeTransaction) db_.EmptyLog();
 }
 
 void IndexWriter::Commit() {

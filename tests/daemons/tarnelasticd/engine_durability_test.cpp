@@ -123,6 +123,16 @@ TEST_F(DurabilityTest, ATransactionEndsWhenItIsLarge) {
   EXPECT_LT(documents, 60);
 }
 
+TEST_F(DurabilityTest, ALargeTransactionLeavesNoLargeLog) {
+  Create();
+  std::string text;
+  for (int i = 0; i < 100000; ++i) text += "word" + std::to_string(i) + ' ';
+  for (int i = 0; i < 6; ++i) Upsert(FileDocument("/s/" + std::to_string(i), text));
+  Commit();
+  EXPECT_EQ(test::ReadFile(DatabasePath(DirectoryOf("a")) + "-wal").size(), 0U);
+  EXPECT_EQ(Paths("word99999").size(), 6U);
+}
+
 // Changes of attributes alone touch no full text, but fill the log all the same.
 TEST_F(DurabilityTest, ATransactionOfAttributesEndsWhenItIsLarge) {
   WriterLimits limits;
