@@ -96,11 +96,15 @@ void RequireFolderAround(const std::string& path) {
 
 }  // namespace
 
-void RequireIndexed(const std::string& share) {
-  if (fileindex::FolderMgr().IsShareIndexed(share)) return;
-  RequireShare(platform::ReadShares(), share);
-  throw Problem("Nothing of the share \"" + share +
-                "\" is indexed. Index it with: " + "quarry folder add /" + share);
+void RequireIndexed(const std::string& name) {
+  const auto shares = platform::ReadShares();
+  for (const platform::ShareRecord& share : shares) {
+    if (share.name == name) RequireArrived(share);
+  }
+  if (fileindex::FolderMgr().IsShareIndexed(name)) return;
+  RequireShare(shares, name);
+  throw Problem("Nothing of the share \"" + name +
+                "\" is indexed. Index it with: quarry folder add /" + name);
 }
 
 void PauseShare(const std::string& name) {

@@ -28,7 +28,7 @@ std::set<std::string> ClearVolume(const std::string& mount_point);
 void ReindexFolders(const std::vector<std::string>& paths);
 
 // The sentence with which somebody is told that nothing of the share is indexed, as a Problem.
-void RequireIndexed(const std::string& share);
+void RequireIndexed(const std::string& name);
 
 }  // namespace quarry::cli
 

@@ -4,15 +4,16 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
+#include <fstream>
 #include <optional>
 
 #include "cli/problem.h"
 #include "cli/system.h"
 #include "cli/worker_break.h"
-#include "comm/elastic_control.h"
 #include "common/file_util.h"
 #include "common/json.h"
 #include "common/sdk/share.h"
@@ -44,24 +45,35 @@ void SyncDirectory(const std::string& path) {
   }
 }
 
-// The line that takes documents and waiting work along. It stands in the queue before anybody else
-// can work it off: a worker that found the new place without it would read every file again.
-std::string RenameLine(const SharePlan& plan) {
-  Json::Value line(Json::objectValue);
-  line["event"] = fileindex::EVENT_RENAME;
-  line["path"] = plan.new_path;
-  line["path_old"] = plan.old_path;
-  line["data"] = Json::Value();
-  return toString(line);
+// The last line of a file, or of so much of it as a line of the queue can take.
+std::string LastLine(const std::string& path) {
+  constexpr std::streamoff kLongest = 128 << 10;
+  std::ifstream file(path, std::ios::binary | std::ios::ate);
+  const std::streamoff size = file.tellg();
+  if (size <= 0) return {};
+  file.seekg(std::max(size - kLongest, std::streamoff{0}));
+  std::string line;
+  std::string last;
+  while (std::getline(file, line)) last = line;
+  return last;
 }
 
-void MoveFiles(const SharePlan& plan, bool copied, bool indexed) {
+// Whether the rename of the documents has been queued, which is the last thing that the library
+// does. Nobody else writes to the queue before the move is ended.
+bool IsRenameQueued(const SharePlan& plan) {
+  Json::Value line;
+  return fromString(line, LastLine(sdk::SDKShare(plan.to).GetQueuePath())) && line.isObject() &&
+         line["event"] == fileindex::EVENT_RENAME && line["path"] == plan.new_path &&
+         line["path_old"] == plan.old_path;
+}
+
+void MoveFiles(const SharePlan& plan, bool copied) {
   if (plan.registered) {
     platform::CleanUpShareMove(plan.old_path);
     return;
   }
   MoveDirectory(plan, copied);
-  platform::MoveShare(plan.from, plan.new_path, indexed ? RenameLine(plan) : std::string());
+  platform::MoveShare(plan.from, plan.new_path);
 }
 
 void MoveStatus(const SharePlan& plan) {
@@ -72,16 +84,14 @@ void MoveStatus(const SharePlan& plan) {
   status.ClearShareStatus(plan.from);
 }
 
-// The index goes first: a worker starts as soon as the folders have their new names, and would make
-// an index anew that it does not find.
 void MoveIndex(const SharePlan& plan) {
+  if (plan.registered && IsRenameQueued(plan)) return;
   if (plan.from == plan.to) {
     fileindex::ShareMigrate(plan.to, plan.old_path, plan.new_path);
-    return;
+  } else {
+    MoveStatus(plan);
+    fileindex::ShareRename(plan.from, plan.to);
   }
-  fileindex::elastic::ShareIndexRename(plan.from, plan.to, sdk::SDKShare(plan.to).GetDBPath());
-  MoveStatus(plan);
-  fileindex::ShareRename(plan.from, plan.to);
 }
 
 }  // namespace
@@ -118,7 +128,8 @@ void MoveShare(const SharePlan& plan, bool copied) {
     RequireRunningSystem();
     pause.emplace(plan.from);
   }
-  MoveFiles(plan, copied, indexed);
+  MoveFiles(plan, copied);
+  platform::ShowMovingShares(true);
   if (indexed) MoveIndex(plan);
   platform::EndShareMove(plan.to);
 }

@@ -17,8 +17,8 @@ void MoveDirectory(const SharePlan& plan, bool copied);
 // worker go on. The caller holds a FolderLock.
 //
 // When the process is killed anywhere, the same command ends what it has begun: until the share's
-// record is replaced there is only a directory that has moved, and from then on a queue that says
-// so to whoever works it off. Throws Problem or Error.
+// record is replaced there is only a directory that has moved, and from then on nobody else knows
+// the share. Throws Problem or Error.
 void MoveShare(const SharePlan& plan, bool copied);
 
 }  // namespace quarry::cli

@@ -24,12 +24,6 @@ std::string CommandFor(const ShareRecord& moved) {
   return "quarry share migrate " + moved.name + " " + Dirname(moved.path) + "/";
 }
 
-void RequireArrived(const ShareRecord& share) {
-  if (share.moved_from.empty()) return;
-  throw Problem("The share \"" + share.name + "\" is still on its way from \"" + share.moved_from +
-                "\". End that first: " + CommandFor(share));
-}
-
 SharePlan Resumed(const ShareRecord& share) {
   return {Basename(share.moved_from), share.name, share.moved_from, share.path, true};
 }
@@ -71,6 +65,12 @@ const ShareRecord& RequireShare(const Shares& shares, const std::string& name) {
   if (share != nullptr) return *share;
   throw Problem("There is no share named \"" + name +
                 "\". \"quarry share list\" names those there are.");
+}
+
+void RequireArrived(const ShareRecord& share) {
+  if (share.moved_from.empty()) return;
+  throw Problem("The share \"" + share.name + "\" is still on its way from \"" + share.moved_from +
+                "\". End that first: " + CommandFor(share));
 }
 
 SharePlan PlanRename(const Shares& shares, const std::string& from, const std::string& to) {

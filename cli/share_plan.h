@@ -22,6 +22,9 @@ struct SharePlan {
 const platform::ShareRecord& RequireShare(const std::vector<platform::ShareRecord>& shares,
                                           const std::string& name);
 
+// Throws Problem, with the command that ends it, when the share's move was cut short.
+void RequireArrived(const platform::ShareRecord& share);
+
 // The share `from` gets the name `to`, in the directory in which it is. Throws Problem.
 SharePlan PlanRename(const std::vector<platform::ShareRecord>& shares, const std::string& from,
                      const std::string& to);

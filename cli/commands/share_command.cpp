@@ -47,7 +47,8 @@ Json::Value Describe(const std::string& name, const fileindex::FolderMgr& folder
     entry["path"] = share.GetPath();
     entry["can_be_indexed"] = share.CanBeIndexed();
   } catch (const Error& error) {
-    entry["error"] = Explain(error);
+    const std::string move = UnfinishedMove(platform::ReadShares(), name);
+    entry["error"] = move.empty() ? Explain(error) : "on its way; end that with: " + move;
   }
   return entry;
 }
@@ -78,9 +79,8 @@ void List(bool json) {
 void Remove(const std::string& name, bool json) {
   const FolderLock lock;
   const auto shares = platform::ReadShares();
-  const platform::ShareRecord share = RequireShare(shares, name);
-  const std::string unfinished = UnfinishedMove(shares, name);
-  if (!unfinished.empty()) throw Problem("The share is being moved. End that: " + unfinished);
+  const platform::ShareRecord& share = RequireShare(shares, name);
+  RequireArrived(share);
   std::string paths;
   for (const auto& folder : AllFolders()) {
     if (folder->GetShare() == name) paths += " " + folder->GetPath();

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <memory>
 
+#include "daemons/fileindexd/rename_chain.h"
 #include "fileindex/queue/queue_mgr.h"
 
 namespace quarry::fileindexd {
@@ -61,11 +62,13 @@ class Pass {
   }
 
  private:
-  void Do(const Operations& operations) {
-    for (const auto& op : operations) setup_.progress.AddWaiting(op->node->GetPath());
-    for (const auto& op : operations) {
+  void Do(const Operations& taken) {
+    std::vector<Operation> operations;
+    for (const auto& op : taken) operations.push_back({op->op, op->node->GetPath(), op->src});
+    FollowRenames(&operations);
+    for (const Operation& operation : operations) setup_.progress.AddWaiting(operation.path);
+    for (const Operation& operation : operations) {
       setup_.gate.Pass();
-      const Operation operation{op->op, op->node->GetPath(), op->src};
       setup_.progress.Begin(operation.path);
       handler_.Handle(operation);
       setup_.progress.TakeWaiting(operation.path);

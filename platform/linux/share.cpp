@@ -65,7 +65,7 @@ int TARNShareGet(const char* name, TARNSHARE** share) {
   if (shares == nullptr) return -1;
   const auto found = std::find_if(shares->begin(), shares->end(),
                                   [&](const ShareRecord& record) { return record.name == name; });
-  if (found == shares->end()) return QUARRY_PLATFORM_FAIL(kErrNotFound);
+  if (found == shares->end() || !IsShown(*found)) return QUARRY_PLATFORM_FAIL(kErrNotFound);
   *share = new (std::nothrow) OwnedShare(*found);
   return *share == nullptr ? QUARRY_PLATFORM_FAIL(kErrSystem) : 0;
 }
@@ -80,7 +80,7 @@ int TARNShareNamePathGet(const char* full_path, char* name, size_t name_size, ch
   const ShareList shares = TryLoadShares();
   if (shares == nullptr) return -1;
   const ShareRecord* share = ShareHolding(*shares, full_path);
-  if (share == nullptr) return QUARRY_PLATFORM_FAIL(kErrNotFound);
+  if (share == nullptr || !IsShown(*share)) return QUARRY_PLATFORM_FAIL(kErrNotFound);
   if (!Fits(share->name, name, name_size) || !Fits(share->path, path, path_size)) {
     return QUARRY_PLATFORM_FAIL(kErrNameTooLong);
   }

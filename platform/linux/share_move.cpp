@@ -67,15 +67,14 @@ void AppendLines(int fd, const std::string& path) {
   if (last != '\n') WriteAll(fd, "\n", 1);
 }
 
-// Makes the new queue of the old one's snapshot, its lines and one line more. Nobody writes to it
-// yet, so what an earlier attempt has left is replaced.
-void CopyQueue(const std::string& from, const std::string& to, const std::string& last_line) {
+// Makes the new queue of the old one's snapshot and its lines. Nobody writes to it yet, so what an
+// earlier attempt has left is replaced.
+void CopyQueue(const std::string& from, const std::string& to) {
   const std::string unfinished = to + ".moving";
   const UniqueFd fd(open(unfinished.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0644));
   if (!fd.valid()) SystemFailure("Cannot make " + unfinished);
   AppendLines(fd.get(), from + kSnapshot);
   AppendLines(fd.get(), from);
-  if (!last_line.empty()) WriteAll(fd.get(), (last_line + "\n").c_str(), last_line.size() + 1);
   if (fsync(fd.get()) != 0) SystemFailure("Cannot write " + unfinished);
   RemoveFile(to + kSnapshot);
   if (rename(unfinished.c_str(), to.c_str()) != 0 || !SyncDirectory(ParentDirectory(to))) {
@@ -96,7 +95,7 @@ void CopyWatches(const MonitorMove& move) {
 
 }  // namespace
 
-void MoveShare(const std::string& name, const std::string& new_path, const std::string& last_line) {
+void MoveShare(const std::string& name, const std::string& new_path) {
   const std::string old_path = PathOfShare(name);
   const std::string old_queue = QueueOf(old_path);
   {
@@ -104,7 +103,7 @@ void MoveShare(const std::string& name, const std::string& new_path, const std::
     const LockFile lock(old_queue, true);
     ReplaceSharePath(name, new_path, [&] {
       const std::string new_queue = QueueOf(new_path);
-      CopyQueue(old_queue, new_queue, last_line);
+      CopyQueue(old_queue, new_queue);
       CopyWatches({old_queue, new_queue, old_path, new_path});
     });
   }

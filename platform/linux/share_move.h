@@ -12,15 +12,20 @@
 namespace quarry::platform {
 
 // Moves the share to the full path `new_path`, an existing directory whose last component becomes
-// the share's name. The new queue holds the old snapshot's and queue's lines and then `last_line`,
-// unless that is empty. Nobody may be working on the old snapshot.
+// the share's name. The new queue holds the old snapshot's and queue's lines. Nobody may be working
+// on the old snapshot.
 //
 // The share's record is replaced in one instant, behind the preparations: when the process is
 // killed before it, calling this again begins anew, and when it is killed after it the record says
-// "moved_from" and CleanUpShareMove does the rest. Throws as ReplaceSharePath, and Error 502 when
-// the queue or a registration cannot be written, 506 when the queue cannot be locked.
-QUARRY_EXPORT void MoveShare(const std::string& name, const std::string& new_path,
-                             const std::string& last_line);
+// "moved_from" and CleanUpShareMove does the rest. Until EndShareMove the share is known to nobody
+// but processes that ask for it with ShowMovingShares: somebody who found its new place before its
+// index and its documents are there would index it anew. Throws as ReplaceSharePath, and Error 502
+// when the queue or a registration cannot be written, 506 when the queue cannot be locked.
+QUARRY_EXPORT void MoveShare(const std::string& name, const std::string& new_path);
+
+// Whether this process wants to know shares that are on their way (TARNShareGet,
+// TARNShareNamePathGet); at first it does not. Any thread.
+QUARRY_EXPORT void ShowMovingShares(bool show);
 
 // Removes queue and registrations of the place that the share was moved from. May be repeated.
 // Throws Error 502 when something cannot be removed.

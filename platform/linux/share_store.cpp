@@ -3,6 +3,7 @@
 #include <json/json.h>
 #include <sys/stat.h>
 
+#include <atomic>
 #include <cerrno>
 #include <cstring>
 #include <mutex>
@@ -14,6 +15,7 @@
 #include "platform/linux/durable_file.h"
 #include "platform/linux/last_error.h"
 #include "platform/linux/path_name.h"
+#include "platform/linux/share_move.h"
 
 namespace quarry::platform {
 namespace {
@@ -95,6 +97,8 @@ struct Cache {
   ShareList shares;
 };
 
+std::atomic<bool> moving_shown{false};
+
 Cache& TheCache() {
   static Cache& cache = *new Cache;  // outlives every thread
   return cache;
@@ -148,6 +152,14 @@ ShareList TryLoadShares() {
     QUARRY_PLATFORM_FAIL(kErrShareFile);
     return nullptr;
   }
+}
+
+void ShowMovingShares(bool show) {
+  moving_shown = show;
+}
+
+bool IsShown(const ShareRecord& share) {
+  return share.moved_from.empty() || moving_shown;
 }
 
 const ShareRecord* ShareHolding(const std::vector<ShareRecord>& shares, const std::string& path) {

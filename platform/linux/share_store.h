@@ -20,6 +20,10 @@ ShareList LoadShares();
 // The same without exceptions: null, with the platform's last error set, when the file is bad.
 ShareList TryLoadShares();
 
+// Whether the platform may say that there is this share: it is not on its way to another place, or
+// this process wants to know those, too.
+bool IsShown(const ShareRecord& share);
+
 // The deepest share that holds the absolute path, or null.
 const ShareRecord* ShareHolding(const std::vector<ShareRecord>& shares, const std::string& path);
 

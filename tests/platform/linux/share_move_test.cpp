@@ -10,6 +10,7 @@
 #include "common/paths.h"
 #include "platform/include/index_path.h"
 #include "platform/include/monitor.h"
+#include "platform/include/share.h"
 #include "platform/linux/path_name.h"
 #include "tests/platform/linux/share_fixture.h"
 
@@ -60,7 +61,7 @@ class ShareMoveTest : public ShareTest {
   // What MoveShare says to a move that it refuses.
   static std::string Refusal(const std::string& name, const std::string& new_path) {
     try {
-      MoveShare(name, new_path, "");
+      MoveShare(name, new_path);
     } catch (const Error& error) {
       return error.reason();
     }
@@ -72,7 +73,7 @@ TEST_F(ShareMoveTest, TheRecordFollows) {
   Add("first");
   ShareRecord old = AddMovedAway("old", "new");
   Add("last");
-  MoveShare("old", volume_ / "new", "");
+  MoveShare("old", volume_ / "new");
   const auto shares = ReadShares();
   ASSERT_EQ(shares.size(), 3U);
   EXPECT_EQ(shares[1].name, "new");
@@ -95,8 +96,8 @@ TEST_F(ShareMoveTest, LinesOfSnapshotAndQueueFollowInTheirOrder) {
   test::WriteFile(Queue(old.path), "{\"b\":1}\n");
   test::WriteFile(queue, "what an earlier attempt has left\n");
   test::WriteFile(queue + ".tmp", "that too\n");
-  MoveShare("old", volume_ / "new", "{\"rename\":1}");
-  EXPECT_EQ(test::ReadFile(queue), "{\"a\":1}\n{\"torn\n{\"b\":1}\n{\"rename\":1}\n");
+  MoveShare("old", volume_ / "new");
+  EXPECT_EQ(test::ReadFile(queue), "{\"a\":1}\n{\"torn\n{\"b\":1}\n");
   EXPECT_EQ(test::ListDir(RootedPath("/var/lib/quarry/queue")),
             std::vector<std::string>{NameForPath(volume_ / "new")});
 }
@@ -106,7 +107,7 @@ TEST_F(ShareMoveTest, LongQueuesFollowWhole) {
   std::string text;
   for (int i = 0; i < 20'000; ++i) text += "line " + std::to_string(i) + "\n";
   test::WriteFile(Queue(old.path), text);
-  MoveShare("old", volume_ / "new", "");
+  MoveShare("old", volume_ / "new");
   EXPECT_EQ(test::ReadFile(Queue(volume_ / "new")), text);
 }
 
@@ -117,7 +118,7 @@ TEST_F(ShareMoveTest, RegistrationsFollow) {
   Register("other", old_queue, volume_ / "older/b");
   Register("third", Queue(volume_ / "elsewhere"), volume_ / "elsewhere");
   const std::string new_queue = Queue(volume_ / "new");
-  MoveShare("old", volume_ / "new", "");
+  MoveShare("old", volume_ / "new");
   const std::vector<std::string> expected{
       "fileindex " + new_queue + " " + (volume_ / "new/a"),
       "other " + new_queue + " " + (volume_ / "older/b"),
@@ -127,7 +128,7 @@ TEST_F(ShareMoveTest, RegistrationsFollow) {
 
 TEST_F(ShareMoveTest, NothingHangsOnAShareThatIsNotIndexed) {
   const ShareRecord old = AddMovedAway("old", "new");
-  MoveShare("old", volume_ / "new", "");
+  MoveShare("old", volume_ / "new");
   EXPECT_EQ(test::ReadFile(Queue(volume_ / "new")), "");
   EXPECT_TRUE(Registrations().empty());
 }
@@ -148,9 +149,32 @@ TEST_F(ShareMoveTest, RefusalsChangeNothing) {
   EXPECT_EQ(test::ReadFile(Queue(old.path)), "{}\n");
 }
 
+TEST_F(ShareMoveTest, AShareOnItsWayIsKnownToWhoAsksForIt) {
+  const auto is_known = [this] {
+    TARNSHARE* share = nullptr;
+    const bool found = TARNShareGet("new", &share) == 0;
+    TARNShareFree(share);
+    char name[64];
+    char path[4096];
+    const std::string place = volume_ / "new/x";
+    const int held = TARNShareNamePathGet(place.c_str(), name, sizeof(name), path, sizeof(path));
+    EXPECT_EQ(found, held == 0);
+    return found;
+  };
+  AddMovedAway("old", "new");
+  MoveShare("old", volume_ / "new");
+  EXPECT_FALSE(is_known());
+  ShowMovingShares(true);
+  EXPECT_TRUE(is_known());
+  ShowMovingShares(false);
+  EXPECT_FALSE(is_known());
+  EndShareMove("new");
+  EXPECT_TRUE(is_known());
+}
+
 TEST_F(ShareMoveTest, OneMoveAtATime) {
   AddMovedAway("old", "new");
-  MoveShare("old", volume_ / "new", "");
+  MoveShare("old", volume_ / "new");
   test::MakeDirs(volume_ / "newer");
   EXPECT_NE(Refusal("new", volume_ / "newer").find("still on its way"), std::string::npos);
 }
@@ -181,7 +205,7 @@ TEST_F(ShareMoveTest, AForeignFileAmongTheRegistrationsIsLeft) {
   const ShareRecord old = AddMovedAway("old", "new");
   test::WriteFile(RootedPath("/var/lib/quarry/monitor/notes.json"), "no JSON");
   test::WriteFile(RootedPath("/var/lib/quarry/monitor/list.json"), "[]");
-  MoveShare("old", volume_ / "new", "");
+  MoveShare("old", volume_ / "new");
   EXPECT_EQ(test::ListDir(RootedPath("/var/lib/quarry/monitor")).size(), 2U);
 }
 
