@@ -1,6 +1,8 @@
 #include "fileindex/util/custom_event.h"
 
+#include <fcntl.h>
 #include <gmock/gmock.h>
+#include <sys/file.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
 #include <unistd.h>
@@ -17,6 +19,7 @@
 #include "common/json.h"
 #include "common/lock_file.h"
 #include "common/paths.h"
+#include "common/unique_fd.h"
 #include "fileindex/config/status_mgr.h"
 #include "fileindex/queue/event.h"
 #include "tests/fake_platform/fixture.h"
@@ -193,6 +196,11 @@ TEST_F(CustomEventTest, AWaitingReindexIsSeenWithoutTheLock) {
 }
 
 TEST_F(CustomEventTest, WritersDoNotMixTheirLines) {
+  // A pause that takes no time would not outlast another writer's turn.
+  fake::OnSleep([this](std::chrono::microseconds) {
+    const UniqueFd queue(open(queue_.c_str(), O_RDONLY | O_CLOEXEC));
+    EXPECT_EQ(flock(queue.get(), LOCK_EX), 0);
+  });
   std::vector<std::thread> threads;
   for (int i = 0; i < 4; ++i) {
     threads.emplace_back([i] {
