@@ -80,12 +80,21 @@ void OperationHandler::HandleAttributes(const std::string& path) {
   }
 }
 
-void OperationHandler::HandleRename(const std::string& new_path, const std::string& old_path) {
+void OperationHandler::MoveRenamed(const Operation& rename) {
+  const std::string path = Canonical(rename.path);
+  if (!path.empty()) MoveRenamed(path, Canonical(rename.old_path));
+}
+
+void OperationHandler::MoveRenamed(const std::string& new_path, const std::string& old_path) {
   const bool aside = old_path.empty() || tools_.survey.rules()->TouchesPaused(old_path) ||
                      tools_.survey.rules()->TouchesPaused(new_path);
   if (!aside && !PathsMeet(new_path, old_path)) {
     for (const auto& [to, from] : RenameRoots(new_path, old_path)) MoveDocuments(to, from);
   }
+}
+
+void OperationHandler::HandleRename(const std::string& new_path, const std::string& old_path) {
+  MoveRenamed(new_path, old_path);
   // Moving documents is only a short cut. What was missing at the old place, or has to change
   // because of the new one, is found by comparing.
   if (!old_path.empty()) reconciler_.Reconcile(old_path);

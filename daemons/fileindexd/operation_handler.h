@@ -28,6 +28,11 @@ class OperationHandler {
   // Hands what is to be done to the lane.
   void Handle(const Operation& operation);
 
+  // Moves the documents that a rename speaks of, and leaves the comparing to what follows. To be
+  // called for all renames of a pass before anything else: a walk that comes first would read anew
+  // what only has to be moved.
+  void MoveRenamed(const Operation& rename);
+
   // Brings the whole share in line with the disk, documents of no folder included.
   void HandleFullReindex();
 
@@ -38,6 +43,7 @@ class OperationHandler {
  private:
   void HandleIndex(const std::string& path);
   void HandleAttributes(const std::string& path);
+  void MoveRenamed(const std::string& new_path, const std::string& old_path);
   void HandleRename(const std::string& new_path, const std::string& old_path);
   std::vector<std::pair<std::string, std::string>> RenameRoots(const std::string& new_path,
                                                                const std::string& old_path) const;

@@ -62,10 +62,28 @@ class Pass {
   }
 
  private:
-  void Do(const Operations& taken) {
+  // Moves what was renamed. Returns what is left to do, in order: the places of a rename are still
+  // to be compared.
+  std::vector<Operation> MoveAhead(const Operations& taken) {
     std::vector<Operation> operations;
     for (const auto& op : taken) operations.push_back({op->op, op->node->GetPath(), op->src});
     FollowRenames(&operations);
+    std::vector<Operation> left;
+    for (const Operation& operation : operations) {
+      if (operation.kind != fileindex::OP_RENAME) {
+        left.push_back(operation);
+        continue;
+      }
+      handler_.MoveRenamed(operation);
+      if (!operation.old_path.empty())
+        left.push_back({fileindex::OP_REINDEX, operation.old_path, ""});
+      left.push_back({fileindex::OP_REINDEX, operation.path, ""});
+    }
+    return left;
+  }
+
+  void Do(const Operations& taken) {
+    const std::vector<Operation> operations = MoveAhead(taken);
     for (const Operation& operation : operations) setup_.progress.AddWaiting(operation.path);
     for (const Operation& operation : operations) {
       setup_.gate.Pass();

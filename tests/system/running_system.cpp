@@ -17,11 +17,11 @@ namespace {
 
 constexpr int kPatience = 60'000;
 
-std::string Program() {
+}  // namespace
+
+std::string RunningSystem::Program() {
   return Dirname(Dirname(RealPath("/proc/self/exe"))) + "/bin/quarry";
 }
-
-}  // namespace
 
 RunningSystem::RunningSystem() {
   ResetTestRoot();

@@ -31,6 +31,9 @@ class RunningSystem {
   void Stop();
   void Kill();
 
+  // The program that is tested.
+  static std::string Program();
+
   // Runs quarry to its end, at most a minute.
   Ran Quarry(const std::vector<std::string>& arguments) const;
   // The same with --json; the document it printed.

@@ -1,0 +1,233 @@
+// A share that gets another name or place is found there without a document read again, whatever is
+// killed on the way.
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <csignal>
+#include <filesystem>
+
+#include "cli/supervisor/child.h"
+#include "common/file_util.h"
+#include "platform/linux/share_registry.h"
+#include "tests/support/files.h"
+#include "tests/support/root.h"
+#include "tests/system/running_system.h"
+
+namespace quarry::test {
+namespace {
+
+constexpr int kFiles = 120;
+
+class ShareMovesTest : public testing::Test {
+ protected:
+  void SetUp() override {
+    for (int i = 0; i < kFiles; ++i) WriteFile(Path(i, docs_), "capybara");
+    std::filesystem::create_directory(system_.Files() + "/other");
+    system_.Start();
+    Run({"share", "add", docs_});
+    Run({"folder", "add", "/docs"});
+    ASSERT_TRUE(system_.WaitUntilIdle());
+    ASSERT_EQ(Found("capybara"), kFiles);
+    for (int i = 0; i < kFiles; ++i) Disguise(Path(i, docs_));
+  }
+  void TearDown() override { system_.Stop(); }
+
+  static std::string Path(int i, const std::string& share) {
+    return share + "/d" + std::to_string(i % 7) + "/f" + std::to_string(i) + ".txt";
+  }
+
+  // Another text that looks like the old one: only who reads the file sees it.
+  static void Disguise(const std::string& path) {
+    struct stat before {};
+    ASSERT_EQ(stat(path.c_str(), &before), 0);
+    WriteFile(path, "aardvark");
+    const timespec times[2] = {before.st_atim, before.st_mtim};
+    ASSERT_EQ(utimensat(AT_FDCWD, path.c_str(), times, 0), 0);
+  }
+
+  std::string Run(const std::vector<std::string>& arguments) {
+    const Ran ran = system_.Quarry(arguments);
+    EXPECT_EQ(ran.end, "exit code 0") << ran.output;
+    return ran.output;
+  }
+  // The sentence with which a command is refused.
+  std::string Refusal(const std::vector<std::string>& arguments) {
+    const Ran ran = system_.Quarry(arguments);
+    EXPECT_EQ(ran.end, "exit code 1") << ran.output;
+    return ran.output;
+  }
+
+  int Found(const std::string& word) {
+    return system_.QuarryJson({"search", word})["total"].asInt();
+  }
+
+  // Everything is in the index once, by its new path, and no file was read again.
+  void ExpectArrived(const std::string& share) {
+    ASSERT_TRUE(system_.WaitUntilIdle());
+    EXPECT_EQ(system_.Documents(share), Listing(share));
+    EXPECT_EQ(Found("capybara in:" + share), kFiles);
+    EXPECT_EQ(Found("aardvark"), 0);
+    const auto shares = platform::ReadShares();
+    ASSERT_EQ(shares.size(), 1U);
+    EXPECT_EQ(shares[0].path, share);
+    EXPECT_EQ(shares[0].moved_from, "");
+    EXPECT_EQ(ListDir(TestRoot() + "/var/lib/quarry/index").size(), 1U);
+    EXPECT_EQ(Registrations(), 1);
+    const std::vector<std::string> queues = ListDir(TestRoot() + "/var/lib/quarry/queue");
+    EXPECT_LE(queues.size(), 1U) << testing::PrintToString(queues);
+  }
+
+  // What is registered with the change monitor. A file that was being written when its writer was
+  // killed is not.
+  static std::ptrdiff_t Registrations() {
+    const std::vector<std::string> names = ListDir(TestRoot() + "/var/lib/quarry/monitor");
+    return std::count_if(names.begin(), names.end(), [](const std::string& name) {
+      return std::filesystem::path(name).extension() == ".json";
+    });
+  }
+
+  // Runs the command and kills it after so many milliseconds, or lets it end.
+  void Kill(const std::vector<std::string>& arguments, int milliseconds) {
+    cli::Child child(RunningSystem::Program(), arguments, system_.Files() + "/killed.log");
+    if (!child.WaitEnded(milliseconds)) child.Signal(SIGKILL);
+    ASSERT_TRUE(child.WaitEnded(60'000));
+  }
+
+  RunningSystem system_;
+  std::string docs_ = system_.Files() + "/docs";
+};
+
+TEST_F(ShareMovesTest, Renamed) {
+  const Json::Value done = system_.QuarryJson({"share", "rename", "docs", "papers"});
+  const std::string papers = system_.Files() + "/papers";
+  EXPECT_EQ(done["path"], papers);
+  EXPECT_EQ(done["old_name"], "docs");
+  EXPECT_FALSE(IsDirExist(docs_, false));
+  ExpectArrived(papers);
+  EXPECT_EQ(system_.QuarryJson({"folder", "list"})["folder"][0]["path"], "/papers");
+  // What happens afterwards is seen.
+  WriteFile(papers + "/new.txt", "armadillo");
+  Run({"folder", "reindex", "/papers"});
+  ASSERT_TRUE(system_.WaitUntilIdle());
+  EXPECT_EQ(Found("armadillo"), 1);
+}
+
+TEST_F(ShareMovesTest, RenamedAfterItsDirectory) {
+  std::filesystem::rename(docs_, system_.Files() + "/papers");
+  Run({"share", "rename", "docs", "papers"});
+  ExpectArrived(system_.Files() + "/papers");
+}
+
+TEST_F(ShareMovesTest, WaitingWorkComesAlong) {
+  Run({"pause"});
+  WriteFile(docs_ + "/d1/new.txt", "armadillo");
+  Run({"folder", "reindex", "/docs/d1"});
+  Run({"share", "rename", "docs", "papers"});
+  const Json::Value waiting = system_.QuarryJson({"queue", "show", "papers"});
+  bool carried = false;
+  for (const Json::Value& entry : waiting) {
+    carried = carried ||
+              (entry["operation"] == "reindex" && entry["path"] == system_.Files() + "/papers/d1");
+  }
+  EXPECT_TRUE(carried) << waiting.toStyledString();
+  Run({"resume"});
+  ExpectArrived(system_.Files() + "/papers");
+  EXPECT_EQ(Found("armadillo"), 1);
+}
+
+TEST_F(ShareMovesTest, APausedShareMovesToo) {
+  Run({"share", "pause", "docs"});
+  Run({"share", "rename", "docs", "papers"});
+  Run({"share", "migrate", "papers", system_.Files() + "/other"});
+  EXPECT_EQ(Found("capybara"), kFiles);
+  EXPECT_EQ(Registrations(), 0);
+  Run({"share", "resume", "papers"});
+  ExpectArrived(system_.Files() + "/other/papers");
+}
+
+TEST_F(ShareMovesTest, Migrated) {
+  const std::string other = system_.Files() + "/other";
+  Run({"share", "migrate", "docs", other + "/"});
+  EXPECT_FALSE(IsDirExist(docs_, false));
+  ExpectArrived(other + "/docs");
+}
+
+TEST_F(ShareMovesTest, MigratedToACopy) {
+  const std::string other = system_.Files() + "/other";
+  cli::Child copy("/bin/cp", {"-a", docs_, other + "/"}, system_.Files() + "/cp.log");
+  ASSERT_TRUE(copy.WaitEnded(60'000));
+  EXPECT_NE(Refusal({"share", "migrate", "docs", other}).find("is there already"),
+            std::string::npos);
+  Run({"share", "migrate", "docs", other, "--copied"});
+  EXPECT_TRUE(IsDirExist(docs_, false));
+  ExpectArrived(other + "/docs");
+}
+
+TEST_F(ShareMovesTest, RefusalsChangeNothing) {
+  const std::string files = system_.Files();
+  EXPECT_NE(Refusal({"share", "rename", "nobody", "x"}).find("no share named \"nobody\""),
+            std::string::npos);
+  EXPECT_NE(Refusal({"share", "rename", "docs", "docs"}).find("has that name already"),
+            std::string::npos);
+  EXPECT_NE(Refusal({"share", "rename", "docs", "a/b"}).find("no name for a share"),
+            std::string::npos);
+  EXPECT_NE(Refusal({"share", "rename", "docs", "other"}).find("is there already"),
+            std::string::npos);
+  EXPECT_NE(Refusal({"share", "migrate", "docs", files}).find("already"), std::string::npos);
+  EXPECT_NE(Refusal({"share", "migrate", "docs", files + "/none"}).find("Cannot open"),
+            std::string::npos);
+  EXPECT_NE(Refusal({"share", "migrate", "docs", docs_}).find("lies in the share itself"),
+            std::string::npos);
+  // Another file system than any in which files can be.
+  EXPECT_NE(Refusal({"share", "migrate", "docs", "/proc/sys"}).find("--copied"), std::string::npos);
+  EXPECT_NE(Refusal({"share", "migrate", "docs", files + "/other", "--copied"})
+                .find("There is no directory"),
+            std::string::npos);
+  ExpectArrived(docs_);
+  EXPECT_GT(system_.Pid("fileindexd"), 0);
+}
+
+TEST_F(ShareMovesTest, KilledAnywhereAndRunAgain) {
+  std::string from = "docs";
+  std::string to = "papers";
+  for (int milliseconds = 0; milliseconds < 200; milliseconds += 10) {
+    Kill({"share", "rename", from, to}, milliseconds);
+    const bool done =
+        platform::ReadShares()[0].name == to && platform::ReadShares()[0].moved_from.empty();
+    if (!done) Run({"share", "rename", from, to});
+    std::swap(from, to);
+  }
+  ExpectArrived(system_.Files() + "/" + from);
+}
+
+TEST_F(ShareMovesTest, MigrationKilledAnywhereAndRunAgain) {
+  std::string from = system_.Files();
+  std::string to = system_.Files() + "/other";
+  for (int milliseconds = 0; milliseconds < 200; milliseconds += 10) {
+    Kill({"share", "migrate", "docs", to}, milliseconds);
+    const platform::ShareRecord share = platform::ReadShares()[0];
+    if (share.path != to + "/docs" || !share.moved_from.empty()) {
+      Run({"share", "migrate", "docs", to});
+    }
+    std::swap(from, to);
+  }
+  ExpectArrived(from + "/docs");
+}
+
+TEST_F(ShareMovesTest, AShareThatIsNotIndexedNeedsNoSystem) {
+  Run({"folder", "delete", "/docs"});
+  system_.Stop();
+  Run({"share", "rename", "docs", "papers"});
+  EXPECT_TRUE(IsDirExist(system_.Files() + "/papers", false));
+  EXPECT_EQ(platform::ReadShares()[0].name, "papers");
+  EXPECT_EQ(ReadFile(TestRoot() + "/var/lib/quarry/queue/" +
+                     ListDir(TestRoot() + "/var/lib/quarry/queue").at(0)),
+            "");
+  system_.Start();
+}
+
+}  // namespace
+}  // namespace quarry::test
