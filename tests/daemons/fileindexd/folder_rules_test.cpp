@@ -6,7 +6,6 @@
 
 #include "common/file_util.h"
 #include "fileindex/config/folder_mgr.h"
-#include "platform/linux/share_registry.h"
 #include "tests/daemons/fileindexd/share_fixture.h"
 #include "tests/support/files.h"
 #include "tests/support/root.h"
@@ -75,7 +74,7 @@ TEST(FolderRulesTest, AgreesWithTheLibrary) {
   test::ResetTestRoot();
   const test::TempDir volume;
   test::MakeDirs(volume / "s");
-  platform::AddShare({"s", volume / "s"});
+  RegisterShare(volume / "s");
   std::mt19937 random(1);
   const auto random_path = [&random] {
     static const char* const kNames[] = {"a", "b", "ab", "a.txt", "b.mp3", "c.jpg", "d.mkv", "e.q"};

@@ -17,8 +17,8 @@
 #include "daemons/common/frame.h"
 #include "fileindex/config/folder_mgr.h"
 #include "fileindex/config/status_mgr.h"
-#include "platform/linux/share_registry.h"
 #include "tests/daemons/common/harness.h"
+#include "tests/daemons/fileindexd/share_fixture.h"
 #include "tests/support/files.h"
 #include "tests/support/root.h"
 #include "tests/support/temp_dir.h"
@@ -38,7 +38,7 @@ class IndexDaemonTest : public ::testing::Test {
     test::ResetTestRoot();
     for (const char* name : {"s", "t"}) {
       test::MakeDirs(volume_ / name);
-      platform::AddShare({.name = name, .path = volume_ / name});
+      RegisterShare(volume_ / name);
     }
     SaveFolders({"/s"});
   }

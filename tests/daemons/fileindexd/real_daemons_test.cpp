@@ -31,8 +31,8 @@
 #include "fileindex/index_mgr.h"
 #include "fileindex/queue/event.h"
 #include "fileindex/util/file_type.h"
-#include "platform/linux/share_registry.h"
 #include "tests/daemons/common/harness.h"
+#include "tests/daemons/fileindexd/share_fixture.h"
 #include "tests/support/files.h"
 #include "tests/support/root.h"
 #include "tests/support/temp_dir.h"
@@ -75,7 +75,7 @@ class RealDaemonsTest : public ::testing::Test {
   void SetUp() override {
     test::ResetTestRoot();
     test::MakeDirs(top_);
-    platform::AddShare({.name = "s", .path = top_});
+    RegisterShare(top_);
   }
 
   void StartAll() {

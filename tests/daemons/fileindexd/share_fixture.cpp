@@ -9,6 +9,7 @@
 #include "common/file_util.h"
 #include "common/json.h"
 #include "fileindex/util/util.h"
+#include "platform/linux/share_registry.h"
 
 namespace quarry::fileindexd {
 
@@ -24,6 +25,14 @@ FolderRule PausedFolder(const std::string& path) {
   FolderRule folder = Folder(path);
   folder.paused = true;
   return folder;
+}
+
+void RegisterShare(const std::string& path) {
+  platform::ShareRecord share;
+  share.name = Basename(path);
+  share.path = path;
+  share.recycle_bin = true;
+  platform::AddShare(share);
 }
 
 ShareFixture::ShareFixture()

@@ -30,6 +30,9 @@ FolderRule Folder(const std::string& path);
 FolderRule DocumentFolder(const std::string& path);
 FolderRule PausedFolder(const std::string& path);
 
+// Makes a share of the running platform known: a directory that ends in its name.
+void RegisterShare(const std::string& path);
+
 class ShareFixture : public ::testing::Test {
  protected:
   ShareFixture();

@@ -11,6 +11,7 @@
 #include "fileindex/config/folder_mgr.h"
 #include "fileindex/config/status_mgr.h"
 #include "platform/linux/share_registry.h"
+#include "tests/daemons/fileindexd/share_fixture.h"
 #include "tests/support/files.h"
 #include "tests/support/root.h"
 #include "tests/support/temp_dir.h"
@@ -27,7 +28,7 @@ class ShareHostTest : public ::testing::Test {
   void SetUp() override {
     test::ResetTestRoot();
     test::MakeDirs(volume_ / "s");
-    platform::AddShare({.name = "s", .path = volume_ / "s", .recycle_bin = true});
+    RegisterShare(volume_ / "s");
   }
 
   void SaveFolders(const std::vector<Folder>& folders) {
