@@ -7,7 +7,7 @@ build_packages=(
   libseccomp-dev libcli11-dev libedit-dev
 )
 # What the tests need beside them.
-test_packages=(libgtest-dev libgmock-dev)
+test_packages=(libgtest-dev libgmock-dev mandoc)
 
 # need_packages NAME... installs those that are missing. Asks nobody when none is, so that it works
 # without a network then.

@@ -67,6 +67,12 @@ build_with_cmake() {
   "$scratch/consumer/consumer" || fail "the program built with find_package"
 }
 
+check_documents() {
+  [[ $(place_of "$1" quarry.1) == */man/man1 ]] || fail "quarry.1 is in the wrong section"
+  [[ $(place_of "$1" fileindexd.8) == */man/man8 ]] || fail "fileindexd.8 is in the wrong section"
+  place_of "$1" state-files.md >/dev/null
+}
+
 # The installed supervisor brings up the installed engine, in a private system.
 run_system() {
   local programs=$1 name
@@ -88,6 +94,7 @@ staged=$scratch/staged
 DESTDIR=$staged "$cmake" --install "$build" >"$scratch/log" || fail "$(cat "$scratch/log")"
 libraries=$(place_of "$staged" libfileindex.so)
 check_libraries "$libraries"
+check_documents "$staged"
 build_with_pkg_config "$libraries"
 
 prefix=$scratch/prefix
