@@ -53,9 +53,9 @@ void PrintHit(std::ostream& out, const Json::Value& hit, unsigned int number, bo
   if (!snippet.empty()) out << "   " << snippet << '\n';
 }
 
-void SearchOnce(const std::string& query) {
+void SearchOnce(const SearchRequest& request) {
   try {
-    PrintHits(std::cout, Search({query, 0, 10}), 0, OutputIsTerminal());
+    PrintHits(std::cout, Search(request), request.offset, OutputIsTerminal());
   } catch (const Problem& problem) {
     std::cout << problem.what() << '\n';
   } catch (const Error& error) {
@@ -83,6 +83,7 @@ Json::Value Search(const SearchRequest& request) {
   Json::Value data;
   data["ids"] = Vec2JsonArr<std::string>(IndexedShares());
   data["query"] = request.query;
+  if (!request.inside.empty()) data["inside"] = request.inside;
   data["offset"] = request.offset;
   data["limit"] = request.limit;
   return AskEngine("search", data);
@@ -99,12 +100,16 @@ void PrintHits(std::ostream& out, const Json::Value& found, unsigned int offset,
     } else if (number < total) {
       out << number - offset << " of " << total << " shown.\n";
     }
+    for (const Json::Value& index : found["skipped"]) {
+      out << "The index " << Printable(index["id"].asString())
+          << " could not be searched: " << Printable(index["msg"].asString()) << '\n';
+    }
   } catch (const Json::Exception& failure) {
     throw Problem(std::string("The search engine's answer cannot be read: ") + failure.what());
   }
 }
 
-void SearchPrompt() {
+void SearchPrompt(const std::string& inside) {
   const bool terminal = isatty(STDIN_FILENO) == 1;
   if (terminal) std::cout << "Words to search, or Ctrl-D to end.\n";
   std::string line;
@@ -117,7 +122,7 @@ void SearchPrompt() {
     } else if (!std::getline(std::cin, line)) {
       break;
     }
-    if (line.find_first_not_of(" \t") != std::string::npos) SearchOnce(line);
+    if (line.find_first_not_of(" \t") != std::string::npos) SearchOnce({line, inside});
     std::cout.flush();
   }
   if (terminal) std::cout << '\n';

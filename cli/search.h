@@ -13,6 +13,7 @@ namespace quarry::cli {
 
 struct SearchRequest {
   std::string query;
+  std::string inside;  // only at and below this full path; everywhere when it is empty
   unsigned int offset = 0;
   unsigned int limit = 10;
 };
@@ -24,13 +25,13 @@ std::string QueryOf(const std::vector<std::string>& words);
 // The engine's answer: {"total", "hits": [...]}, over all indexed shares. Throws Problem or Error.
 Json::Value Search(const SearchRequest& request);
 
-// The hits for a person, numbered from `offset` + 1, and how many there are; matches are marked
-// where `colours` says so.
+// The hits for a person, numbered from `offset` + 1, how many there are, and which indexes could
+// not be searched; matches are marked where `colours` says so.
 void PrintHits(std::ostream& out, const Json::Value& found, unsigned int offset, bool colours);
 
-// Asks for words and shows hits until the end of the input. A search that fails is reported and the
-// next one asked for.
-void SearchPrompt();
+// Asks for words and shows hits at and below the full path `inside` until the end of the input. A
+// search that fails is reported and the next one asked for.
+void SearchPrompt(const std::string& inside);
 
 }  // namespace quarry::cli
 

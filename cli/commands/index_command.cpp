@@ -70,10 +70,11 @@ void Index(const std::string& argument, const std::vector<std::string>& words) {
   WaitUntilIndexed(place.folder);
   std::cerr << DocumentCount(place.share) << " documents in the index of " << Printable(place.share)
             << ", up to date after " << HumanDuration(SecondsSince(start)) << '\n';
+  const std::string inside = fileindex::GetFullPath(place.folder);
   if (words.empty()) {
-    SearchPrompt();
+    SearchPrompt(inside);
   } else {
-    PrintHits(std::cout, Search({QueryOf(words), 0, 10}), 0, OutputIsTerminal());
+    PrintHits(std::cout, Search({QueryOf(words), inside}), 0, OutputIsTerminal());
   }
 }
 

@@ -152,7 +152,7 @@ class Parser {
 
   static void CheckInside(QueryTerm* term) {
     if (term->text.front() != '/') FailSyntax("in: needs a full path, which begins with /.");
-    while (term->text.size() > 1 && term->text.back() == '/') term->text.pop_back();
+    term->text = InsideTerm(term->text).text;
   }
 
   static void CheckTypes(const QueryTerm& term) {
@@ -183,6 +183,14 @@ bool IsSearchable(const QueryTerm& term) {
 }
 
 }  // namespace
+
+QueryTerm InsideTerm(std::string_view path) {
+  while (path.size() > 1 && path.back() == '/') path.remove_suffix(1);
+  QueryTerm term;
+  term.kind = QueryTerm::Kind::kInside;
+  term.text = path;
+  return term;
+}
 
 Query ParseQuery(std::string_view text) {
   if (text.size() > kMaxQueryBytes) {

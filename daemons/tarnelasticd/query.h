@@ -50,6 +50,9 @@ constexpr std::size_t kMaxQueryTerms = 64;
 // Throws Error kQuerySyntax with a sentence for the person who typed.
 Query ParseQuery(std::string_view text);
 
+// What "in:" with `path` means, also for paths that cannot be typed.
+QueryTerm InsideTerm(std::string_view path);
+
 // Fills in what the index needs to know. Words without a letter or digit that are too short for a
 // file name are dropped. Throws Error kQuerySyntax when nothing is left.
 void Resolve(const TextTokenizer& tokenizer, Query* query);

@@ -135,6 +135,10 @@ std::vector<Ranked> MakePage(const SearchRequest& request, const Query& query,
 SearchRequest ParseSearchRequest(const Json::Value& data) {
   SearchRequest request;
   request.query = StringProperty(data, "query");
+  if (data.isMember("inside")) {
+    request.inside = NameProperty(data, "inside");
+    if (request.inside.front() != '/') FailMalformed("Not a full path: inside");
+  }
   request.offset =
       static_cast<std::size_t>(OptionalNumber(data, "offset", 0, kMaxSearchOffset).value_or(0));
   request.limit =
@@ -151,6 +155,7 @@ SearchRequest ParseSearchRequest(const Json::Value& data) {
 Json::Value Search(const SearchRequest& request, const std::vector<SearchedIndex>& indexes) {
   Query query = ParseQuery(request.query);
   if (!indexes.empty()) Resolve(indexes.front().reader->tokenizer(), &query);
+  if (!request.inside.empty()) query.groups.push_back({InsideTerm(request.inside)});
   const std::vector<const QueryTerm*> terms = RankedTerms(query);
   std::vector<Matches> matches;
   std::size_t total = 0;

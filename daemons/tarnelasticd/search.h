@@ -27,6 +27,7 @@ enum class SortOrder {
 
 struct SearchRequest {
   std::string query;
+  std::string inside;  // only at and below this full path, unless it is empty
   std::size_t offset = 0;
   std::size_t limit = 10;
   SortOrder sort = SortOrder::kDefault;

@@ -69,6 +69,12 @@ TEST(PrintHitsTest, SaysThatNothingWasFound) {
   EXPECT_EQ(Shown(R"({"total":0,"hits":[]})"), "Nothing found.\n");
 }
 
+TEST(PrintHitsTest, NamesAnIndexThatCouldNotBeSearched) {
+  EXPECT_EQ(
+      Shown(R"({"total":0,"hits":[],"skipped":[{"id":"fileindex_a","msg":"It is damaged."}]})"),
+      "Nothing found.\nThe index fileindex_a could not be searched: It is damaged.\n");
+}
+
 TEST(PrintHitsTest, RefusesAnswersOfAnotherShape) {
   for (const char* found : {R"([])", R"({"total":"many","hits":[]})", R"({"total":1,"hits":[7]})",
                             R"({"total":1,"hits":[{"path":[]}]})",

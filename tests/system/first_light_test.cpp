@@ -77,6 +77,10 @@ TEST_F(FirstLightTest, OneCommandIndexesAndSearches) {
   EXPECT_NE(first.output.find(docs_ + "/notes.md"), std::string::npos) << first.output;
   EXPECT_NE(first.output.find("9 documents"), std::string::npos) << first.output;
 
+  // Only what was named is searched.
+  const Ran below = system_.Quarry({"index", docs_ + "/deep", "--", "zeppelin"});
+  EXPECT_NE(below.output.find("Nothing found."), std::string::npos) << below.output;
+
   // The next run goes on where this one was, and sees what changed in between.
   WriteFile(docs_ + "/added.txt", "a brand new armadillo");
   WriteFile(docs_ + "/plain.txt", "the text is another one, about capybaras");

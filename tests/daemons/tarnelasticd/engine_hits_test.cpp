@@ -181,6 +181,22 @@ TEST_F(HitsTest, InMeansAPlaceAndAllBelowIt) {
   EXPECT_THAT(Paths("in:/s -in:/s/a"), ElementsAre("/s/a.b", "/s/ab"));
 }
 
+TEST_F(HitsTest, ASearchCanBeKeptToAPlaceThatCannotBeTyped) {
+  const std::string place = "/s/a \"b\"";
+  for (const std::string& path : {place + "/found.txt", std::string("/s/found.txt")}) {
+    Upsert(FileDocument(path));
+  }
+  Commit();
+  Json::Value more;
+  more["inside"] = place + "/";
+  EXPECT_THAT(Paths("found OR other", more), ElementsAre(place + "/found.txt"));
+  for (const char* inside : {"", "relative"}) {
+    EXPECT_EQ(
+        AskError("search", Parse(R"({"query":"found","inside":")" + std::string(inside) + "\"}")),
+        kMalformedRequest);
+  }
+}
+
 TEST_F(HitsTest, SnippetsComeFromTheTextThatHasTheWords) {
   Json::Value document = FileDocument("/s/1.txt", "nothing of interest in here");
   document["TARNMDDescription"] = "a harbour at dawn";
