@@ -9,6 +9,7 @@
 #include "daemons/common/log.h"
 #include "daemons/fileindexd/elastic_index.h"
 #include "daemons/fileindexd/failure.h"
+#include "daemons/fileindexd/stray_queues.h"
 #include "fileindex/config/folder_mgr.h"
 #include "fileindex/config/status_mgr.h"
 
@@ -16,6 +17,7 @@ namespace quarry::fileindexd {
 namespace {
 
 constexpr int kLastAnswersMs = 100;
+constexpr std::chrono::minutes kSweepEvery{1};
 
 daemon::SocketServerOptions ServerOptions() {
   daemon::SocketServerOptions options;
@@ -68,6 +70,7 @@ void IndexDaemon::Step(int timeout_ms) {
   FollowStatus();
   FollowFolders();
   workers_.Tend();
+  SweepQueues();
   server_->Step(timeout_ms);
 }
 
@@ -92,6 +95,14 @@ void IndexDaemon::ApplyPause() {
   paused_ = paused;
   daemon::LogInfo(paused ? "Indexing is paused" : "Indexing goes on");
   workers_.SetPaused(paused);
+}
+
+// Now and then is enough: what is queued for such shares is little, but never worked off.
+void IndexDaemon::SweepQueues() {
+  const auto now = std::chrono::steady_clock::now();
+  if (now < next_sweep_) return;
+  next_sweep_ = now + kSweepEvery;
+  Guarded("folder list", RemoveStrayQueues);
 }
 
 void IndexDaemon::SettingChanged(const std::string& share, bool is_upsert) {

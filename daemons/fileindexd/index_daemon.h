@@ -49,6 +49,7 @@ class IndexDaemon : private CommandTarget {
   void FollowFolders();
   void FollowStatus();
   void ApplyPause();
+  void SweepQueues();
 
   const std::size_t threads_;
   Slots slots_;
@@ -56,6 +57,7 @@ class IndexDaemon : private CommandTarget {
   FileWatch status_watch_;
   PauseState pause_;
   bool paused_ = false;
+  std::chrono::steady_clock::time_point next_sweep_{};
   WorkerTable workers_;
   std::unique_ptr<daemon::SocketServer> server_;
 };
