@@ -1,8 +1,9 @@
 #!/usr/bin/env bash
-# Compares the manual pages with what the programs say of themselves, and checks their form:
-#   manual_test.sh PROGRAMS PAGES    the folders of both
+# Compares the documentation with what the programs say of themselves and with the paths in the
+# sources, and checks the manual pages' form:
+#   manual_test.sh PROGRAMS SOURCES    the folders of both
 set -euo pipefail
-programs=$1 pages=$2
+programs=$1 sources=$2 pages=$2/docs/man
 status=0
 
 complain() {
@@ -58,6 +59,11 @@ done <<<"$all"
 for daemon in tarnelasticd tarncontentextractd fileindexd; do
   has_options "$pages/$daemon.8" "$programs/$daemon"
 done
+
+while read -r path; do
+  grep -qF "$path" "$sources/docs/state-files.md" || complain "state-files.md lacks $path"
+done < <(grep -rhoE --include='*.cpp' 'RootedPath\("/[^"]*[a-z]' \
+  "$sources"/{common,comm,fileindex,platform,daemons,cli} | cut -d'"' -f2)
 
 # Pages that are not installed here, other programs' as well as these, are not missing.
 for page in "$pages"/*.[1-9]; do
