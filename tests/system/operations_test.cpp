@@ -2,11 +2,13 @@
 
 #include <gtest/gtest.h>
 
+#include <csignal>
 #include <ctime>
 #include <filesystem>
 
 #include "cli/system.h"
 #include "common/file_util.h"
+#include "daemons/common/client.h"
 #include "fileindex/config/status_mgr.h"
 #include "tests/support/files.h"
 #include "tests/support/root.h"
@@ -60,10 +62,12 @@ class OperationsTest : public testing::Test {
   }
 
   // Nothing of any share is left on disk and in the engine.
-  static void ExpectGone() {
+  void ExpectGone() {
     EXPECT_EQ(Count("index"), 0U);
-    EXPECT_EQ(Count("monitor"), 0U);
-    EXPECT_EQ(Count("queue"), 0U);
+    EXPECT_EQ(system_.Registrations(), 0);
+    // A worker that was just looking at the queue may leave an empty one, until it is swept away.
+    const std::string queues = TestRoot() + "/var/lib/quarry/queue/";
+    for (const std::string& name : ListDir(queues)) EXPECT_EQ(ReadFile(queues + name), "");
     EXPECT_TRUE(EngineIndexes().empty());
   }
 
@@ -125,17 +129,26 @@ TEST_F(OperationsTest, APausedShareAnswersAndTakesNothing) {
   IndexDocs();
   Run({"share", "pause", "docs"});
   EXPECT_TRUE(EngineIndexes()[0]["paused"].asBool());
-  EXPECT_EQ(Count("monitor"), 0U);
+  EXPECT_EQ(system_.Registrations(), 0);
   EXPECT_TRUE(StatusSays("paused")) << Status();
   WriteFile(docs_ + "/a/new.txt", "armadillo");
   Run({"folder", "reindex", "/docs/a"});
   EXPECT_EQ(Found("capybara"), 2);
   EXPECT_EQ(system_.QuarryJson({"queue", "show", "docs"}).size(), 1U);
-  // A daemon that is started anew keeps the pause, too.
+  // Daemons that are started anew keep the pause, too.
+  for (const char* service : {"fileindexd", "tarnelasticd"}) {
+    const pid_t pid = system_.Pid(service);
+    kill(pid, SIGKILL);
+    ASSERT_TRUE(WaitUntil([&] { return system_.Pid(service) > 0 && system_.Pid(service) != pid; }));
+  }
+  ASSERT_TRUE(WaitUntil([] { return daemon::IsListening(cli::EngineSocket()); }));
+  EXPECT_TRUE(EngineIndexes()[0]["paused"].asBool());
+  EXPECT_EQ(Found("armadillo"), 0);
+  EXPECT_EQ(system_.QuarryJson({"queue", "show", "docs"}).size(), 1U);
   Run({"share", "resume", "docs"});
   ASSERT_TRUE(system_.WaitUntilIdle());
   EXPECT_EQ(Found("armadillo"), 1);
-  EXPECT_EQ(Count("monitor"), 1U);
+  EXPECT_EQ(system_.Registrations(), 1);
 }
 
 TEST_F(OperationsTest, AClearedShareIsGoneFromDisk) {
@@ -154,6 +167,31 @@ TEST_F(OperationsTest, AClearedShareIsGoneFromDisk) {
   Run({"folder", "add", "/docs"});
   ASSERT_TRUE(system_.WaitUntilIdle());
   EXPECT_EQ(Found("capybara"), 2);
+}
+
+TEST_F(OperationsTest, KilledAnywhereAndRunAgain) {
+  IndexDocs();
+  for (int milliseconds = 0; milliseconds < 80; milliseconds += 8) {
+    for (const char* command : {"pause", "resume"}) {
+      system_.KillQuarry({"share", command, "docs"}, milliseconds);
+      Run({"share", command, "docs"});
+    }
+  }
+  ASSERT_TRUE(system_.WaitUntilIdle());
+  EXPECT_EQ(system_.Documents(docs_), Listing(docs_));
+  for (int milliseconds = 0; milliseconds < 80; milliseconds += 8) {
+    Run({"share", "pause", "docs"});
+    system_.KillQuarry({"share", "clear", "docs"}, milliseconds);
+    if (!StatusSays("No folder")) Run({"share", "clear", "docs"});
+    ExpectGone();
+    Run({"folder", "add", "/docs"});
+    system_.KillQuarry({"folder", "delete", "/docs"}, milliseconds);
+    if (!StatusSays("No folder")) Run({"folder", "delete", "/docs"});
+    ExpectGone();
+    Run({"folder", "add", "/docs"});
+  }
+  ASSERT_TRUE(system_.WaitUntilIdle());
+  EXPECT_EQ(system_.Documents(docs_), Listing(docs_));
 }
 
 TEST_F(OperationsTest, AShareThatHasVanishedIsClearedByItsPath) {

@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <csignal>
 #include <filesystem>
 
@@ -53,6 +54,19 @@ Ran RunningSystem::Quarry(const std::vector<std::string>& arguments) const {
   cli::Child child(Program(), arguments, output);
   if (!child.WaitEnded(kPatience)) return {ReadFile(output), "does not end"};
   return {ReadFile(output), *child.Ended()};
+}
+
+void RunningSystem::KillQuarry(const std::vector<std::string>& arguments, int milliseconds) const {
+  cli::Child child(Program(), arguments, scratch_ / "killed.log");
+  if (!child.WaitEnded(milliseconds)) child.Signal(SIGKILL);
+  EXPECT_TRUE(child.WaitEnded(kPatience));
+}
+
+std::ptrdiff_t RunningSystem::Registrations() const {
+  const std::vector<std::string> names = ListDir(TestRoot() + "/var/lib/quarry/monitor");
+  return std::count_if(names.begin(), names.end(), [](const std::string& name) {
+    return std::filesystem::path(name).extension() == ".json";
+  });
 }
 
 Json::Value RunningSystem::QuarryJson(std::vector<std::string> arguments) const {

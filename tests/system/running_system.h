@@ -5,6 +5,7 @@
 
 #include <json/json.h>
 
+#include <cstddef>
 #include <optional>
 #include <set>
 #include <string>
@@ -36,7 +37,9 @@ class RunningSystem {
 
   // Runs quarry to its end, at most a minute.
   Ran Quarry(const std::vector<std::string>& arguments) const;
-  // The same with --json; the document it printed.
+  // Runs it and kills it after so many milliseconds, unless it has ended before.
+  void KillQuarry(const std::vector<std::string>& arguments, int milliseconds) const;
+  // The same as Quarry() with --json; the document it printed.
   Json::Value QuarryJson(std::vector<std::string> arguments) const;
 
   // Waits until no folder has anything waiting, at most a minute, and returns whether that came.
@@ -44,6 +47,10 @@ class RunningSystem {
 
   // The paths of all documents in the index of the share, each as often as it is there.
   std::multiset<std::string> Documents(const std::string& share_path) const;
+
+  // How many queues are registered with the change monitor. What was being written when its writer
+  // was killed does not count.
+  std::ptrdiff_t Registrations() const;
 
   // The process of a service, 0 when it does not run.
   pid_t Pid(const std::string& service) const;

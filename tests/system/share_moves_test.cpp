@@ -5,7 +5,6 @@
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 
-#include <algorithm>
 #include <csignal>
 #include <filesystem>
 
@@ -75,25 +74,9 @@ class ShareMovesTest : public testing::Test {
     EXPECT_EQ(shares[0].path, share);
     EXPECT_EQ(shares[0].moved_from, "");
     EXPECT_EQ(ListDir(TestRoot() + "/var/lib/quarry/index").size(), 1U);
-    EXPECT_EQ(Registrations(), 1);
+    EXPECT_EQ(system_.Registrations(), 1);
     const std::vector<std::string> queues = ListDir(TestRoot() + "/var/lib/quarry/queue");
     EXPECT_LE(queues.size(), 1U) << testing::PrintToString(queues);
-  }
-
-  // What is registered with the change monitor. A file that was being written when its writer was
-  // killed is not.
-  static std::ptrdiff_t Registrations() {
-    const std::vector<std::string> names = ListDir(TestRoot() + "/var/lib/quarry/monitor");
-    return std::count_if(names.begin(), names.end(), [](const std::string& name) {
-      return std::filesystem::path(name).extension() == ".json";
-    });
-  }
-
-  // Runs the command and kills it after so many milliseconds, or lets it end.
-  void Kill(const std::vector<std::string>& arguments, int milliseconds) {
-    cli::Child child(RunningSystem::Program(), arguments, system_.Files() + "/killed.log");
-    if (!child.WaitEnded(milliseconds)) child.Signal(SIGKILL);
-    ASSERT_TRUE(child.WaitEnded(60'000));
   }
 
   RunningSystem system_;
@@ -143,7 +126,7 @@ TEST_F(ShareMovesTest, APausedShareMovesToo) {
   Run({"share", "rename", "docs", "papers"});
   Run({"share", "migrate", "papers", system_.Files() + "/other"});
   EXPECT_EQ(Found("capybara"), kFiles);
-  EXPECT_EQ(Registrations(), 0);
+  EXPECT_EQ(system_.Registrations(), 0);
   Run({"share", "resume", "papers"});
   ExpectArrived(system_.Files() + "/other/papers");
 }
@@ -194,7 +177,7 @@ TEST_F(ShareMovesTest, KilledAnywhereAndRunAgain) {
   std::string from = "docs";
   std::string to = "papers";
   for (int milliseconds = 0; milliseconds < 200; milliseconds += 10) {
-    Kill({"share", "rename", from, to}, milliseconds);
+    system_.KillQuarry({"share", "rename", from, to}, milliseconds);
     const bool done =
         platform::ReadShares()[0].name == to && platform::ReadShares()[0].moved_from.empty();
     if (!done) Run({"share", "rename", from, to});
@@ -207,7 +190,7 @@ TEST_F(ShareMovesTest, MigrationKilledAnywhereAndRunAgain) {
   std::string from = system_.Files();
   std::string to = system_.Files() + "/other";
   for (int milliseconds = 0; milliseconds < 200; milliseconds += 10) {
-    Kill({"share", "migrate", "docs", to}, milliseconds);
+    system_.KillQuarry({"share", "migrate", "docs", to}, milliseconds);
     const platform::ShareRecord share = platform::ReadShares()[0];
     if (share.path != to + "/docs" || !share.moved_from.empty()) {
       Run({"share", "migrate", "docs", to});
