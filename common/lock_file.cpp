@@ -2,7 +2,6 @@
 
 #include <fcntl.h>
 #include <sys/file.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -10,6 +9,7 @@
 #include <cstring>
 
 #include "common/log.h"
+#include "common/named_file.h"
 #include "common/unique_fd.h"
 
 namespace quarry {
@@ -24,15 +24,6 @@ int OpenLockFile(const std::string& path) {
     return -1;
   }
   return open(path.c_str(), O_RDONLY | O_CREAT | O_CLOEXEC, 0644);
-}
-
-// Whoever removes a lock file while it is waited for leaves the waiter with a lock on a file that
-// nobody else can find, so that two would hold "the" lock.
-bool IsStillNamed(const std::string& path, int fd) {
-  struct stat opened {};
-  struct stat named {};
-  return fstat(fd, &opened) == 0 && stat(path.c_str(), &named) == 0 &&
-         opened.st_dev == named.st_dev && opened.st_ino == named.st_ino;
 }
 
 void SleepBeforeNextAttempt() {
@@ -56,6 +47,8 @@ LockFile::LockFile(const std::string& path, bool exclusive) : fd_(-1), path_(pat
       file.Reset();
       SleepBeforeNextAttempt();
     } else if (IsStillNamed(path_, file.get())) {
+      // Whoever removes a lock file while it is waited for leaves the waiter with a lock on a file
+      // that nobody else can find, so that two would hold "the" lock.
       fd_ = file.Release();
       errno = saved_errno;
       return;

@@ -1,5 +1,7 @@
 #include "fileindex/queue/queue_mgr.h"
 
+#include <fcntl.h>
+#include <sys/file.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -12,6 +14,8 @@
 #include "common/json.h"
 #include "common/lock_file.h"
 #include "common/log.h"
+#include "common/named_file.h"
+#include "common/unique_fd.h"
 #include "fileindex/queue/queue_reader.h"
 
 namespace quarry::fileindex {
@@ -51,7 +55,29 @@ void QueueMgr::PrepareTmpQueue() {
 }
 
 int QueueMgr::DeleteTmp() {
-  return unlink(queue_path_tmp_.c_str());
+  if (!seen_) return unlink(queue_path_tmp_.c_str());
+  if (!HoldSeenSnapshot()) return -1;
+  const int result = unlink(queue_path_tmp_.c_str());
+  // Not left to closing: a child of fork may have the same open file.
+  flock(seen_->get(), LOCK_UN);
+  if (result == 0) seen_.reset();
+  return result;
+}
+
+// Any process may make a snapshot once there is none, so the one at the name now may hold lines
+// that were never read here. The lock lets one at a time of those who have read the same snapshot
+// look and remove; nobody renames over a snapshot that exists. False with errno set when the
+// snapshot is not to be removed.
+bool QueueMgr::HoldSeenSnapshot() const {
+  if (seen_->valid()) {
+    while (flock(seen_->get(), LOCK_EX) != 0) {
+      if (errno != EINTR) return false;
+    }
+    if (IsStillNamed(queue_path_tmp_, seen_->get())) return true;
+    flock(seen_->get(), LOCK_UN);
+  }
+  errno = ENOENT;
+  return false;
 }
 
 std::shared_ptr<OPTree> QueueMgr::GetOPTree() const {
@@ -60,13 +86,21 @@ std::shared_ptr<OPTree> QueueMgr::GetOPTree() const {
 }
 
 std::shared_ptr<OPTree> QueueMgr::GetOPTreeTmp() const {
-  if (!op_tree_tmp_) op_tree_tmp_ = std::make_shared<OPTree>(queue_path_tmp_);
+  if (op_tree_tmp_) return op_tree_tmp_;
+  // Opened before the tree reads it: if it has its name when it is to be removed, it had it all the
+  // while, and is what was read.
+  seen_ = std::make_shared<const UniqueFd>(
+      open(queue_path_tmp_.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
+  op_tree_tmp_ = std::make_shared<OPTree>(queue_path_tmp_);
   return op_tree_tmp_;
 }
 
 std::int32_t QueueMgr::ProcessOP(std::function<void(std::shared_ptr<OP>)> fn, bool use_tmp) {
   if (use_tmp) PrepareTmpQueue();
-  if (!IsFileExist(use_tmp ? queue_path_tmp_ : queue_path_)) return 0;
+  if (!IsFileExist(use_tmp ? queue_path_tmp_ : queue_path_)) {
+    if (use_tmp) seen_ = std::make_shared<const UniqueFd>();
+    return 0;
+  }
   return (use_tmp ? GetOPTreeTmp() : GetOPTree())->ProcessOP(std::move(fn));
 }
 

@@ -14,6 +14,9 @@
 #include "fileindex/queue/optree.h"
 
 namespace quarry {
+
+class UniqueFd;
+
 namespace fileindex {
 
 // Keeps the trees that it has built: take a new manager for each pass over the queue. One thread at
@@ -32,7 +35,9 @@ class QUARRY_EXPORT QueueMgr {
   void PrepareTmpQueue();
 
   // Removes the snapshot: 0, or -1 with errno set. To be called once all its operations are
-  // applied.
+  // applied. Of a manager that has looked for a snapshot, only the one that it found is removed:
+  // when that is gone, or none was there, the result is -1 with ENOENT, and what others have put
+  // there since stays for another pass. May block while another process removes the same snapshot.
   int DeleteTmp();
 
   // The tree of the live queue, or of the snapshot, as the file was at the first call. Throws Error
@@ -67,11 +72,15 @@ class QUARRY_EXPORT QueueMgr {
 
   static bool FindQueue(TornLine torn, const std::string& path, const Predicate& predicate);
   bool FindInQueues(TornLine torn, const Predicate& predicate) const;
+  bool HoldSeenSnapshot() const;
 
   std::string queue_path_;
   std::string queue_path_tmp_;
   mutable std::shared_ptr<OPTree> op_tree_;
   mutable std::shared_ptr<OPTree> op_tree_tmp_;
+  // The snapshot that was found, kept open so that no later file can pass for it; without a
+  // descriptor when there was none. Null while nobody has looked.
+  mutable std::shared_ptr<const UniqueFd> seen_;
 };
 
 }  // namespace fileindex

@@ -1,0 +1,112 @@
+// Which snapshot a manager removes, when others have made and removed some in between.
+
+#include <gtest/gtest.h>
+
+#include <cerrno>
+#include <memory>
+#include <string>
+
+#include "fileindex/queue/queue_mgr.h"
+#include "tests/fake_platform/fixture.h"
+#include "tests/support/files.h"
+#include "tests/support/temp_dir.h"
+
+namespace quarry::fileindex {
+namespace {
+
+class SnapshotTest : public fake::FakePlatformTest {
+ protected:
+  void WriteLive(const std::string& path) const {
+    test::WriteFile(live_, R"({"event":2,"path":")" + path + "\"}\n");
+  }
+  std::string Process(QueueMgr& manager) const {
+    std::string paths;
+    manager.ProcessOP([&](std::shared_ptr<OP> op) { paths += op->node->GetPath(); }, true);
+    return paths;
+  }
+  void ExpectKept(QueueMgr& manager) const {
+    errno = 0;
+    EXPECT_EQ(manager.DeleteTmp(), -1);
+    EXPECT_EQ(errno, ENOENT);
+    EXPECT_EQ(test::ReadFile(tmp_).substr(0, 9), R"({"event":)");
+  }
+
+  test::TempDir dir_;
+  const std::string live_ = dir_.path() + "/queue";
+  const std::string tmp_ = live_ + ".tmp";
+};
+
+TEST_F(SnapshotTest, OneMadeAfterNoneWasFoundStays) {
+  QueueMgr idle(live_);
+  EXPECT_EQ(Process(idle), "");
+  WriteLive("/a");
+  QueueMgr(live_).PrepareTmpQueue();
+  ExpectKept(idle);
+  EXPECT_EQ(Process(idle), "/a");
+  EXPECT_EQ(idle.DeleteTmp(), 0);
+}
+
+TEST_F(SnapshotTest, OneInThePlaceOfTheProcessedOneStays) {
+  WriteLive("/a");
+  QueueMgr first(live_);
+  QueueMgr second(live_);
+  EXPECT_EQ(Process(first), "/a");
+  EXPECT_EQ(Process(second), "/a");
+  EXPECT_EQ(first.DeleteTmp(), 0);
+  WriteLive("/b");
+  QueueMgr third(live_);
+  EXPECT_EQ(Process(third), "/b");
+  ExpectKept(second);
+  ExpectKept(second);
+  EXPECT_EQ(third.DeleteTmp(), 0);
+}
+
+TEST_F(SnapshotTest, OneThatIsGoneIsReported) {
+  WriteLive("/a");
+  QueueMgr manager(live_);
+  EXPECT_EQ(Process(manager), "/a");
+  EXPECT_EQ(QueueMgr(live_).DeleteTmp(), 0);
+  EXPECT_EQ(manager.DeleteTmp(), -1);
+  EXPECT_EQ(errno, ENOENT);
+}
+
+TEST_F(SnapshotTest, ItIsTheSameHoweverOftenItIsRead) {
+  WriteLive("/a");
+  QueueMgr manager(live_);
+  EXPECT_EQ(Process(manager), "/a");
+  EXPECT_EQ(Process(manager), "/a");
+  EXPECT_EQ(manager.DeleteTmp(), 0);
+  EXPECT_EQ(manager.DeleteTmp(), -1);
+  EXPECT_EQ(errno, ENOENT);
+}
+
+TEST_F(SnapshotTest, RemovalWaitsThroughASignal) {
+  WriteLive("/a");
+  QueueMgr manager(live_);
+  EXPECT_EQ(Process(manager), "/a");
+  fake::FailSystemCall("flock", 1, EINTR);
+  EXPECT_EQ(manager.DeleteTmp(), 0);
+}
+
+TEST_F(SnapshotTest, OneThatCannotBeHeldStays) {
+  WriteLive("/a");
+  QueueMgr manager(live_);
+  EXPECT_EQ(Process(manager), "/a");
+  fake::FailSystemCall("flock", 1, ENOLCK);
+  EXPECT_EQ(manager.DeleteTmp(), -1);
+  EXPECT_EQ(errno, ENOLCK);
+  EXPECT_EQ(manager.DeleteTmp(), 0);
+}
+
+TEST_F(SnapshotTest, OneThatCannotBeRemovedMayBeTriedAgain) {
+  WriteLive("/a");
+  QueueMgr manager(live_);
+  EXPECT_EQ(Process(manager), "/a");
+  fake::FailSystemCall("unlink", 1, EACCES);
+  EXPECT_EQ(manager.DeleteTmp(), -1);
+  EXPECT_EQ(errno, EACCES);
+  EXPECT_EQ(manager.DeleteTmp(), 0);
+}
+
+}  // namespace
+}  // namespace quarry::fileindex
