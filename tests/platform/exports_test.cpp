@@ -13,6 +13,7 @@
 #include "platform/include/share.h"
 #include "platform/include/socket.h"
 #include "platform/include/user.h"
+#include "platform/linux/share_move.h"
 #include "platform/linux/share_registry.h"
 #include "tests/support/root.h"
 
@@ -48,8 +49,11 @@ TEST(PlatformLibraryTest, OffersEveryFunction) {
             15);
   EXPECT_EQ(CountOf(quarry::platform::ReadShares, quarry::platform::AddShare,
                     quarry::platform::RemoveShare, quarry::platform::ValidateShare,
-                    quarry::platform::ShareFilePath),
-            5);
+                    quarry::platform::ShareFilePath, quarry::platform::ReplaceSharePath,
+                    quarry::platform::EndShareMove, quarry::platform::MoveShare,
+                    quarry::platform::CleanUpShareMove, quarry::platform::ShowMovingShares,
+                    quarry::platform::MoveWatches, quarry::platform::RemoveQueue),
+            12);
 }
 
 TEST(PlatformLibraryTest, ItsErrorsCanBeCaught) {
