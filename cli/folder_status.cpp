@@ -23,7 +23,14 @@ Json::Value Numbers(const std::string& path, const Json::Value& report) {
   return numbers;
 }
 
+// A move that was cut short goes before everything else: nothing happens until it is ended.
+void RequireNoMove(const fileindex::Folder& folder) {
+  const std::string move = UnfinishedMove(platform::ReadShares(), folder.GetShare());
+  if (!move.empty()) throw Problem("its share is being moved; end that with: " + move);
+}
+
 std::string State(const fileindex::Folder& folder, const std::string& daemon_state) {
+  RequireNoMove(folder);
   if (folder.IsPaused()) return "paused";
   Json::Value status;
   folder.GetStatus(status);
@@ -31,17 +38,6 @@ std::string State(const fileindex::Folder& folder, const std::string& daemon_sta
   if (text == "error") return status["desc"].asString();
   // While work is queued the daemon knows better what becomes of it.
   return text == "processing" && daemon_state == "retrying" ? daemon_state : text;
-}
-
-// A share that was on its way to a new name or place when that was cut short is not known either.
-std::string WhyUnknown(const fileindex::Folder& folder, const Error& error) {
-  try {
-    const std::string move = UnfinishedMove(platform::ReadShares(), folder.GetShare());
-    if (!move.empty()) return "its share is being moved; end that with: " + move;
-  } catch (const Error&) {
-    // What the folder's own state says is nearer to the cause.
-  }
-  return Explain(error);
 }
 
 }  // namespace
@@ -60,9 +56,12 @@ Json::Value FolderStatus(const fileindex::Folder& folder, const Json::Value& rep
   status["path"] = folder.GetPath();
   try {
     status["state"] = State(folder, status["state"].asString());
+  } catch (const Problem& problem) {
+    status["state"] = "error";
+    status["last_error"] = problem.what();
   } catch (const Error& error) {
     status["state"] = "error";
-    status["last_error"] = WhyUnknown(folder, error);
+    status["last_error"] = Explain(error);
   }
   return status;
 }

@@ -10,6 +10,7 @@
 
 #include "cli/supervisor/child.h"
 #include "common/file_util.h"
+#include "platform/linux/share_move.h"
 #include "platform/linux/share_registry.h"
 #include "tests/support/files.h"
 #include "tests/support/root.h"
@@ -198,6 +199,25 @@ TEST_F(ShareMovesTest, MigrationKilledAnywhereAndRunAgain) {
     std::swap(from, to);
   }
   ExpectArrived(from + "/docs");
+}
+
+// What a kill right after the share's record was replaced leaves: directory, record and queue are
+// at the new place, everything else is not.
+TEST_F(ShareMovesTest, AMoveThatWasCutShortIsNamedAndEnded) {
+  const std::string papers = system_.Files() + "/papers";
+  Run({"share", "pause", "docs"});
+  std::filesystem::rename(docs_, papers);
+  platform::MoveShare("docs", papers);
+  const std::string command = "quarry share rename docs papers";
+  EXPECT_NE(Run({"status"}).find(command), std::string::npos);
+  EXPECT_NE(Run({"share", "list"}).find(command), std::string::npos);
+  for (const char* word : {"pause", "remove"}) {
+    EXPECT_NE(Refusal({"share", word, "papers"}).find(command), std::string::npos) << word;
+  }
+  EXPECT_NE(Refusal({"share", "rename", "papers", "more"}).find(command), std::string::npos);
+  Run({"share", "rename", "docs", "papers"});
+  Run({"share", "resume", "papers"});
+  ExpectArrived(papers);
 }
 
 TEST_F(ShareMovesTest, AShareThatIsNotIndexedNeedsNoSystem) {
