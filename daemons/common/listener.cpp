@@ -1,10 +1,12 @@
 #include "daemons/common/listener.h"
 
+#include <fcntl.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
+#include <filesystem>
 
 #include "common/error.h"
 #include "daemons/common/socket_address.h"
@@ -36,10 +38,21 @@ void RemoveStaleSocket(const std::string& path) {
   if (unlink(path.c_str()) != 0 && errno != ENOENT) ThrowSystemError("Cannot remove " + path);
 }
 
+std::string DirectoryOf(const std::string& path) {
+  const std::filesystem::path parent = std::filesystem::path(path).parent_path();
+  return parent.empty() ? "." : parent.string();
+}
+
+// The address is short whatever the directory's path.
+bool Bind(int fd, int dir, const std::string& name) {
+  const sockaddr_un address = SocketAddress("/proc/self/fd/" + std::to_string(dir) + "/" + name);
+  return bind(fd, reinterpret_cast<const sockaddr*>(&address), sizeof(address)) == 0;
+}
+
 }  // namespace
 
 Listener::Listener(const std::string& path) : path_(path) {
-  const sockaddr_un address = SocketAddress(path);
+  CheckSocketPath(path);
   MakeParentDirectories(path);
   RemoveStaleSocket(path);
   fd_.Reset(socket(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
@@ -48,19 +61,30 @@ Listener::Listener(const std::string& path) : path_(path) {
   if (!fd_.valid() || fchmod(fd_.get(), kSocketMode) != 0) {
     ThrowSystemError("Cannot make a socket");
   }
-  if (bind(fd_.get(), reinterpret_cast<const sockaddr*>(&address), sizeof(address)) != 0) {
+  const UniqueFd dir(open(DirectoryOf(path).c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+  const std::string name = "." + std::to_string(getpid()) + "-" + std::to_string(fd_.get());
+  if (!dir.valid() || !Bind(fd_.get(), dir.get(), name)) {
     ThrowSystemError("Cannot listen at " + path);
   }
+  const bool listening = ListenAs(dir.get(), name);
+  const int saved = errno;
+  unlinkat(dir.get(), name.c_str(), 0);
+  errno = saved;
+  if (!listening) ThrowSystemError("Cannot listen at " + path);
+}
+
+// The path is given to the socket when somebody listens there: who finds it can connect. It is not
+// taken from anybody who was faster.
+bool Listener::ListenAs(int dir, const std::string& name) {
   struct stat info {};
-  if (chmod(path.c_str(), kSocketMode) != 0 || lstat(path.c_str(), &info) != 0 ||
-      listen(fd_.get(), SOMAXCONN) != 0) {
-    const int saved = errno;
-    unlink(path.c_str());
-    errno = saved;
-    ThrowSystemError("Cannot listen at " + path);
+  if (fchmodat(dir, name.c_str(), kSocketMode, 0) != 0 || listen(fd_.get(), SOMAXCONN) != 0 ||
+      fstatat(dir, name.c_str(), &info, AT_SYMLINK_NOFOLLOW) != 0 ||
+      linkat(dir, name.c_str(), AT_FDCWD, path_.c_str(), 0) != 0) {
+    return false;
   }
   device_ = info.st_dev;
   inode_ = info.st_ino;
+  return true;
 }
 
 Listener::~Listener() {

@@ -30,6 +30,8 @@ class Listener {
   UniqueFd Accept();
 
  private:
+  bool ListenAs(int dir, const std::string& name);
+
   std::string path_;
   UniqueFd fd_;
   dev_t device_ = 0;

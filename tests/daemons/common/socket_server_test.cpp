@@ -443,6 +443,29 @@ TEST(SocketServerPlaceTest, SocketHasMode0660WhateverTheUmask) {
   }
 }
 
+// Who waits for the file to appear must not be turned away by it.
+TEST(SocketServerPlaceTest, TheFileAppearsWhenSomebodyListens) {
+  TempDir dir;
+  const auto path = [&](int i) { return dir / std::to_string(i); };
+  constexpr int kTimes = 300;
+  std::atomic<int> connected{0};
+  int refused = 0;
+  std::thread client([&] {
+    for (int i = 0; i < kTimes; i = connected) {
+      const int result = ProbeSocket(path(i));
+      if (result == 0) ++connected;
+      if (result != 0 && result != ENOENT) ++refused;
+    }
+  });
+  for (int i = 0; i < kTimes; ++i) {
+    const SocketServer server(path(i), Echo);
+    while (connected <= i) std::this_thread::yield();
+  }
+  client.join();
+  EXPECT_EQ(refused, 0);
+  EXPECT_EQ(test::ListDir(dir.path()).size(), 0u);
+}
+
 TEST(SocketServerPlaceTest, MakesMissingDirectoriesAndRemovesItsFile) {
   TempDir dir;
   {
