@@ -1,5 +1,7 @@
 #include "cli/commands/commands.h"
 #include "cli/system.h"
+#include "common/lock_file.h"
+#include "common/paths.h"
 #include "fileindex/index_mgr.h"
 
 namespace quarry::cli {
@@ -14,7 +16,11 @@ void AddRunCommand(CLI::App& app) {
   CLI::App* prepare =
       app.add_subcommand("prepare-services", "Start or stop the services as the folder list needs");
   prepare->group("");
-  prepare->callback([] { fileindex::PrepareServices(); });
+  prepare->callback([] {
+    // A folder that is being added meanwhile starts the services, which an older list would stop.
+    const LockFile lock(RootedPath("/tmp/quarry_cfg_folder.lock"), true);
+    fileindex::PrepareServices();
+  });
 }
 
 }  // namespace quarry::cli
