@@ -107,8 +107,8 @@ void Worker::RefreshLayout() {
   }
 }
 
-// While a folder was paused nobody watched it. And the event of a folder that changes is not queued
-// while a reindex waits, be it the one that the pass has just gone over by the old folders.
+// While a folder was paused nobody watched it. And a pass under which the folders change has judged
+// by the old ones, in part.
 bool Worker::MustCompareAfter(const FolderRules& now) const {
   return HasNewlyActive(*layout_.rules, now) || (pass_began_ && now != *layout_.rules);
 }

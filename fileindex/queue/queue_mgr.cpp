@@ -34,6 +34,31 @@ bool IsAtOrBelow(const std::string& path, const std::string& directory) {
   return StringStartWith(path + "/", directory + "/");
 }
 
+// Whoever hands out what a snapshot holds has it locked against writing, which nobody else does: a
+// lock of the open file, so that it ends with the manager, or with the process.
+struct flock WholeFile(short type) {
+  struct flock lock {};
+  lock.l_type = type;
+  lock.l_whence = SEEK_SET;
+  return lock;
+}
+
+void Claim(int fd) {
+  struct flock lock = WholeFile(F_RDLCK);
+  const int saved_errno = errno;
+  fcntl(fd, F_OFD_SETLK, &lock);
+  errno = saved_errno;
+}
+
+bool IsClaimed(const std::string& path) {
+  const int saved_errno = errno;
+  const UniqueFd file(open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
+  struct flock lock = WholeFile(F_WRLCK);
+  const bool claimed = fcntl(file.get(), F_OFD_GETLK, &lock) == 0 && lock.l_type != F_UNLCK;
+  errno = saved_errno;
+  return claimed;
+}
+
 bool IsJson(const std::string& text) {
   Json::Value ignored;
   return fromString(ignored, text);
@@ -101,7 +126,10 @@ std::int32_t QueueMgr::ProcessOP(std::function<void(std::shared_ptr<OP>)> fn, bo
     if (use_tmp) seen_ = std::make_shared<const UniqueFd>();
     return 0;
   }
-  return (use_tmp ? GetOPTreeTmp() : GetOPTree())->ProcessOP(std::move(fn));
+  if (!use_tmp) return GetOPTree()->ProcessOP(std::move(fn));
+  const std::shared_ptr<OPTree> tree = GetOPTreeTmp();
+  if (seen_) Claim(seen_->get());
+  return tree->ProcessOP(std::move(fn));
 }
 
 bool QueueMgr::FindQueue(TornLine torn, const std::string& path, const Predicate& predicate) {
@@ -121,12 +149,13 @@ bool QueueMgr::FindQueue(TornLine torn, const std::string& path, const Predicate
   return false;
 }
 
-bool QueueMgr::FindInQueues(TornLine torn, const Predicate& predicate) const {
-  return FindQueue(torn, queue_path_, predicate) || FindQueue(torn, queue_path_tmp_, predicate);
+bool QueueMgr::FindInQueues(const Predicate& predicate) const {
+  return FindQueue(TornLine::kIsMalformed, queue_path_, predicate) ||
+         FindQueue(TornLine::kIsMalformed, queue_path_tmp_, predicate);
 }
 
 bool QueueMgr::IsFullPathProcessing(const std::string& full_path) {
-  return FindInQueues(TornLine::kIsMalformed, [&full_path](const std::shared_ptr<Event>& event) {
+  return FindInQueues([&full_path](const std::shared_ptr<Event>& event) {
     if (IsAtOrBelow(event->path, full_path)) return true;
     // What is moved away is still indexed under its old path until the rename has been applied.
     return (event->op & EVENT_RENAME) != 0 && !event->path_old.empty() &&
@@ -135,15 +164,20 @@ bool QueueMgr::IsFullPathProcessing(const std::string& full_path) {
 }
 
 bool QueueMgr::IsFullPathHasReindex(const std::string& full_path) {
-  return FindInQueues(TornLine::kIsMalformed, [&full_path](const std::shared_ptr<Event>& event) {
+  return FindInQueues([&full_path](const std::shared_ptr<Event>& event) {
     return event->op == EVENT_REINDEX && IsAtOrBelow(event->path, full_path);
   });
 }
 
 bool QueueMgr::IsReindexWaitingFor(const std::string& full_path) {
-  return FindInQueues(TornLine::kIsNone, [&full_path](const std::shared_ptr<Event>& event) {
+  const Predicate covers = [&full_path](const std::shared_ptr<Event>& event) {
     return event->op == EVENT_REINDEX && IsAtOrBelow(full_path, event->path);
-  });
+  };
+  if (FindQueue(TornLine::kIsNone, queue_path_, covers)) return true;
+  // One that is being worked on may have been at the path already. Asked before reading: what is
+  // claimed from now on has not.
+  const bool is_in_work = IsClaimed(queue_path_tmp_);
+  return FindQueue(TornLine::kIsNone, queue_path_tmp_, covers) && !is_in_work;
 }
 
 }  // namespace quarry::fileindex

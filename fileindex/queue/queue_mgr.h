@@ -61,8 +61,9 @@ class QUARRY_EXPORT QueueMgr {
   bool IsFullPathHasReindex(const std::string& full_path);
 
   // Whether a reindex, and nothing else in the same line, is waiting on `full_path` or above it:
-  // one that will cover the path. A last line that is not ended and no event is none yet: it is
-  // being written, or its writer was killed.
+  // one that will cover the path. Those of a snapshot that a living manager, of any process, has
+  // handed out by ProcessOP() and not removed are no longer waiting. A last line that is not ended
+  // and no event is none yet: it is being written, or its writer was killed.
   bool IsReindexWaitingFor(const std::string& full_path);
 
  private:
@@ -71,7 +72,7 @@ class QUARRY_EXPORT QueueMgr {
   enum class TornLine { kIsMalformed, kIsNone };
 
   static bool FindQueue(TornLine torn, const std::string& path, const Predicate& predicate);
-  bool FindInQueues(TornLine torn, const Predicate& predicate) const;
+  bool FindInQueues(const Predicate& predicate) const;
   bool HoldSeenSnapshot() const;
 
   std::string queue_path_;

@@ -2,10 +2,13 @@
 
 #include <fcntl.h>
 #include <gmock/gmock.h>
+#include <sched.h>
 #include <sys/file.h>
 
 #include <array>
 #include <atomic>
+#include <chrono>
+#include <cstring>
 #include <memory>
 #include <string>
 #include <vector>
@@ -45,6 +48,9 @@ struct Board {
   std::atomic<int> refused{0};  // for an unfinished line before theirs
   std::atomic<int> passes{0};
   std::atomic<int> consumers{0};  // started
+  // What each writer has last changed, and what was last found when its place was looked at.
+  std::array<std::atomic<size_t>, kWriters> changed{};
+  std::array<std::atomic<size_t>, kWriters> found{};
 };
 
 // How the processes of one run behave.
@@ -180,6 +186,50 @@ class QueueTest : public fake::FakePlatformTest {
     }
   }
 
+  // ---- Places that are looked at
+
+  // Changes its place and says so, again and again, and each time waits for it to be looked at.
+  void ChangePlace(size_t writer, std::mt19937& random) {
+    const std::string place = "/volume1/photo/" + std::to_string(writer);
+    for (size_t i = 1; i <= LinesEach() / 4 && !board_->complaints.Any(); ++i) {
+      board_->changed[writer] = i;
+      if (test::Draw(random, 0, 1) == 0) {
+        test::DoLocked([&] { AddCustomEvent(EVENT_REINDEX, place, "", Json::Value()); });
+      } else {
+        const Json::Value kinds(Json::objectValue);
+        test::DoLocked([&] { AddCustomEvent(EVENT_UPDATE_CFG, place + "/below", "", kinds); });
+      }
+      AwaitLook(writer, i);
+      test::ForgetRecords();
+    }
+  }
+
+  void AwaitLook(size_t writer, size_t change) {
+    const auto end = std::chrono::steady_clock::now() + std::chrono::minutes(1);
+    while (board_->found[writer] < change && !board_->complaints.Any()) {
+      if (std::chrono::steady_clock::now() > end) {
+        board_->complaints.Add("a change was never looked at: " + std::to_string(change));
+      }
+      sched_yield();
+    }
+  }
+
+  void LookAtPlaces() {
+    while (!board_->stop && !board_->complaints.Any()) {
+      QueueMgr queue(queue_);
+      const auto look = [this](const std::shared_ptr<OP>& op) {
+        const std::string place = op->node->GetPath().substr(std::strlen("/volume1/photo/"));
+        const size_t writer = std::stoul(place);
+        board_->found.at(writer) = board_->changed.at(writer).load();
+      };
+      test::DoLocked([&] { queue.ProcessOP(look, true); });
+      // Whoever waited for that look may go on before the snapshot is removed.
+      for (int i = 0; i < 20; ++i) sched_yield();
+      queue.DeleteTmp();
+      test::ForgetRecords();
+    }
+  }
+
   // ---- The outcome
 
   // Calls `check` for every line.
@@ -228,6 +278,20 @@ TEST_F(QueueTest, NoneIsLostWhenConsumersAreKilledOrMeet) {
     EXPECT_TRUE(line.written);
     EXPECT_GE(line.processed, 1);
   });
+}
+
+TEST_F(QueueTest, NoChangeIsCoveredByAReindexThatCameBeforeIt) {
+  test::Crew crew(board_->complaints);
+  const size_t consumer = crew.Start([this](std::mt19937&) { LookAtPlaces(); });
+  std::vector<size_t> writers;
+  for (size_t i = 0; i < kWriters; ++i) {
+    writers.push_back(crew.Start([this, i](std::mt19937& random) { ChangePlace(i, random); }));
+  }
+  crew.Finish(writers);
+  board_->stop = true;
+  crew.Finish({consumer});
+  EXPECT_EQ(board_->complaints.Text(), "");
+  for (const auto& found : board_->found) EXPECT_EQ(found, LinesEach() / 4);
 }
 
 }  // namespace

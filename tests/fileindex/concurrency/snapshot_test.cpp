@@ -1,4 +1,5 @@
-// Which snapshot a manager removes, when others have made and removed some in between.
+// What a snapshot is while it is being worked off, and which one a manager removes when others have
+// made and removed some in between.
 
 #include <gtest/gtest.h>
 
@@ -6,6 +7,7 @@
 #include <memory>
 #include <string>
 
+#include "common/error.h"
 #include "fileindex/queue/queue_mgr.h"
 #include "tests/fake_platform/fixture.h"
 #include "tests/support/files.h"
@@ -106,6 +108,64 @@ TEST_F(SnapshotTest, OneThatCannotBeRemovedMayBeTriedAgain) {
   EXPECT_EQ(manager.DeleteTmp(), -1);
   EXPECT_EQ(errno, EACCES);
   EXPECT_EQ(manager.DeleteTmp(), 0);
+}
+
+// ---- Whether a reindex is still waiting
+
+class ReindexInWorkTest : public SnapshotTest {
+ protected:
+  ReindexInWorkTest() {
+    test::WriteFile(live_, R"({"event":65536,"path":"/s"})"
+                           "\n");
+  }
+  bool IsWaiting() const { return QueueMgr(live_).IsReindexWaitingFor("/s/a"); }
+};
+
+TEST_F(ReindexInWorkTest, ItWaitsUntilItIsHandedOut) {
+  EXPECT_TRUE(IsWaiting());
+  QueueMgr manager(live_);
+  manager.PrepareTmpQueue();
+  EXPECT_TRUE(IsWaiting());
+  manager.GetOPTreeTmp();
+  EXPECT_TRUE(IsWaiting());
+  bool in_work = true;
+  manager.ProcessOP([&](std::shared_ptr<OP>) { in_work = !IsWaiting(); }, true);
+  EXPECT_TRUE(in_work);
+  EXPECT_FALSE(IsWaiting());
+  EXPECT_TRUE(QueueMgr(live_).IsFullPathHasReindex("/s"));
+  EXPECT_EQ(manager.DeleteTmp(), 0);
+  EXPECT_FALSE(IsWaiting());
+}
+
+TEST_F(ReindexInWorkTest, ItWaitsAgainWhenThePassWasBrokenOff) {
+  { EXPECT_EQ(Process(*std::make_unique<QueueMgr>(live_)), "/s"); }
+  EXPECT_TRUE(IsWaiting());
+}
+
+TEST_F(ReindexInWorkTest, AnotherOneWaitsInTheLiveQueue) {
+  QueueMgr manager(live_);
+  EXPECT_EQ(Process(manager), "/s");
+  EXPECT_FALSE(IsWaiting());
+  test::WriteFile(live_, R"({"event":65536,"path":"/s/a"})");
+  EXPECT_TRUE(IsWaiting());
+}
+
+TEST_F(ReindexInWorkTest, OneThatIsOnlyLookedAtWaits) {
+  QueueMgr manager(live_);
+  manager.ProcessOP([this](std::shared_ptr<OP>) { EXPECT_TRUE(IsWaiting()); }, false);
+  EXPECT_TRUE(IsWaiting());
+}
+
+TEST_F(ReindexInWorkTest, AMalformedLineIsAnErrorThen) {
+  test::WriteFile(live_, "rubbish\n" + test::ReadFile(live_));
+  QueueMgr manager(live_);
+  EXPECT_EQ(Process(manager), "/s");
+  try {
+    IsWaiting();
+    ADD_FAILURE() << "nothing thrown";
+  } catch (const Error& error) {
+    EXPECT_EQ(error.code(), 906);
+  }
 }
 
 }  // namespace
