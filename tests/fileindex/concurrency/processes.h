@@ -87,11 +87,12 @@ class Complaints {
   std::array<char, 2000> text_{};
 };
 
-// The library's pauses, which the stand-in platform leaves out, at a thousandth of their length:
-// without any, all attempts at a lock would be over before its holder has had a turn.
+// The library's pauses, which the stand-in platform leaves out, at a hundredth of their length.
+// Without any, all attempts at a lock would be over before its holder has had a turn; and with
+// shorter ones those who wait would take a busy machine's time from the one they wait for.
 inline void PauseBriefly() {
   fake::OnSleep([](std::chrono::microseconds length) {
-    const timespec brief{0, static_cast<long>(length.count())};
+    const timespec brief{0, static_cast<long>(length.count()) * 10};
     clock_nanosleep(CLOCK_MONOTONIC, 0, &brief, nullptr);
   });
 }
@@ -195,6 +196,7 @@ class Crew {
     try {
       srand(seed);  // else all would pause for the same time
       PauseBriefly();
+      fake::SkipSync();
       std::mt19937 random(seed);
       work(random);
     } catch (const std::exception& error) {
