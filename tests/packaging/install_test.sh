@@ -83,7 +83,7 @@ run_system() {
     fail "the unit does not start the installed daemon"
   "$programs/quarry" run 2>"$scratch/log" &
   supervisor=$!
-  timeout 60 bash -c "until '$programs/quarry' status >/dev/null 2>&1; do
+  timeout 60 bash -c "until '$programs/quarry' status --json | grep -q '\"state\" : \"running\"'; do
                         kill -0 $supervisor || exit 1; done" || fail "quarry: $(cat "$scratch/log")"
   kill "$supervisor"
   wait "$supervisor" || fail "quarry run: $(cat "$scratch/log")"
