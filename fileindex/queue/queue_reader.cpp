@@ -36,12 +36,15 @@ bool QueueReader::Next(std::string& line) {
 }
 
 bool QueueReader::Fill() {
-  if (failed_) return false;
+  // Once the end was met it stays: what is appended to a live queue now may be the rest of a line
+  // that was handed out.
+  if (failed_ || at_end_) return false;
   ssize_t count;
   do {
     count = read(fd_.get(), buffer_.data(), buffer_.size());
   } while (count < 0 && errno == EINTR);
   failed_ = count < 0;
+  at_end_ = count == 0;
   begin_ = 0;
   end_ = count > 0 ? static_cast<size_t>(count) : 0;
   return count > 0;

@@ -16,7 +16,8 @@ class QueueReader {
   explicit QueueReader(const std::string& path);
 
   // The next line without its newline, of any bytes and any length; the last one need not be ended.
-  // False at the end of the file, and when reading fails: then failed() is true and errno says why.
+  // False at the end of the file, also if it grows thereafter, and when reading fails: then
+  // failed() is true and errno says why.
   bool Next(std::string& line);
 
   bool failed() const { return failed_; }
@@ -29,6 +30,7 @@ class QueueReader {
 
   UniqueFd fd_;
   bool failed_;
+  bool at_end_ = false;
   bool line_ended_ = false;
   std::vector<char> buffer_;
   size_t begin_ = 0;  // what has not been handed out yet is buffer_[begin_, end_)

@@ -110,6 +110,19 @@ TEST_F(SnapshotTest, OneThatCannotBeRemovedMayBeTriedAgain) {
   EXPECT_EQ(manager.DeleteTmp(), 0);
 }
 
+// A reader may see a line that is being appended without its end, and the end a moment later.
+TEST_F(SnapshotTest, LineThatIsEndedWhileTheQueueIsReadIsOneLine) {
+  WriteLive("/a");
+  const std::string whole = test::ReadFile(live_);
+  test::WriteFile(live_, whole.substr(0, whole.size() - 1));
+  int reads = 0;
+  fake::OnSystemCall("read", [&] {
+    if (++reads == 3) test::WriteFile(live_, whole);
+  });
+  EXPECT_FALSE(QueueMgr(live_).IsReindexWaitingFor("/a"));
+  fake::OnSystemCall("read", nullptr);
+}
+
 // ---- Whether a reindex is still waiting
 
 class ReindexInWorkTest : public SnapshotTest {
