@@ -32,7 +32,7 @@ namespace {
 
 std::atomic<bool> fail_setsockopt{false};
 std::atomic<int> receive_timeouts{0};
-timeval send_timeout{};
+thread_local timeval send_timeout{};  // as this thread set it last
 
 }  // namespace
 
