@@ -149,6 +149,9 @@ void Worker::RunOnePass() {
   CheckShareIsThere();
   const std::uint64_t asked = compares_asked_;
   pass_began_ = true;
+  // The folders are loaded when the pass has its events: by older ones than its events tell of it
+  // would take what was renamed into a folder for gone.
+  reload_ = true;
   const PassSetup setup{layout_.queue_path, layout_.root,  *parts_.index,  survey_, gate_,
                         progress_,          *parts_.slots, parts_.threads, root_};
   if (RunPass(setup, MustCompare()) == PassResult::kAgain) {

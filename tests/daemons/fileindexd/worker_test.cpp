@@ -17,6 +17,7 @@ namespace {
 using fileindex::EVENT_CREATE;
 using fileindex::EVENT_MODIFY;
 using fileindex::EVENT_REINDEX;
+using fileindex::EVENT_RENAME;
 using std::chrono::milliseconds;
 using ::testing::Contains;
 using ::testing::HasSubstr;
@@ -404,12 +405,28 @@ TEST_F(WorkerTest, FoldersThatChangeWhileNothingIsDoneAreLeftToTheirEvent) {
   EXPECT_TRUE(IsAtRest());
 }
 
-TEST_F(WorkerTest, LoadsTheFoldersOnlyWhenTheyMayHaveChanged) {
+TEST_F(WorkerTest, LoadsTheFoldersForAPassAndWhenTheyMayHaveChanged) {
+  worker_->Step();
+  const int loads = host_.Loads();
   for (int i = 0; i < 5; ++i) worker_->Step();
-  EXPECT_EQ(1, host_.Loads());
+  EXPECT_EQ(loads, host_.Loads());
   worker_->Reload();
   for (int i = 0; i < 5; ++i) worker_->Step();
-  EXPECT_EQ(2, host_.Loads());
+  EXPECT_EQ(loads + 1, host_.Loads());
+}
+
+// The folder list is saved before its event is queued, and nobody tells of it in between.
+TEST_F(WorkerTest, JudgesByTheFoldersThatItsEventsTellOf) {
+  host_.SetFolders({Folder("/s/first")});
+  disk_.WriteFile("/v/s/first/a.txt");
+  worker_->Step();
+  disk_.Rename("/v/s/first", "/v/s/second");
+  Queue(EVENT_RENAME, "/v/s/second", true, "/v/s/first");
+  index_.SetHook([this](const std::string& command) {
+    if (command == "epoch") host_.SetFolders({Folder("/s/second")});
+  });
+  EXPECT_THAT(CommandsOfStep(), Contains("rename /v/s/first /v/s/second"));
+  EXPECT_EQ(1U, index_.All().count("/v/s/second/a.txt"));
 }
 
 // The mark in the status file.
