@@ -9,6 +9,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <chrono>
 #include <csignal>
 #include <cstring>
 #include <utility>
@@ -17,6 +18,9 @@
 
 namespace quarry::cli {
 namespace {
+
+using std::chrono::duration_cast;
+using std::chrono::steady_clock;
 
 // False, with errno set, when a file cannot be opened.
 bool Redirect(const char* output) {
@@ -110,13 +114,18 @@ std::optional<std::string> Child::Ended() {
 }
 
 bool Child::WaitEnded(int milliseconds) {
-  if (Ended()) return true;
-  const int fd = static_cast<int>(syscall(SYS_pidfd_open, pid_, 0));
-  if (fd < 0) return Ended().has_value();
-  pollfd poller{fd, POLLIN, 0};
-  poll(&poller, 1, milliseconds);
-  close(fd);
-  return Ended().has_value();
+  const auto deadline = steady_clock::now() + std::chrono::milliseconds(milliseconds);
+  const int fd = Ended() ? -1 : static_cast<int>(syscall(SYS_pidfd_open, pid_, 0));
+  while (!Ended()) {
+    const auto left = duration_cast<std::chrono::milliseconds>(deadline - steady_clock::now());
+    if (left.count() <= 0) break;
+    pollfd poller{fd, POLLIN, 0};
+    // A descriptor may report the end of a program whose other threads are still being taken down,
+    // which waitpid then does not see yet.
+    if (poll(&poller, 1, fd < 0 ? 1 : static_cast<int>(left.count())) > 0) poll(nullptr, 0, 1);
+  }
+  if (fd >= 0) close(fd);
+  return end_.has_value();
 }
 
 void Child::Signal(int signal) const {
