@@ -21,6 +21,10 @@ namespace {
 // Keeps a batch below what the engine takes in one message (64 MiB), whatever the paths' lengths.
 constexpr Json::ArrayIndex kBatchMax = 4000;
 
+// The same for the fields of a suggestion batch, which is sent whole unless it is very long: a
+// byte of a field may take six in JSON.
+constexpr std::size_t kSuggestionBatchBytes = std::size_t{8} << 20;
+
 constexpr char kNoArray[] = "!res.isMember(\"data\") || !res[\"data\"].isArray()";
 
 const char kMappings[] =
@@ -161,6 +165,13 @@ std::vector<Json::Value> MoveBatches(const std::string& id, const Json::Value& d
   return batches;
 }
 
+Json::Value SuggestionRequest(const std::string& db_name, const std::string& field) {
+  Json::Value data(Json::objectValue);
+  data["doc_id_field"] = field;
+  data["db_name"] = db_name;
+  return MakeRequest("update_term_suggestion", std::move(data));
+}
+
 }  // namespace
 
 const std::string kContentExtractPidPath = RootedPath("/var/run/tarncontentextractd.pid");
@@ -273,16 +284,17 @@ void IndexCommit(const std::string& share) {
 }
 
 void UpdateTermSuggestion(const std::string& db_name, const std::vector<std::string>& fields) {
-  if (fields.empty()) return;
-  Json::Value batch = EmptyBatch();
-  for (const std::string& field : fields) {
-    Json::Value data(Json::objectValue);
-    data["doc_id_field"] = field;
-    data["db_name"] = db_name;
-    batch["compound"].append(MakeRequest("update_term_suggestion", std::move(data)));
+  constexpr std::size_t kElementBytes = 100;  // what an element needs beside the two texts
+  for (auto field = fields.begin(); field != fields.end();) {
+    Json::Value batch = EmptyBatch();
+    std::size_t bytes = 0;
+    for (; field != fields.end() && bytes < kSuggestionBatchBytes; ++field) {
+      batch["compound"].append(SuggestionRequest(db_name, *field));
+      bytes += kElementBytes + db_name.size() + field->size();
+    }
+    Json::Value response;
+    SendRequest(response, batch);
   }
-  Json::Value response;
-  SendRequest(response, batch);
 }
 
 }  // namespace quarry::fileindex::elastic

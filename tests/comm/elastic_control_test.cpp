@@ -485,5 +485,22 @@ TEST_F(ElasticControlTest, OneElementPerField) {
       R"(]})");
 }
 
+TEST_F(ElasticControlTest, VeryManyFieldsGoInSeveralBatches) {
+  std::vector<std::string> fields;
+  for (int i = 0; i < 5000; ++i) {
+    fields.push_back("/v/" + std::string(4000, 'x') + std::to_string(i));
+  }
+  UpdateTermSuggestion("db", fields);
+  std::vector<std::string> sent;
+  for (const Json::Value& request : fake::JsonRequests()) {
+    EXPECT_LT(toString(request).size(), std::size_t{10} << 20);
+    for (const Json::Value& element : request["compound"]) {
+      sent.push_back(element["data"]["doc_id_field"].asString());
+    }
+  }
+  EXPECT_EQ(fake::JsonRequests().size(), 3u);
+  EXPECT_EQ(sent, fields);
+}
+
 }  // namespace
 }  // namespace quarry::fileindex::elastic
