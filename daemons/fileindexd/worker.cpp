@@ -69,7 +69,6 @@ Worker::Milliseconds Worker::Step() {
   if (gate_.Stopping()) return milliseconds(0);
   try {
     RefreshLayout();
-    pass_began_ = false;
     ClaimReindex();
     if (gate_.Paused() || layout_.rules->AllPaused()) return kPoll;
     FollowRoot();
@@ -92,12 +91,14 @@ Worker::Milliseconds Worker::Step() {
   }
 }
 
-// The folder list is loaded when it may have changed, in the middle of a pass too.
+// The folder list is loaded when it may have changed, in the middle of a pass too. What the pass
+// has judged by the old one is told of by an event that was queued after the change, and so is left
+// to the next pass. While a folder was paused nobody watched it.
 void Worker::RefreshLayout() {
   if (!reload_.exchange(false)) return;
   try {
     ShareLayout layout = parts_.host->Load();
-    if (layout_.rules && MustCompareAfter(*layout.rules)) CompareAll();
+    if (layout_.rules && HasNewlyActive(*layout_.rules, *layout.rules)) CompareAll();
     if (layout.root != layout_.root) root_ = Identity();
     layout_ = std::move(layout);
     progress_.SetFolders(layout_.rules);
@@ -105,12 +106,6 @@ void Worker::RefreshLayout() {
     reload_ = true;
     throw;
   }
-}
-
-// While a folder was paused nobody watched it. And a pass under which the folders change has judged
-// by the old ones, in part.
-bool Worker::MustCompareAfter(const FolderRules& now) const {
-  return HasNewlyActive(*layout_.rules, now) || (pass_began_ && now != *layout_.rules);
 }
 
 Survey::Rules Worker::CurrentRules() {
@@ -148,7 +143,6 @@ bool Worker::HasWork() const {
 void Worker::RunOnePass() {
   CheckShareIsThere();
   const std::uint64_t asked = compares_asked_;
-  pass_began_ = true;
   // The folders are loaded when the pass has its events: by older ones than its events tell of it
   // would take what was renamed into a folder for gone.
   reload_ = true;

@@ -58,7 +58,6 @@ class Worker {
 
  private:
   void RefreshLayout();
-  bool MustCompareAfter(const FolderRules& now) const;
   Survey::Rules CurrentRules();
   void ClaimReindex();
   void FollowRoot();
@@ -83,7 +82,6 @@ class Worker {
   Survey survey_;
   Identity root_;  // as it was last seen
   bool was_mounted_ = false;
-  bool pass_began_ = false;  // since the folder list was last looked at before a pass
   // Comparing the whole share may be asked for again while a pass does it.
   std::uint64_t compares_asked_ = 1;
   std::uint64_t compares_done_ = 0;

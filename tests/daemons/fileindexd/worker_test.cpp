@@ -18,6 +18,7 @@ using fileindex::EVENT_CREATE;
 using fileindex::EVENT_MODIFY;
 using fileindex::EVENT_REINDEX;
 using fileindex::EVENT_RENAME;
+using fileindex::EVENT_UPDATE_CFG;
 using std::chrono::milliseconds;
 using ::testing::Contains;
 using ::testing::HasSubstr;
@@ -358,7 +359,8 @@ TEST_F(WorkerTest, AFolderThatIsNoLongerPausedBehindTheWalkIsCompared) {
   EXPECT_EQ(1U, index_.All().count("/v/s/a/1.txt"));
 }
 
-// What lies behind the walk of a reindex was judged by the old folders.
+// What lies behind the walk of a reindex was judged by the old folders: the event that comes with a
+// change of folders is queued though a reindex above it is being worked on.
 class ReindexTest : public WorkerTest {
  protected:
   ReindexTest() {
@@ -375,9 +377,9 @@ class ReindexTest : public WorkerTest {
     index_.SetHook([&](const std::string& command) {
       if (changed || command != when) return;
       changed = true;
-      // So an event of now is queued.
-      EXPECT_FALSE(fileindex::QueueMgr(QueuePath()).IsReindexWaitingFor("/v/s"));
       host_.SetFolders({Folder("/s")});
+      EXPECT_FALSE(fileindex::QueueMgr(QueuePath()).IsReindexWaitingFor("/v/s"));
+      Queue(EVENT_UPDATE_CFG, "/v/s", true);
       worker_->Reload();
     });
     while (worker_->Step() == milliseconds(0)) {
