@@ -97,6 +97,18 @@ TEST_F(VolumeTest, ResumeDoesAllOfItInThisOrder) {
   EXPECT_THAT(Logs(), IsEmpty());
 }
 
+TEST_F(VolumeTest, AVolumeThatWasNotPausedIsResumedAllTheSame) {
+  SaveList({Record("/far"), Record("/music")});
+  Begin();
+  VolumeResume(volume_);
+  EXPECT_EQ(StoredList(), toString(Array({Record("/far"), Record("/music")})));
+  const Texts effects = effects_->All();
+  ASSERT_GE(effects.size(), 3U);
+  EXPECT_THAT(Texts(effects.end() - 3, effects.end()),
+              ElementsAre("engine index_resume fileindex_music", Worker("worker_create", "music"),
+                          Monitored("music", {"/music"})));
+}
+
 TEST_F(VolumeTest, AVolumeWithoutFoldersOnlySaves) {
   const std::vector<Json::Value> records = {Record("/photo/a", "d")};
   for (const auto& operation : {&VolumePause, &VolumeResume}) {
@@ -150,6 +162,13 @@ TEST_F(VolumeTest, ClearOfTheLastShareStopsTheServices) {
   EXPECT_THAT(effects_->All(), ElementsAreArray(Texts{kBecomeRoot, R"(status = {"share":null})",
                                                       kBecomeRoot, "list = []"} +
                                                 ServicesOff()));
+}
+
+TEST_F(VolumeTest, ClearOfAnEmptyListStopsTheServices) {
+  test::WriteFile(kFileIndexFoldersCfgPath, " []");
+  Begin();
+  VolumeClearPaused(volume_);
+  EXPECT_THAT(effects_->All(), ElementsAreArray(Texts{kBecomeRoot, "list = []"} + ServicesOff()));
 }
 
 TEST_F(VolumeTest, ClearStopsAtAStatusThatCannotBeLoaded) {
