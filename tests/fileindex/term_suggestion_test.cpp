@@ -97,6 +97,21 @@ TEST_F(TermSuggestionTest, AFailureKeepsWhatWasDoneBefore) {
   EXPECT_EQ(requests_[2], Commit("music"));
 }
 
+TEST_F(TermSuggestionTest, EachRequestThatFailsEndsIt) {
+  const std::vector<std::string> requests = {
+      Query("music"), Suggest("music", "/one") + Suggest("music", "/two"), Commit("music")};
+  for (size_t i = 0; i < requests.size(); ++i) {
+    requests_.clear();
+    failing_ = requests[i];
+    EXPECT_EQ(FailureOf([] {
+                UpdateTermSuggestion({"fileindex_photo", "fileindex_music"});
+              }),
+              "777 Request failed, msg=no")
+        << failing_;
+    EXPECT_EQ(requests_.size(), i + 1) << failing_;
+  }
+}
+
 TEST_F(TermSuggestionTest, AShareThatThePlatformDoesNotKnowFails) {
   fake::RemoveShare("photo");
   EXPECT_EQ(FailureOf([] { UpdateTermSuggestion({"fileindex_music"}); }).substr(0, 3), "800");

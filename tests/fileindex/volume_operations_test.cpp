@@ -186,6 +186,31 @@ TEST_F(VolumeTest, TheMountPointIsMissing) {
   ExpectRefused("VolumeClearPaused", condition, reason, [] { VolumeClearPaused(""); });
 }
 
+TEST_F(VolumeTest, WithoutADaemonTheListIsSavedAndTheFirstShareEndsIt) {
+  Begin();
+  daemon_.reset();
+  EXPECT_EQ(FailureOf([&] { VolumePause(volume_); }).substr(0, 16), "502 write failed");
+  EXPECT_EQ(effects_->All().size(), 2U);
+  End();
+  PreparePaused();
+  Begin();
+  daemon_.reset();
+  EXPECT_EQ(FailureOf([&] { VolumeResume(volume_); }).substr(0, 16), "502 write failed");
+  ASSERT_EQ(effects_->All().size(), 3U);
+  EXPECT_EQ(effects_->All()[2], "engine index_resume fileindex_music");
+}
+
+TEST_F(VolumeTest, AFolderThatWasPausedBeforeIsTheVolumesFromNowOn) {
+  SaveList({Paused(Record("/photo/a"), ""), Paused(Record("/photo/b"), volume_ + "0")});
+  Begin();
+  VolumePause(volume_);
+  const Texts effects = effects_->All();
+  ASSERT_EQ(effects.size(), 5U);
+  EXPECT_EQ(effects[1],
+            Saved({Paused(Record("/photo/a"), volume_), Paused(Record("/photo/b"), volume_)}));
+  EXPECT_EQ(effects[2], Worker("worker_delete", "photo"));
+}
+
 TEST_F(VolumeTest, EverySingleFailureEndsThePause) {
   ExpectEveryFailureToEndIt([this] { Prepare(); }, [this] { VolumePause(volume_); });
 }
