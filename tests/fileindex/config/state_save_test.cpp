@@ -10,6 +10,7 @@
 #include <string>
 #include <vector>
 
+#include "common/lock_file.h"
 #include "common/paths.h"
 #include "common/unique_fd.h"
 #include "fileindex/config/folder_mgr.h"
@@ -82,6 +83,15 @@ TEST_F(StateSaveTest, EachChangeOfTheStatusIsSavedUnderTheLock) {
     StatusMgr status;
     EXPECT_TRUE(IsLockedDuring([&] { changes[i](status); })) << i;
   }
+}
+
+TEST_F(StateSaveTest, NeitherQuestionsNorSavesTakeTheLock) {
+  const LockFile lock(RootedPath("/tmp/quarry_cfg_fi_status.lock"), true);
+  StatusMgr status;
+  EXPECT_EQ(status.GetPauseInfo(), -1);
+  EXPECT_EQ(status.GetShareStatus("a"), 0);
+  status.Save();
+  EXPECT_TRUE(fake::Sleeps().empty());
 }
 
 }  // namespace
