@@ -66,6 +66,17 @@ Json::Value FolderStatus(const fileindex::Folder& folder, const Json::Value& rep
   return status;
 }
 
+Json::Value SetAside(const Json::Value& report) {
+  Json::Value list(Json::arrayValue);
+  for (const Json::Value& share : report["shares"]) {
+    for (Json::Value work : share["set_aside"]) {
+      work["share"] = share["share"];
+      list.append(work);
+    }
+  }
+  return list;
+}
+
 std::string StateInWords(const Json::Value& status) {
   const std::string state = status["state"].asString();
   const std::string error = status["last_error"].asString();

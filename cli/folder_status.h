@@ -19,6 +19,9 @@ Json::Value IndexDaemonReport();
 // vanished gives the state "error" with its reason as "last_error".
 Json::Value FolderStatus(const fileindex::Folder& folder, const Json::Value& report);
 
+// What the daemon has given up for now: {"share", "path", "error"} each.
+Json::Value SetAside(const Json::Value& report);
+
 // A state of FolderStatus in words for a person.
 std::string StateInWords(const Json::Value& status);
 

@@ -33,7 +33,9 @@ Json::Value Collect() {
   status["resume_time"] = Json::Int64{fileindex::StatusMgr().GetPauseInfo()};
   status["running"] = ServicesAreManaged();
   status["services"] = Services();
-  status["folders"] = Folders(IndexDaemonReport());
+  const Json::Value report = IndexDaemonReport();
+  status["folders"] = Folders(report);
+  status["set_aside"] = SetAside(report);
   return status;
 }
 
@@ -62,6 +64,16 @@ std::string Rate(const Json::Value& folder) {
   return rate > 0 ? std::to_string(static_cast<long long>(rate + 0.5)) + "/s" : "-";
 }
 
+void PrintSetAside(const Json::Value& list) {
+  if (list.empty()) return;
+  std::cout << "\nSet aside, since it failed again and again (tried again once an hour, or by: "
+               "quarry folder reindex FOLDER):\n";
+  for (const Json::Value& work : list) {
+    std::cout << "  " << Printable(work["path"].asString()) << ": "
+              << Printable(work["error"].asString()) << "\n";
+  }
+}
+
 void Print(const Json::Value& status) {
   PrintServices(status);
   PrintPause(status["resume_time"].asInt64());
@@ -77,6 +89,7 @@ void Print(const Json::Value& status) {
                     Printable(StateInWords(folder))});
   }
   PrintTable(std::cout, rows);
+  PrintSetAside(status["set_aside"]);
 }
 
 }  // namespace

@@ -14,18 +14,19 @@ constexpr int kAttempts = 2;
 }  // namespace
 
 DocumentWriter::DocumentWriter(Index& index, FileSystem& files, TaskLane& lane, Progress& progress,
-                               RemovalGuard may_remove)
+                               SetAside& aside, RemovalGuard may_remove)
     : index_(index),
       files_(files),
       lane_(lane),
       progress_(progress),
+      aside_(aside),
       may_remove_(std::move(may_remove)) {}
 
 void DocumentWriter::Submit(const std::string& path, std::function<void()> change) {
   progress_.AddWaiting(path);
   lane_.Submit(path, [this, path, change = std::move(change)] {
     progress_.Begin(path);
-    change();
+    aside_.Try(path, change);
     progress_.TakeWaiting(path);
   });
 }
@@ -134,6 +135,7 @@ void DocumentWriter::RequireOwnFault(const Error& error) {
       index_.Epoch();
       return;
     case Failure::kIndexMissing:
+    case Failure::kPlace:
     case Failure::kPass:
       throw error;
   }

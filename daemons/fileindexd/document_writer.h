@@ -11,13 +11,14 @@
 #include "daemons/fileindexd/file_system.h"
 #include "daemons/fileindexd/index.h"
 #include "daemons/fileindexd/progress.h"
+#include "daemons/fileindexd/set_aside.h"
 #include "daemons/fileindexd/task_lane.h"
 
 namespace quarry::fileindexd {
 
 // Each member hands one change to the lane and returns; it may block until the lane has room and
 // throws what an earlier change failed with. A change that fails because of its own file is counted
-// and logged, any other failure ends the lane. One thread calls.
+// and logged, any other failure ends the lane. What is set aside is left out. One thread calls.
 class DocumentWriter {
  public:
   // Throws Error when it is doubtful that what is missing was deleted: the whole share is gone.
@@ -25,7 +26,7 @@ class DocumentWriter {
 
   // What is given must outlive the writer, and the lane must be drained or destroyed before it.
   DocumentWriter(Index& index, FileSystem& files, TaskLane& lane, Progress& progress,
-                 RemovalGuard may_remove);
+                 SetAside& aside, RemovalGuard may_remove);
 
   // The place's document is made anew, its content with `need_meta`. A place that has vanished
   // meanwhile loses its document.
@@ -54,6 +55,7 @@ class DocumentWriter {
   FileSystem& files_;
   TaskLane& lane_;
   Progress& progress_;
+  SetAside& aside_;
   RemovalGuard may_remove_;
 };
 

@@ -15,8 +15,23 @@ Failure Classify(const Error& error) {
     case engine::kUnknownIndex:
     case engine::kDamagedIndex:
       return Failure::kIndexMissing;
-    default:
+    case kErrorShareEnum:
+    case kErrorSystem:
+    case kErrorCredentials:
+    case kErrorLoadFile:
+    case kErrorSaveFile:
+    case kErrorLock:
+    case kErrorShareNotFound:
+    case kErrorServiceAccount:
+    case kErrorEngineBusy:
+    case kErrorEngineBusyMemory:
+    case kErrorNoSpace:
+    case engine::kPausedIndex:
+    case engine::kDiskFull:
+    case engine::kMovingIndex:
       return Failure::kPass;
+    default:
+      return Failure::kPlace;
   }
 }
 

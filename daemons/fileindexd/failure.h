@@ -13,6 +13,7 @@ enum class Failure {
   kDocument,      // this one place is the trouble
   kChannel,       // an exchange broke off: the engine's trouble, or this document's
   kIndexMissing,  // the engine has no such index, or it is damaged: it can be made anew
+  kPlace,         // nobody can tell: perhaps this one place's
   kPass,          // nothing else would go better now
 };
 

@@ -18,6 +18,8 @@ struct FolderRule {
   bool video = false;
   bool photo = false;
   bool paused = false;
+
+  bool operator==(const FolderRule&) const = default;
 };
 
 // The folders of one share, by the rule of the library's FolderMgr: the deepest folder at or above
@@ -49,6 +51,8 @@ class FolderRules {
 
   // Whether the governing folder wants the content of a file of this name; false without one.
   bool WantsContent(const std::string& path) const;
+
+  bool operator==(const FolderRules&) const = default;
 
  private:
   std::map<std::string, FolderRule> folders_;

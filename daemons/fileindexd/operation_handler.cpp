@@ -73,11 +73,13 @@ void OperationHandler::HandleAttributes(const std::string& path) {
   const Finding finding = tools_.survey.Examine(path);
   if (finding.verdict != Verdict::kWanted) return reconciler_.Reconcile(path);
   tools_.lane.Settle(path);
-  if (IsOfKind(tools_.index.Find(path), finding.place.kind)) {
-    tools_.writer.SetAttributes(path);
-  } else {
-    reconciler_.Reconcile(path);
-  }
+  tools_.aside.Try(path, [&] {
+    if (IsOfKind(tools_.index.Find(path), finding.place.kind)) {
+      tools_.writer.SetAttributes(path);
+    } else {
+      reconciler_.Reconcile(path);
+    }
+  });
 }
 
 void OperationHandler::MoveRenamed(const Operation& rename) {
@@ -89,7 +91,9 @@ void OperationHandler::MoveRenamed(const std::string& new_path, const std::strin
   const bool aside = old_path.empty() || tools_.survey.rules()->TouchesPaused(old_path) ||
                      tools_.survey.rules()->TouchesPaused(new_path);
   if (!aside && !PathsMeet(new_path, old_path)) {
-    for (const auto& [to, from] : RenameRoots(new_path, old_path)) MoveDocuments(to, from);
+    for (const auto& [to, from] : RenameRoots(new_path, old_path)) {
+      tools_.aside.Try(from + " -> " + to, [&] { MoveDocuments(to, from); });
+    }
   }
 }
 

@@ -33,9 +33,11 @@ class Pass {
   explicit Pass(const PassSetup& setup)
       : setup_(setup),
         lane_(setup.threads, setup.slots),
-        writer_(setup.index, setup.survey.files(), lane_, setup.progress, [this] { CheckRoot(); }),
-        handler_({setup.index, setup.survey, writer_, lane_, setup.gate, setup.progress},
-                 setup.share_root) {}
+        writer_(setup.index, setup.survey.files(), lane_, setup.progress, setup.aside,
+                [this] { CheckRoot(); }),
+        handler_(
+            {setup.index, setup.survey, writer_, lane_, setup.gate, setup.progress, setup.aside},
+            setup.share_root) {}
   // Tasks still use what is destroyed before the lane.
   ~Pass() { lane_.End(); }
   Pass(const Pass&) = delete;
@@ -43,6 +45,7 @@ class Pass {
 
   PassResult Run(bool full) {
     const std::string epoch = setup_.index.Epoch();
+    setup_.aside.BeginPass(setup_.index.CanRead());
     QueueMgr queue(setup_.queue_path);
     Operations operations = TakeOperations(queue);
     full = full || std::any_of(operations.begin(), operations.end(), IsFullReindex);

@@ -20,6 +20,7 @@ struct PassSetup {
   const Survey& survey;
   Gate& gate;
   Progress& progress;
+  SetAside& aside;
   Slots& slots;
   std::size_t threads = 1;
   Identity root_identity;  // of the share's directory

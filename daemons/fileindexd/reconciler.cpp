@@ -72,12 +72,16 @@ void Reconciler::Run() {
     const Stop stop = std::move(stops_.back());
     stops_.pop_back();
     tools_.progress.Begin(stop.path);
-    if (stop.compared) {
-      VisitDirectory(stop.path);
-    } else {
-      VisitPlace(stop.path);
-    }
+    tools_.aside.Try(stop.path + "/", [&] { Visit(stop); });
     tools_.progress.TakeWaiting(stop.path);
+  }
+}
+
+void Reconciler::Visit(const Stop& stop) {
+  if (stop.compared) {
+    VisitDirectory(stop.path);
+  } else {
+    VisitPlace(stop.path);
   }
 }
 

@@ -25,6 +25,7 @@ struct PassTools {
   TaskLane& lane;
   Gate& gate;
   Progress& progress;
+  SetAside& aside;
 };
 
 // Walks places and changes only the documents that differ from what is there. Does not recurse;
@@ -60,6 +61,7 @@ class Reconciler {
   void Walk(const std::string& path);
   void Push(const std::string& path, bool compared);
   void Run();
+  void Visit(const Stop& stop);
   bool WasVisited(const std::string& path);
   void VisitPlace(const std::string& path);
   void VisitDirectory(const std::string& dir);

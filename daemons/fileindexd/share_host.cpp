@@ -64,6 +64,10 @@ class LiveShareHost : public ShareHost {
     return (bits & fileindex::kShareNeedReindex) != 0 && (bits & fileindex::kShareNeedRebuild) == 0;
   }
 
+  void MarkNeedsReindex() override {
+    StatusMgr().SetShareStatus(share_, fileindex::kShareNeedReindex);
+  }
+
   void ClearNeedsReindex() override {
     StatusMgr().UnsetShareStatus(share_, fileindex::kShareNeedReindex);
   }

@@ -26,8 +26,9 @@ class ShareHost {
   virtual ShareLayout Load() = 0;
 
   // Whether the share is marked as needing a reindex, without its index having to be rebuilt; and
-  // taking that mark away.
+  // setting that mark and taking it away.
   virtual bool NeedsReindex() = 0;
+  virtual void MarkNeedsReindex() = 0;
   virtual void ClearNeedsReindex() = 0;
 
   // Whether the place is a recycle bin or lies in one.

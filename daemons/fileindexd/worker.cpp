@@ -52,6 +52,12 @@ Worker::Worker(const std::string& share, WorkerParts parts)
           *parts_.files, [this] { return CurrentRules(); },
           [this](const std::string& path) { return parts_.host->IsInRecycleBin(path); }) {}
 
+Json::Value Worker::Report() const {
+  Json::Value report = progress_.Report(gate_.Paused());
+  report["set_aside"] = aside_.Report();
+  return report;
+}
+
 void Worker::Reload() {
   reload_ = true;
   gate_.Wake();
@@ -69,6 +75,7 @@ Worker::Milliseconds Worker::Step() {
   if (gate_.Stopping()) return milliseconds(0);
   try {
     RefreshLayout();
+    MarkForSetAside();
     ClaimReindex();
     if (gate_.Paused() || layout_.rules->AllPaused()) return kPoll;
     FollowRoot();
@@ -113,18 +120,28 @@ Survey::Rules Worker::CurrentRules() {
   return layout_.rules;
 }
 
-// A share that is marked as needing a reindex gets it; the mark goes first, so that one that is set
-// meanwhile is not lost.
 void Worker::ClaimReindex() {
+  if (aside_.IsDue()) {
+    aside_.GiveAnotherChance();
+    check_status_ = true;
+  }
   if (!check_status_.exchange(false)) return;
   try {
-    if (!parts_.host->NeedsReindex()) return;
-    CompareAll();
-    parts_.host->ClearNeedsReindex();
+    FollowMark(parts_.host->NeedsReindex());
   } catch (...) {
     check_status_ = true;
     throw;
   }
+}
+
+// A share that is marked as needing a reindex gets it; the mark goes first, so that one that is set
+// meanwhile is not lost. While something is set aside the mark says so and stays: whoever takes it
+// away has asked for everything to be tried again.
+void Worker::FollowMark(bool marked) {
+  if (!marked && aside_.IsEmpty()) return;
+  CompareAll();
+  if (aside_.IsEmpty()) return parts_.host->ClearNeedsReindex();
+  if (!marked) aside_.GiveAnotherChance();
 }
 
 // Another directory in the share's place, such as a disk's that was mounted meanwhile, comes
@@ -146,14 +163,23 @@ void Worker::RunOnePass() {
   // The folders are loaded when the pass has its events: by older ones than its events tell of it
   // would take what was renamed into a folder for gone.
   reload_ = true;
-  const PassSetup setup{layout_.queue_path, layout_.root,  *parts_.index,  survey_, gate_,
-                        progress_,          *parts_.slots, parts_.threads, root_};
+  const PassSetup setup{layout_.queue_path,
+                        layout_.root,
+                        *parts_.index,
+                        survey_,
+                        gate_,
+                        progress_,
+                        aside_,
+                        *parts_.slots,
+                        aside_.IsSearching() ? 1 : parts_.threads,
+                        root_};
   if (RunPass(setup, MustCompare()) == PassResult::kAgain) {
     daemon::LogWarning("The search engine was started anew while share " + share_ +
                        " was indexed; doing it again");
     return;
   }
   compares_done_ = asked;
+  aside_.Succeeded();
   missing_index_ = 0;
   Recover();
   progress_.EndPass("");
@@ -173,8 +199,25 @@ Worker::Milliseconds Worker::Fail(const std::string& error) {
   if (error != last_error_)
     daemon::LogError("Share " + share_ + " cannot be indexed now: " + error);
   last_error_ = error;
+  SetCulpritAside();
   backoff_ = std::clamp(2 * backoff_, kFirstBackoff, kLongestBackoff);
   return backoff_;
+}
+
+// What fails again and again must not hold up the rest of the share.
+void Worker::SetCulpritAside() {
+  const std::optional<SetAside::Work> culprit = aside_.Failed();
+  if (!culprit) return;
+  mark_missing_ = true;
+  backoff_ = milliseconds(0);
+  daemon::LogError("Set aside in share " + share_ +
+                   ", since it fails again and again: " + culprit->name + ": " + culprit->error);
+}
+
+void Worker::MarkForSetAside() {
+  if (!mark_missing_) return;
+  parts_.host->MarkNeedsReindex();
+  mark_missing_ = false;
 }
 
 // Also where there is nothing left to do, as after a folder list that could not be loaded.

@@ -18,6 +18,7 @@
 #include "daemons/fileindexd/index.h"
 #include "daemons/fileindexd/pass.h"
 #include "daemons/fileindexd/progress.h"
+#include "daemons/fileindexd/set_aside.h"
 #include "daemons/fileindexd/share_host.h"
 #include "daemons/fileindexd/slots.h"
 
@@ -54,12 +55,13 @@ class Worker {
   void Reload();
   // The status file has changed.
   void CheckStatus() { check_status_ = true; }
-  Json::Value Report() const { return progress_.Report(gate_.Paused()); }
+  Json::Value Report() const;
 
  private:
   void RefreshLayout();
   Survey::Rules CurrentRules();
   void ClaimReindex();
+  void FollowMark(bool marked);
   void FollowRoot();
   void CompareAll() { ++compares_asked_; }
   bool MustCompare() const { return compares_done_ != compares_asked_; }
@@ -67,6 +69,8 @@ class Worker {
   void RunOnePass();
   void CheckShareIsThere();
   Milliseconds Fail(const std::string& error);
+  void SetCulpritAside();
+  void MarkForSetAside();
   void Recover();
   void HandleMissingIndex(const Error& error);
 
@@ -74,6 +78,7 @@ class Worker {
   WorkerParts parts_;
   Gate gate_;
   Progress progress_;
+  SetAside aside_;
   std::atomic<bool> reload_{true};
   std::atomic<bool> check_status_{true};
 
@@ -85,7 +90,8 @@ class Worker {
   // Comparing the whole share may be asked for again while a pass does it.
   std::uint64_t compares_asked_ = 1;
   std::uint64_t compares_done_ = 0;
-  int missing_index_ = 0;  // passes in a row that failed for want of it
+  bool mark_missing_ = false;  // something was set aside, but the share is not yet marked
+  int missing_index_ = 0;      // passes in a row that failed for want of it
   std::string last_error_;
   Milliseconds backoff_{0};
 };

@@ -16,6 +16,7 @@ Json::Value WithoutWorker(const std::string& share, const char* state) {
   report["path"] = "";
   report["last_error"] = "";
   report["folders"] = Json::Value(Json::arrayValue);
+  report["set_aside"] = Json::Value(Json::arrayValue);
   return report;
 }
 

@@ -14,8 +14,12 @@ TEST(FailureTest, TellsWhoseFaultItIs) {
   EXPECT_EQ(Failure::kChannel, Classify(Error(913, "")));
   EXPECT_EQ(Failure::kIndexMissing, Classify(Error(engine::kUnknownIndex, "")));
   EXPECT_EQ(Failure::kIndexMissing, Classify(Error(engine::kDamagedIndex, "")));
-  for (const int code : {502, 916, 1003, 1400, 1401, 1406, 1407, 1408, 1413, 1414, 1415, -7}) {
+  for (const int code :
+       {121, 502, 503, 504, 505, 506, 800, 801, 1003, 1400, 1401, 1406, 1407, 1415}) {
     EXPECT_EQ(Failure::kPass, Classify(Error(code, ""))) << code;
+  }
+  for (const int code : {916, 1408, 1413, 1414, 9999, -7}) {
+    EXPECT_EQ(Failure::kPlace, Classify(Error(code, ""))) << code;
   }
 }
 

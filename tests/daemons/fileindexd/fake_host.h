@@ -37,8 +37,13 @@ class HostState {
     const std::lock_guard<std::mutex> lock(mutex_);
     clear_error_ = error;
   }
+  void FailMark(const std::optional<Error>& error) {
+    const std::lock_guard<std::mutex> lock(mutex_);
+    mark_error_ = error;
+  }
   void MarkNeedsReindex() {
     const std::lock_guard<std::mutex> lock(mutex_);
+    if (mark_error_) throw Error(*mark_error_);
     needs_reindex_ = true;
   }
   bool NeedsReindex() const {
@@ -69,6 +74,7 @@ class HostState {
       std::make_shared<const FolderRules>(std::vector<FolderRule>());
   std::optional<Error> load_error_;
   std::optional<Error> clear_error_;
+  std::optional<Error> mark_error_;
   bool needs_reindex_ = false;
   int loads_ = 0;
 };
@@ -80,6 +86,7 @@ class FakeHost : public ShareHost {
 
   ShareLayout Load() override { return state_.Load(); }
   bool NeedsReindex() override { return state_.NeedsReindex(); }
+  void MarkNeedsReindex() override { state_.MarkNeedsReindex(); }
   void ClearNeedsReindex() override { state_.Clear(); }
   bool IsInRecycleBin(const std::string&) override { return false; }
   bool CreateIndexIfWanted(const std::function<void()>& create) override {

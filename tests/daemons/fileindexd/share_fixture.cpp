@@ -73,9 +73,8 @@ bool ShareFixture::HasQueue() const {
 }
 
 PassResult ShareFixture::Run(bool full) {
-  const PassSetup setup{QueuePath(), kRoot,    index_,
-                        survey_,     gate_,    progress_,
-                        slots_,      threads_, disk_.Identify(kRoot)};
+  const PassSetup setup{QueuePath(), kRoot,  index_, survey_,  gate_,
+                        progress_,   aside_, slots_, threads_, disk_.Identify(kRoot)};
   return RunPass(setup, full);
 }
 

@@ -61,6 +61,7 @@ class ShareFixture : public ::testing::Test {
   Gate gate_;
   Slots slots_{4};
   Progress progress_{"s"};
+  SetAside aside_;
   std::set<std::string> bins_;  // recycle bins
   Survey survey_;
   std::size_t threads_ = 1;  // one after the other, so that commands have an order

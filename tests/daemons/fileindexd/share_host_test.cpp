@@ -69,6 +69,8 @@ TEST_F(ShareHostTest, AListThatIsGarbageIsAnError) {
 
 TEST_F(ShareHostTest, ReadsAndClearsTheMark) {
   EXPECT_FALSE(host_->NeedsReindex());
+  host_->MarkNeedsReindex();
+  EXPECT_EQ(fileindex::kShareNeedReindex, fileindex::StatusMgr().GetShareStatus("s"));
   StatusMgr().SetShareStatus("s", fileindex::kShareNeedReindex | 4);
   EXPECT_TRUE(host_->NeedsReindex());
   host_->ClearNeedsReindex();
