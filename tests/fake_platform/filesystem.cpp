@@ -101,10 +101,11 @@ int TARNFSDirIsMntPoint(const char* path) {
 }
 
 int HLIBFhsPathInSnapshot(const char* path, int* in_snapshot) {
-  if (const auto failure = Called("HLIBFhsPathInSnapshot", path)) return failure->result;
+  const auto failure = Called("HLIBFhsPathInSnapshot", path);
   WorldLock lock(TheWorld().mutex);
+  // Filled even by a call that fails, so that a caller who goes by it is found out.
   *in_snapshot = quarry::fake::IsWithinAny(path, TheWorld().snapshots) ? 1 : 0;
-  return 0;
+  return failure ? failure->result : 0;
 }
 
 int TARNEAIsHiddenDir(const char* name) {
