@@ -322,7 +322,11 @@ TEST_F(RulesTest, SeveralBitsLeaveOneRecordOfTheLastKind) {
   EXPECT_EQ(Folded(Line(EVENT_CREATE | EVENT_MODIFY, "/a")), Strings{"index /a"});
   EXPECT_EQ(Folded(Line(EVENT_CREATE | EVENT_ATTR, "/a")), Strings{"attr /a"});
   EXPECT_EQ(Folded(Line(EVENT_CREATE | EVENT_DELETE, "/a")), Strings{"delete /a"});
+  EXPECT_EQ(Folded(Line(EVENT_MODIFY | EVENT_DELETE, "/a")), Strings{"delete /a"});
   EXPECT_EQ(Folded(Line(EVENT_MODIFY | EVENT_REINDEX, "/a")), Strings{"reindex /a"});
+  EXPECT_EQ(Folded(Line(EVENT_DELETE | EVENT_RENAME, "/b", "/a")), Strings{"rename /a -> /b"});
+  EXPECT_EQ(Folded(Line(EVENT_REINDEX | EVENT_UPDATE_CFG, "/a", "", Parsed("{}"))),
+            Strings{"config /a {}"});
   EXPECT_EQ(Folded(Line(EVENT_MODIFY | EVENT_RENAME, "/b", "/a")), Strings{"rename /a -> /b"});
   EXPECT_EQ(Folded(Line(EVENT_RENAME | EVENT_REINDEX, "/b", "/a")), Strings{"reindex /a -> /b"});
   EXPECT_EQ(Folded(Line(EVENT_RENAME | EVENT_UPDATE_CFG, "/b", "/a", Parsed("{}"))),
