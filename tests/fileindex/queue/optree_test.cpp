@@ -123,9 +123,11 @@ TEST_F(OPTreeTest, EveryLineIsLoggedWhileDebugging) {
             (Strings{"optree.cpp:N Got event: {\"event\":2,\"path\":\"/a\"}",
                      "optree.cpp:N Got event: {\"event\":2,\"path\":\"/b\"}"}));
   fake::ClearLogs();
-  log_level = 6;
-  { OPTree tree(queue.path()); }
-  EXPECT_TRUE(fake::Logs().empty());
+  for (const int level : {6, 8, 0, -7}) {
+    log_level = level;
+    OPTree tree(queue.path());
+    EXPECT_TRUE(fake::Logs().empty()) << level;
+  }
 }
 
 TEST_F(OPTreeTest, BadLinesAreLoggedAndSkipped) {
