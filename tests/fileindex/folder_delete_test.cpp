@@ -118,6 +118,20 @@ TEST_F(FolderReindexTest, AShareWhoseIndexMustBeRebuiltGetsANewOne) {
                   kBecomeRoot, R"(status = {"share":{"music":2,"photo":0}})"));
 }
 
+TEST_F(FolderReindexTest, AnIndexThatCannotBeRebuiltEndsItBeforeTheNext) {
+  SetStatus(R"({"share":{"music":3,"photo":3}})");
+  for (const char* command : {"index_delete", "index_create"}) {
+    Begin();
+    effects_->Refuse(command, 777);
+    EXPECT_EQ(FailureOf([] { FolderReindex(Parse(R"(["/photo/a","/music"])")); }),
+              "777 Request failed, msg=no");
+    ASSERT_FALSE(effects_->All().empty());
+    EXPECT_EQ(effects_->All().back(), std::string("engine ") + command + " fileindex_music");
+    EXPECT_EQ(test::ReadFile(kFileIndexStatusCfgPath), R"({"share":{"music":3,"photo":3}})");
+    End();
+  }
+}
+
 TEST_F(FolderReindexTest, TheNeedOfAReindexIsForgottenForTheSharesThatWereTouched) {
   SetStatus(R"({"share":{"music":1,"other":1,"photo":5}})");
   Begin();

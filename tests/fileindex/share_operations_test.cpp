@@ -201,6 +201,14 @@ TEST_F(ShareRenameTest, AShareWithoutFoldersIsRenamedAllTheSame) {
                                            "queue pictures = " + RenameLine()));
 }
 
+TEST_F(ShareRenameTest, SharesWhoseNamesBeginTheSameKeepTheirs) {
+  SaveList({Record("/photos/a"), Record("/photo"), Record("/phot"), Record("/music/photo")});
+  Begin();
+  ShareRename("photo", "pictures");
+  EXPECT_EQ(StoredList(), toString(Array({Record("/photos/a"), Record("/pictures"), Record("/phot"),
+                                          Record("/music/photo")})));
+}
+
 TEST_F(ShareRenameTest, OnlyTheShareItselfIsExchangedInItsPath) {
   const std::string place = volume_ + "/pictures/pictures";
   fake::AddShare("pictures", place);
@@ -429,6 +437,15 @@ TEST_F(ShareClearPausedTest, TheLastShareStopsTheServices) {
   Begin();
   Clear();
   EXPECT_THAT(effects_->All(), ElementsAreArray(Cleared({}) + ServicesOff()));
+}
+
+TEST_F(ShareClearPausedTest, AShareWithoutFoldersIsClearedAllTheSame) {
+  const std::vector<Json::Value> records = {Record("/music")};
+  test::WriteFile(kFileIndexFoldersCfgPath, " " + toString(Array(records)));
+  test::WriteFile(kFileIndexStatusCfgPath, R"({"share":{"photo":3}})");
+  Begin();
+  Clear();
+  EXPECT_THAT(effects_->All(), ElementsAreArray(Cleared(records)));
 }
 
 TEST_F(ShareClearPausedTest, AnArgumentIsMissing) {
