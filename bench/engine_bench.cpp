@@ -255,5 +255,71 @@ BENCHMARK_CAPTURE(Search, part_of_name, "name:le1234")->Unit(benchmark::kMillise
 BENCHMARK_CAPTURE(Search, filter_alone, "type:document in:/volume1/share/folder7")
     ->Unit(benchmark::kMillisecond);
 
+constexpr std::size_t kManyTerms = 1000000;
+constexpr std::size_t kTermsPerDocument = 1000;
+
+// Each word in two documents, so that all are there to be suggested.
+Place& PlaceOfManyTerms() {
+  static Place place;
+  static const bool filled = [] {
+    for (std::size_t i = 0; i < 2 * kManyTerms / kTermsPerDocument; ++i) {
+      std::string text;
+      for (std::size_t j = 0; j < kTermsPerDocument; ++j) {
+        text += TextMaker::WordNumber((i * kTermsPerDocument + j) % kManyTerms) + " ";
+      }
+      place.Run(Upsert(Document(i, text)));
+    }
+    place.Run(Request("commit"));
+    return true;
+  }();
+  benchmark::DoNotOptimize(filled);
+  return place;
+}
+
+void BM_CollectTerms(benchmark::State& state) {
+  Place& place = PlaceOfManyTerms();
+  Json::Value request = Request("update_term_suggestion");
+  request["data"]["db_name"] = "bench";
+  request["data"]["doc_id_field"] = "TARNMDPath";
+  for (auto _ : state) {
+    place.Run(request);
+    place.Run(Request("commit"));
+  }
+}
+BENCHMARK(BM_CollectTerms)->Unit(benchmark::kMillisecond)->UseRealTime()->Iterations(3);
+
+// A search that finds nothing, with another spelling of each word; needs the words of
+// BM_CollectTerms.
+void Suggest(benchmark::State& state, const std::string& query) {
+  Place& place = PlaceOfManyTerms();
+  Json::Value request;
+  request["command"] = "search";
+  request["data"]["query"] = query;
+  bool suggested = false;
+  for (auto _ : state) suggested = place.Run(request)["data"].isMember("suggestion");
+  state.counters["suggested"] = suggested ? 1 : 0;
+}
+
+// A word with its third and fourth letters swapped.
+std::string Swapped(std::size_t number) {
+  std::string word = TextMaker::WordNumber(number);
+  std::swap(word.at(2), word.at(3));
+  return word;
+}
+BENCHMARK_CAPTURE(Suggest, one_word, Swapped(400500))->Unit(benchmark::kMillisecond);
+BENCHMARK_CAPTURE(Suggest, word_like_none, "qqqqwwww")->Unit(benchmark::kMillisecond);
+BENCHMARK_CAPTURE(Suggest, two_words, Swapped(400500) + " OR " + Swapped(500700))
+    ->Unit(benchmark::kMillisecond);
+
+void Complete(benchmark::State& state, const std::string& prefix) {
+  Place& place = PlaceOfManyTerms();
+  Json::Value request;
+  request["command"] = "complete";
+  request["data"]["prefix"] = prefix;
+  for (auto _ : state) place.Run(request);
+}
+BENCHMARK_CAPTURE(Complete, one_letter, "b")->Unit(benchmark::kMillisecond);
+BENCHMARK_CAPTURE(Complete, three_letters, "bac")->Unit(benchmark::kMillisecond);
+
 }  // namespace
 }  // namespace quarry::engine

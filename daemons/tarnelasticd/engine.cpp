@@ -16,6 +16,7 @@
 #include "daemons/tarnelasticd/search.h"
 #include "daemons/tarnelasticd/search_session.h"
 #include "daemons/tarnelasticd/selection.h"
+#include "daemons/tarnelasticd/suggestion.h"
 
 namespace quarry::engine {
 namespace {
@@ -110,6 +111,7 @@ const std::map<std::string, Engine::Command>& Engine::Commands() {
       {"commit", {&Engine::Commit, false}},
       {"update_term_suggestion", {&Engine::UpdateTermSuggestion, false}},
       {"search", {&Engine::Search, false}},
+      {"complete", {&Engine::Complete, false}},
       {"engine_status", {&Engine::Status, true}},
   };
   return commands;
@@ -306,7 +308,18 @@ Json::Value Engine::Search(const Json::Value& data) {
   ParseQuery(request.query);
   SearchSession session(std::chrono::steady_clock::now() + options_.search_time);
   AddIndexes(data, &session);
-  return session.Run(request);
+  return session.Ask([&request](const std::vector<SearchedIndex>& indexes) {
+    return quarry::engine::Search(request, indexes);
+  });
+}
+
+Json::Value Engine::Complete(const Json::Value& data) {
+  const CompletionRequest request = ParseCompletionRequest(data);
+  SearchSession session(std::chrono::steady_clock::now() + options_.search_time);
+  AddIndexes(data, &session);
+  return session.Ask([&request](const std::vector<SearchedIndex>& indexes) {
+    return CompleteWord(request, indexes);
+  });
 }
 
 Json::Value Engine::Status(const Json::Value& /*data*/) {

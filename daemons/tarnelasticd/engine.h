@@ -77,6 +77,7 @@ class Engine {
   Json::Value Commit(const Json::Value& data);
   Json::Value UpdateTermSuggestion(const Json::Value& data);
   Json::Value Search(const Json::Value& data);
+  Json::Value Complete(const Json::Value& data);
   Json::Value Status(const Json::Value& data);
 
   std::string Epoch() const;

@@ -7,6 +7,7 @@
 #include "daemons/tarnelasticd/compression.h"
 #include "daemons/tarnelasticd/document.h"
 #include "daemons/tarnelasticd/index_files.h"
+#include "daemons/tarnelasticd/terms.h"
 
 namespace quarry::engine {
 
@@ -136,6 +137,7 @@ void Index::CopyDocuments(const Schema& schema, const std::string& database_path
     text.Reset();
     writer.Upsert(PrepareDocument(schema, rows.Text(1), document));
   }
+  if (HasTerms(&reader->db())) writer.RequestTerms();
   writer.Commit();
 }
 

@@ -8,6 +8,7 @@
 #include "daemons/tarnelasticd/compression.h"
 #include "daemons/tarnelasticd/engine_error.h"
 #include "daemons/tarnelasticd/request.h"
+#include "daemons/tarnelasticd/terms.h"
 
 namespace quarry::engine {
 namespace {
@@ -166,7 +167,7 @@ void IndexWriter::CommitNow() {
   if (db_.HasMoved()) throw Error(kDamagedIndex, "The index's database has been removed");
   transaction_bytes_ += buffer_.bytes();
   buffer_.Flush(*schema_, &db_, tokenizer_);
-  if (terms_requested_) RebuildTerms();
+  if (terms_requested_) CollectTerms(&db_);
   db_.Prepare("INSERT OR REPLACE INTO meta(key,value) VALUES('documents',?1)")
       .Bind(1, documents_.load())
       .Run();
@@ -197,14 +198,6 @@ bool IndexWriter::TakeLost() {
 
 void IndexWriter::RequestTerms() {
   Change([this] { return terms_requested_ = true; });
-}
-
-// A word that stands in one document alone is as likely a slip as a word.
-void IndexWriter::RebuildTerms() {
-  db_.Execute(
-      "DELETE FROM terms;"
-      "INSERT INTO terms(term,documents) SELECT term,doc FROM body_terms "
-      "WHERE doc>1 AND length(term) BETWEEN 3 AND 40;");
 }
 
 std::optional<IndexWriter::Found> IndexWriter::FindByPath(std::string_view path) {

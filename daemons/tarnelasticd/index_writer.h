@@ -96,7 +96,6 @@ class IndexWriter {
   void Rollback() noexcept;
   void CommitNow();
   void LoadCounters();
-  void RebuildTerms();
   void KeepWithinLimits();
   bool IsOld() const;
 

@@ -87,10 +87,10 @@ class Parser {
     }
     if (const auto kind = TakeKey()) {
       term.kind = *kind;
-      term.text = TakeValue();
+      TakeValue(&term);
       CheckFilter(&term);
     } else {
-      term.text = TakeValue();
+      TakeValue(&term);
       TakeStar(&term);
     }
     return term;
@@ -112,7 +112,7 @@ class Parser {
   }
 
   // A text in quotes, or all up to the next blank.
-  std::string TakeValue() {
+  void TakeValue(QueryTerm* term) {
     const std::size_t begin = at_;
     if (!AtEnd() && text_[at_] == '"') {
       const std::size_t end = text_.find('"', at_ + 1);
@@ -120,10 +120,13 @@ class Parser {
         FailSyntax("The quote at character " + std::to_string(begin + 1) + " is not closed.");
       }
       at_ = end + 1;
-      return std::string(text_.substr(begin + 1, end - begin - 1));
+      term->begin = begin + 1;
+      term->text = text_.substr(begin + 1, end - begin - 1);
+      return;
     }
     while (!AtEnd() && !IsBlank(text_[at_])) ++at_;
-    return std::string(text_.substr(begin, at_ - begin));
+    term->begin = begin;
+    term->text = text_.substr(begin, at_ - begin);
   }
 
   // The star stands behind a word, or behind the closing quote.

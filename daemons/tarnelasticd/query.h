@@ -28,8 +28,9 @@ struct QueryTerm {
   enum class Kind { kWords, kName, kExtension, kType, kInside };
   Kind kind = Kind::kWords;
   bool negated = false;
-  bool prefix = false;  // the last word may go on
-  std::string text;     // as typed, without quotes and signs
+  bool prefix = false;    // the last word may go on
+  std::string text;       // as typed, without quotes and signs
+  std::size_t begin = 0;  // where `text` begins in what was typed, in bytes
   // The single values in `text`: for kType and kExtension in lower case, for kName folded and set
   // by Resolve().
   std::vector<std::string> values;

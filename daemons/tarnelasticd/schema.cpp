@@ -3,6 +3,7 @@
 #include "daemons/tarnelasticd/database.h"
 #include "daemons/tarnelasticd/engine_error.h"
 #include "daemons/tarnelasticd/field_names.h"
+#include "daemons/tarnelasticd/terms.h"
 #include "daemons/tarnelasticd/text_tokenizer.h"
 
 namespace quarry::engine {
@@ -157,9 +158,7 @@ std::string Schema::CreateStatements() const {
   add_words("body", ColumnList("t", std::max<std::size_t>(text_columns_, 1)), kTextTokenizer);
   add_words("labels", "name,extra", kTextTokenizer);
   add_words("names", "name", "trigram case_sensitive 1");
-  sql += "CREATE TABLE terms(term TEXT PRIMARY KEY, documents INTEGER) WITHOUT ROWID;";
-  sql += "CREATE VIRTUAL TABLE body_terms USING fts5vocab('body', 'row');";
-  return sql;
+  return sql + CreateTermTables();
 }
 
 }  // namespace quarry::engine

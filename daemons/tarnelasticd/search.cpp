@@ -1,9 +1,11 @@
 #include "daemons/tarnelasticd/search.h"
 
 #include <algorithm>
+#include <optional>
 #include <set>
 #include <utility>
 
+#include "common/error.h"
 #include "common/file_util.h"
 #include "daemons/tarnelasticd/compression.h"
 #include "daemons/tarnelasticd/document.h"
@@ -12,6 +14,7 @@
 #include "daemons/tarnelasticd/ranking.h"
 #include "daemons/tarnelasticd/request.h"
 #include "daemons/tarnelasticd/snippet.h"
+#include "daemons/tarnelasticd/suggestion.h"
 
 namespace quarry::engine {
 namespace {
@@ -23,6 +26,44 @@ SortOrder ParseSort(const Json::Value& data) {
   if (sort == "path") return SortOrder::kPath;
   if (sort == "time") return SortOrder::kTime;
   FailMalformed("sort must be score, path or time");
+}
+
+// The query, ready to be asked.
+Query MakeQuery(const std::string& text, const std::string& inside,
+                const std::vector<SearchedIndex>& indexes) {
+  Query query = ParseQuery(text);
+  if (!indexes.empty()) Resolve(indexes.front().reader->tokenizer(), &query);
+  if (!inside.empty()) query.groups.push_back({InsideTerm(inside)});
+  return query;
+}
+
+std::vector<Matches> FindAll(const Query& query, const std::vector<SearchedIndex>& indexes) {
+  std::vector<Matches> matches;
+  for (const SearchedIndex& index : indexes) {
+    matches.push_back(FindMatches(*index.schema, query, index.reader));
+  }
+  return matches;
+}
+
+std::size_t CountAll(const std::vector<Matches>& matches) {
+  std::size_t total = 0;
+  for (const Matches& found : matches) total += found.documents.Count();
+  return total;
+}
+
+// The corrected query, if it finds more than the `total` documents of the query as it is. Whatever
+// keeps a correction from being found, it must not keep the hits from whoever asked.
+std::optional<std::string> SuggestQuery(const SearchRequest& request, const Query& query,
+                                        std::size_t total,
+                                        const std::vector<SearchedIndex>& indexes) {
+  try {
+    std::optional<std::string> better = CorrectQuery(request.query, query, indexes);
+    if (!better) return std::nullopt;
+    const Query corrected = MakeQuery(*better, request.inside, indexes);
+    return CountAll(FindAll(corrected, indexes)) > total ? better : std::nullopt;
+  } catch (const Error&) {
+    return std::nullopt;
+  }
 }
 
 // The weight of each word over all indexes.
@@ -153,16 +194,10 @@ SearchRequest ParseSearchRequest(const Json::Value& data) {
 }
 
 Json::Value Search(const SearchRequest& request, const std::vector<SearchedIndex>& indexes) {
-  Query query = ParseQuery(request.query);
-  if (!indexes.empty()) Resolve(indexes.front().reader->tokenizer(), &query);
-  if (!request.inside.empty()) query.groups.push_back({InsideTerm(request.inside)});
+  const Query query = MakeQuery(request.query, request.inside, indexes);
   const std::vector<const QueryTerm*> terms = RankedTerms(query);
-  std::vector<Matches> matches;
-  std::size_t total = 0;
-  for (const SearchedIndex& index : indexes) {
-    matches.push_back(FindMatches(*index.schema, query, index.reader));
-    total += matches.back().documents.Count();
-  }
+  const std::vector<Matches> matches = FindAll(query, indexes);
+  const std::size_t total = CountAll(matches);
   SortOrder order = request.sort;
   if (order == SortOrder::kDefault) order = terms.empty() ? SortOrder::kPath : SortOrder::kScore;
   Json::Value found;
@@ -171,6 +206,11 @@ Json::Value Search(const SearchRequest& request, const std::vector<SearchedIndex
   for (const Ranked& ranked : MakePage(request, query, indexes, matches, order)) {
     indexes[ranked.index].reader->CheckDeadline();
     found["hits"].append(HitJson(indexes[ranked.index], ranked, terms, request.snippet_length));
+  }
+  if (total < kFewDocuments) {
+    if (auto better = SuggestQuery(request, query, total, indexes)) {
+      found["suggestion"] = *std::move(better);
+    }
   }
   return found;
 }

@@ -49,8 +49,9 @@ struct SearchedIndex {
 };
 
 // Runs a search over indexes that stand still. Word weights are those of all indexes together, so
-// that scores can be compared. Returns {"total", "hits"} as the protocol says. Throws Error
-// kQuerySyntax, kSearchTooLong, or as Database does.
+// that scores can be compared. Returns {"total", "hits"} as the protocol says, and "suggestion"
+// when few are found and another spelling of the query finds more. Throws Error kQuerySyntax,
+// kSearchTooLong, or as Database does.
 Json::Value Search(const SearchRequest& request, const std::vector<SearchedIndex>& indexes);
 
 }  // namespace quarry::engine

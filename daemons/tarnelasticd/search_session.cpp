@@ -36,19 +36,19 @@ void SearchSession::Skip(const std::string& id, const Error& why) {
   skipped_.emplace_back(id, why);
 }
 
-Json::Value SearchSession::SearchParts(const SearchRequest& request) const {
+Json::Value SearchSession::AskParts(const Question& question) const {
   std::vector<SearchedIndex> indexes;
   for (const auto& part : parts_) indexes.push_back(part->Searched());
-  return Search(request, indexes);
+  return question(indexes);
 }
 
 // Which index it is that fails is found out by asking each alone.
-bool SearchSession::DropBroken(const SearchRequest& request) {
+bool SearchSession::DropBroken(const Question& question) {
   const std::size_t before = parts_.size();
   std::vector<std::unique_ptr<Part>> sound;
   for (auto& part : parts_) {
     try {
-      Search(request, {part->Searched()});
+      question({part->Searched()});
       sound.push_back(std::move(part));
     } catch (const Error& error) {
       if (!IsFaultOfAnIndex(error)) throw;
@@ -60,15 +60,15 @@ bool SearchSession::DropBroken(const SearchRequest& request) {
   return parts_.size() < before;
 }
 
-Json::Value SearchSession::Run(const SearchRequest& request) {
+Json::Value SearchSession::Ask(const Question& question) {
   Json::Value found;
   for (bool done = false; !done;) {
     if (parts_.empty() && !skipped_.empty()) throw Error(skipped_.front().second);
     try {
-      found = SearchParts(request);
+      found = AskParts(question);
       done = true;
     } catch (const Error& error) {
-      if (!IsFaultOfAnIndex(error) || !DropBroken(request)) throw;
+      if (!IsFaultOfAnIndex(error) || !DropBroken(question)) throw;
     }
   }
   for (const auto& [id, error] : skipped_) {

@@ -1,4 +1,4 @@
-// One search over indexes that may move, break or vanish meanwhile.
+// One question to indexes that may move, break or vanish meanwhile.
 
 #ifndef QUARRY_DAEMONS_TARNELASTICD_SEARCH_SESSION_H_
 #define QUARRY_DAEMONS_TARNELASTICD_SEARCH_SESSION_H_
@@ -6,6 +6,7 @@
 #include <json/json.h>
 
 #include <chrono>
+#include <functional>
 #include <memory>
 #include <string>
 #include <vector>
@@ -28,9 +29,13 @@ class SearchSession {
   // Tells that an index takes no part.
   void Skip(const std::string& id, const Error& why);
 
-  // Returns {"total", "hits"}, and "skipped" where an index took no part. Throws Error as Search()
-  // does, and the first index's own error when none could take part.
-  Json::Value Run(const SearchRequest& request);
+  // What is asked of the indexes that take part. Returns an object.
+  using Question = std::function<Json::Value(const std::vector<SearchedIndex>& indexes)>;
+
+  // Returns the answer, with "skipped" where an index took no part. Asks again without the indexes
+  // that are at fault when it fails. Throws Error as the question does, and the first index's own
+  // error when none could take part.
+  Json::Value Ask(const Question& question);
 
  private:
   // An index and its reader. Members are given back in reverse.
@@ -45,8 +50,8 @@ class SearchSession {
     ReaderPool::Lease reader;
   };
 
-  Json::Value SearchParts(const SearchRequest& request) const;
-  bool DropBroken(const SearchRequest& request);
+  Json::Value AskParts(const Question& question) const;
+  bool DropBroken(const Question& question);
 
   const std::chrono::steady_clock::time_point deadline_;
   std::vector<std::unique_ptr<Part>> parts_;

@@ -55,7 +55,7 @@ TEST_F(RequestTest, RefusesDataThatIsNoObject) {
        {"index_create", "index_delete", "index_pause", "index_resume", "index_config_set",
         "document_upsert_by_id", "document_set_by_id", "document_del_by_id",
         "document_del_by_query", "document_get_by_query", "commit", "update_term_suggestion",
-        "search"}) {
+        "search", "complete"}) {
     const std::string begin = std::string(R"({"command":")") + command + '"';
     EXPECT_EQ(ErrorOf(begin + "}"), "1402 Missing property: data") << command;
     for (const char* data : {"null", "1", "\"a\"", "[]"}) {
@@ -79,6 +79,8 @@ TEST_F(RequestTest, RefusesIndexesWithoutAName) {
   }
   EXPECT_EQ(ErrorOf(R"({"command":"update_term_suggestion","data":{"doc_id_field":"x"}})"),
             "1402 Missing property: db_name");
+  EXPECT_EQ(ErrorOf(R"({"command":"update_term_suggestion","data":{"db_name":"a"}})"),
+            "1402 Missing property: doc_id_field");
 }
 
 TEST_F(RequestTest, NamesIndexesThatAreUnknown) {
@@ -259,24 +261,6 @@ TEST_F(RequestTest, AnswersAnEmptyBatchAndRefusesOneThatIsNoArray) {
             R"({"data":[],"has_fail":false,"success":true})");
   EXPECT_EQ(ErrorOf(R"({"compound":{}})"), "1402 Not an array: compound");
   EXPECT_EQ(ErrorOf(R"({"compound":null})"), "1402 Not an array: compound");
-}
-
-TEST_F(RequestTest, SuggestsTheWordsThatSeveralDocumentsHave) {
-  Add("/s/1.txt", "harbour lighthouse");
-  Add("/s/2.txt", "harbour storm");
-  Json::Value data;
-  data["db_name"] = "a";
-  data["doc_id_field"] = "TARNMDTextContent";
-  Ask("update_term_suggestion", data);
-  Commit();
-  data.removeMember("doc_id_field");
-  EXPECT_EQ(AskError("update_term_suggestion", data), 1402);
-  Database db(DatabasePath(DirectoryOf("a")));
-  Statement terms = db.Prepare("SELECT term,documents FROM terms");
-  ASSERT_TRUE(terms.Step());
-  EXPECT_EQ(terms.Text(0), "harbour");
-  EXPECT_EQ(terms.Int(1), 2);
-  EXPECT_FALSE(terms.Step());
 }
 
 TEST_F(RequestTest, ReportsItsIndexes) {

@@ -1,0 +1,61 @@
+// The words of one index that are there to be suggested.
+//
+// Two tables keep them: "terms" by their beginnings, with the number of documents, and
+// "term_blocks" by their lengths: all words of so many letters and so many bytes in a row, without
+// anything between them. Reading through those of about the right length is faster than any index
+// that would lead to the few similar ones, and takes no more room than the words.
+
+#ifndef QUARRY_DAEMONS_TARNELASTICD_TERMS_H_
+#define QUARRY_DAEMONS_TARNELASTICD_TERMS_H_
+
+#include <cstddef>
+#include <cstdint>
+#include <functional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "daemons/tarnelasticd/database.h"
+
+namespace quarry::engine {
+
+struct Term {
+  std::string text;            // folded
+  std::int64_t documents = 0;  // that had it when the words were collected
+};
+
+// Shorter words are never suggested, nor are longer ones, which nobody types.
+constexpr std::int64_t kMinTermLetters = 3;
+constexpr std::int64_t kMaxTermLetters = 40;
+
+// The statements that make the tables.
+std::string CreateTermTables();
+
+// Collects the words of all documents anew, inside the transaction that is open. Throws Error as
+// Database does, as all below do.
+void CollectTerms(Database* db);
+
+// Whether words have been collected, and there were any.
+bool HasTerms(Database* db);
+
+// How many documents had the word; 0 for one that was not collected.
+std::int64_t DocumentsWith(Database* db, std::string_view term);
+
+// The words that begin with these bytes, at most `size`: those of most documents first, then in
+// order of their bytes.
+std::vector<Term> TermsThatBegin(Database* db, std::string_view prefix, std::size_t size);
+
+struct NearTerm {
+  Term term;
+  std::size_t distance = 0;
+};
+
+// The words at a distance of 1 to `limit` from `word`, which is folded, at most `size`: the nearest
+// first, then those of most documents, then in order of their bytes. `check` is called every now
+// and then, and may throw to give up.
+std::vector<NearTerm> TermsNear(Database* db, std::string_view word, std::size_t limit,
+                                std::size_t size, const std::function<void()>& check);
+
+}  // namespace quarry::engine
+
+#endif  // QUARRY_DAEMONS_TARNELASTICD_TERMS_H_

@@ -1,0 +1,211 @@
+// The words of an index against a model that reads them all.
+
+#include "daemons/tarnelasticd/terms.h"
+
+#include <algorithm>
+#include <map>
+#include <random>
+#include <set>
+
+#include "daemons/tarnelasticd/edit_distance.h"
+#include "daemons/tarnelasticd/index_files.h"
+#include "daemons/tarnelasticd/text_tokenizer.h"
+#include "tests/daemons/tarnelasticd/support/engine_fixture.h"
+
+namespace quarry::engine {
+
+void PrintTo(const Term& term, std::ostream* out) {
+  *out << term.text << ' ' << term.documents;
+}
+
+namespace {
+
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+using Words = std::map<std::string, std::int64_t>;
+
+class TermsTest : public EngineTest {
+ protected:
+  TermsTest() { Create(); }
+
+  // Collects the words and closes the engine, so that the database can be looked at.
+  void Collect() {
+    Ask("update_term_suggestion", Parse(R"({"db_name":"a","doc_id_field":"TARNMDPath"})"));
+    Commit();
+    db_ = std::make_unique<Database>(DatabasePath(DirectoryOf("a")));
+  }
+  Words Collected() {
+    Words words;
+    Statement rows = db_->Prepare("SELECT term,documents FROM terms");
+    while (rows.Step()) words[std::string(rows.Text(0))] = rows.Int(1);
+    return words;
+  }
+  std::vector<std::string> Begin(const std::string& prefix, std::size_t size = 10) {
+    std::vector<std::string> texts;
+    for (const Term& term : TermsThatBegin(db_.get(), prefix, size)) texts.push_back(term.text);
+    return texts;
+  }
+  std::vector<std::string> Near(const std::string& word, std::size_t limit = 1,
+                                std::size_t size = 10) {
+    std::vector<std::string> texts;
+    for (const NearTerm& near : TermsNear(db_.get(), word, limit, size, [] {})) {
+      texts.push_back(near.term.text);
+    }
+    return texts;
+  }
+
+  std::unique_ptr<Database> db_;
+};
+
+TEST_F(TermsTest, AreWordsOfSeveralTextsAndOfAnyName) {
+  Add("/s/Sailing-2019.odt", "harbour lighthouse ox 12");
+  Add("/s/b-2020.odt", "harbour Lighthouse storm sailing ox 12");
+  Add("/s/c-2020.odt", "harbour");
+  Collect();
+  EXPECT_EQ(Collected(),
+            (Words{{"harbour", 3}, {"lighthouse", 2}, {"odt", 3}, {"sailing", 1}, {"2020", 2}}));
+}
+
+TEST_F(TermsTest, AreOfMiddlingLength) {
+  const std::string longest(static_cast<std::size_t>(kMaxTermLetters), 'x');
+  const std::string text =
+      "ab abc " + longest + " " + longest + "x \xD0\xB0\xD0\xB1 \xD0\xB0\xD0\xB1\xD0\xB2";
+  Add("/s/1", text);
+  Add("/s/2", text);
+  Collect();
+  EXPECT_EQ(Collected(), (Words{{"abc", 2}, {longest, 2}, {"\xD0\xB0\xD0\xB1\xD0\xB2", 2}}));
+}
+
+TEST_F(TermsTest, AreThoseOfTheLastCollection) {
+  db_ = std::make_unique<Database>(DatabasePath(DirectoryOf("a")));
+  EXPECT_FALSE(HasTerms(db_.get()));
+  Add("/s/harbour");
+  EXPECT_FALSE(HasTerms(db_.get()));
+  Collect();
+  EXPECT_TRUE(HasTerms(db_.get()));
+  Ask("document_del_by_id", Parse(R"({"id":"a","doc_id":"/s/harbour"})"));
+  Add("/s/lighthouse");
+  EXPECT_THAT(Near("harbou"), ElementsAre("harbour"));
+  Collect();
+  EXPECT_EQ(Collected(), (Words{{"lighthouse", 1}}));
+  EXPECT_THAT(Near("harbou"), IsEmpty());
+  EXPECT_THAT(Near("lighthuose"), ElementsAre("lighthouse"));
+  EXPECT_EQ(DocumentsWith(db_.get(), "lighthouse"), 1);
+  EXPECT_EQ(DocumentsWith(db_.get(), "harbour"), 0);
+}
+
+TEST_F(TermsTest, SurviveOtherMappings) {
+  Add("/s/harbour");
+  Collect();
+  db_.reset();
+  Json::Value create = CreateRequest("a", DirectoryOf("a"))["data"];
+  create["mappings"]["properties"]["TARNMDAnother"]["type"] = "text";
+  Ask("index_create", create);
+  db_ = std::make_unique<Database>(DatabasePath(DirectoryOf("a")));
+  EXPECT_EQ(Collected(), (Words{{"harbour", 1}}));
+}
+
+TEST_F(TermsTest, ComeInOrderOfTheirDocuments) {
+  Add("/s/1", "planet plan plane plank");
+  Add("/s/2", "planet plan plane plank");
+  Add("/s/3", "planet plane");
+  Collect();
+  EXPECT_THAT(Begin("pla"), ElementsAre("plane", "planet", "plan", "plank"));
+  EXPECT_THAT(Begin("pla", 3), ElementsAre("plane", "planet", "plan"));
+  EXPECT_THAT(Begin("planet"), ElementsAre("planet"));
+  EXPECT_THAT(Begin("planets"), IsEmpty());
+  EXPECT_THAT(Begin("\xFF"), IsEmpty());
+  EXPECT_THAT(Near("plany"), ElementsAre("plane", "plan", "plank"));
+  EXPECT_THAT(Near("plany", 1, 1), ElementsAre("plane"));
+  EXPECT_THAT(Near("planet", 2), ElementsAre("plane", "plan", "plank"));
+}
+
+TEST_F(TermsTest, GivesUpWhenTold) {
+  Add("/s/harbour");
+  Collect();
+  const auto give_up = [] { throw Error(kSearchTooLong, "late"); };
+  EXPECT_THROW(TermsNear(db_.get(), "harbou", 1, 10, give_up), Error);
+}
+
+class ManyTermsTest : public TermsTest {
+ protected:
+  std::string Word() {
+    static const std::vector<std::string> kLetters = {"a",
+                                                      "b",
+                                                      "c",
+                                                      "d",
+                                                      "e",
+                                                      "o",
+                                                      "t",
+                                                      "7",
+                                                      "\xC3\xB8",
+                                                      "\xD0\xB1",
+                                                      "\xE6\xBC\xA2",
+                                                      "\xF0\x90\x90\xB0"};
+    std::string word;
+    for (std::size_t letters = random_() % 10 + 2; letters > 0; --letters) {
+      word += kLetters[random_() % kLetters.size()];
+    }
+    return word;
+  }
+  void AddDocuments() {
+    std::vector<std::string> words;
+    for (int i = 0; i < 3000; ++i) words.push_back(Word());
+    for (int document = 0; document < 20; ++document) {
+      std::string text;
+      for (int i = 0; i < 1500; ++i) text += words[random_() % words.size()] + ' ';
+      Upsert(FileDocument("/s/" + std::to_string(document), text));
+    }
+  }
+
+  std::mt19937 random_{7};
+};
+
+// What a scan over all words finds.
+std::vector<std::string> NaiveNear(const Words& words, const std::string& word, std::size_t limit,
+                                   std::size_t size) {
+  std::set<std::tuple<std::size_t, std::int64_t, std::string>> near;
+  for (const auto& [term, documents] : words) {
+    const std::size_t distance = EditDistance(CodePoints(word), CodePoints(term), limit);
+    if (distance > 0 && distance <= limit) near.emplace(distance, -documents, term);
+  }
+  std::vector<std::string> texts;
+  for (const auto& [distance, documents, term] : near) {
+    if (texts.size() < size) texts.push_back(term);
+  }
+  return texts;
+}
+
+std::vector<std::string> NaiveBegin(const Words& words, const std::string& prefix,
+                                    std::size_t size) {
+  std::set<std::pair<std::int64_t, std::string>> begin;
+  for (const auto& [term, documents] : words) {
+    if (term.rfind(prefix, 0) == 0) begin.emplace(-documents, term);
+  }
+  std::vector<std::string> texts;
+  for (const auto& [documents, term] : begin) {
+    if (texts.size() < size) texts.push_back(term);
+  }
+  return texts;
+}
+
+TEST_F(ManyTermsTest, AreFoundAsByAScanOverAll) {
+  AddDocuments();
+  Collect();
+  const Words words = Collected();
+  ASSERT_GT(words.size(), 2000U);
+  const TextTokenizer tokenizer(db_->handle());
+  for (int i = 0; i < 60; ++i) {
+    const std::string word = tokenizer.Fold(Word());
+    for (const std::size_t limit : {1U, 2U}) {
+      ASSERT_EQ(Near(word, limit, 64), NaiveNear(words, word, limit, 64)) << word << ' ' << limit;
+    }
+    ASSERT_EQ(Near(word, 2, 3), NaiveNear(words, word, 2, 3)) << word;
+    const std::string prefix = word.substr(0, random_() % 4 + 1);
+    ASSERT_EQ(Begin(prefix), NaiveBegin(words, prefix, 10)) << prefix;
+  }
+}
+
+}  // namespace
+}  // namespace quarry::engine
