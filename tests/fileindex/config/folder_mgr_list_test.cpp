@@ -46,6 +46,17 @@ TEST_F(FolderMgrListTest, SortsByTextWithoutRegardToCase) {
   EXPECT_EQ(total_, 4U);
 }
 
+TEST_F(FolderMgrListTest, LettersBeyondAsciiHaveNoCaseEither) {
+  FolderMgr folders;
+  for (const char* name : {"Éb", "éc", "éa"})
+    Upsert(folders, Make(std::string("/s/") + name, "", name));
+  for (const char* key : {"path", "name"}) {
+    std::vector<FolderPtr> out;
+    folders.List(out, total_, 0, 9, key, "asc");
+    EXPECT_THAT(Paths(out), ElementsAre("/s/éa", "/s/Éb", "/s/éc")) << key;
+  }
+}
+
 TEST_F(FolderMgrListTest, OnlyTheExactWordTurnsTheOrderRound) {
   for (const char* direction : {"", "asc", "DESC", "desc ", "descending"}) {
     EXPECT_THAT(Page(0, 1, "path", direction), ElementsAre("/s/a")) << direction;
