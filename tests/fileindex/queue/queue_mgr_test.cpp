@@ -220,6 +220,31 @@ TEST_F(QueueMgrTest, TreesAreBuiltOnceAndKept) {
   EXPECT_EQ(tree->ops.size(), 1u);
 }
 
+TEST_F(QueueMgrTest, WhatWasProcessedOnceIsProcessedAgainAsItWas) {
+  for (const bool use_tmp : {false, true}) {
+    WriteLive(Line(EVENT_MODIFY, "/a"));
+    QueueMgr manager(live_);
+    const auto count = [](std::shared_ptr<OP>) {};
+    EXPECT_EQ(manager.ProcessOP(count, use_tmp), 1);
+    test::WriteFile(use_tmp ? tmp_ : live_, Line(EVENT_MODIFY, "/a") + Line(EVENT_MODIFY, "/b"));
+    EXPECT_EQ(manager.ProcessOP(count, use_tmp), 1);
+  }
+}
+
+// What came to its name meanwhile was never read.
+TEST_F(QueueMgrTest, OnlyTheSnapshotThatWasReadIsDeletedAtASecondAttempt) {
+  WriteLive(Line(EVENT_MODIFY, "/a"));
+  QueueMgr manager(live_);
+  manager.ProcessOP([](std::shared_ptr<OP>) {}, true);
+  fake::FailSystemCall("unlink", 1, EACCES);
+  EXPECT_EQ(manager.DeleteTmp(), -1);
+  WriteLive("new");
+  ASSERT_EQ(rename(live_.c_str(), tmp_.c_str()), 0);
+  EXPECT_EQ(manager.DeleteTmp(), -1);
+  EXPECT_EQ(errno, ENOENT);
+  EXPECT_EQ(test::ReadFile(tmp_), "new");
+}
+
 TEST_F(QueueMgrTest, TreeOfAMissingQueue) {
   QueueMgr manager(live_);
   EXPECT_EQ(Refusal([&manager] { manager.GetOPTree(); }).code(), 502);
