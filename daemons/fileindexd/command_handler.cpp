@@ -7,6 +7,7 @@
 
 #include "common/error.h"
 #include "common/json.h"
+#include "daemons/common/reply.h"
 
 namespace quarry::fileindexd {
 namespace {
@@ -87,29 +88,17 @@ Json::Value Run(CommandTarget& target, const std::string& text) {
   return command->second(target, request.isMember("data") ? request["data"] : Json::Value());
 }
 
-Json::Value Refusal(int code, const std::string& reason) {
-  Json::Value answer;
-  answer["success"] = false;
-  answer["error"]["code"] = code;
-  answer["error"]["msg"] = reason;
-  return answer;
-}
-
 }  // namespace
 
 std::string HandleCommand(CommandTarget& target, const std::string& request) {
-  Json::Value answer;
   try {
-    const Json::Value data = Run(target, request);
-    answer["success"] = true;
-    if (!data.isNull()) answer["data"] = data;
+    return toString(daemon::SuccessReply(Run(target, request)));
   } catch (const Error& error) {
-    answer = Refusal(error.code(), error.reason());
+    return toString(daemon::FailureReply(error.code(), error.reason()));
   } catch (const std::exception& error) {
     // The library's callers wait for an answer as long as there is none.
-    answer = Refusal(kErrorSystem, error.what());
+    return toString(daemon::FailureReply(kErrorSystem, error.what()));
   }
-  return toString(answer);
 }
 
 }  // namespace quarry::fileindexd

@@ -9,6 +9,7 @@
 #include "common/error.h"
 #include "common/file_util.h"
 #include "common/json.h"
+#include "daemons/common/reply.h"
 #include "daemons/tarncontentextractd/path_open.h"
 #include "daemons/tarncontentextractd/stamp.h"
 
@@ -42,14 +43,6 @@ void AddFields(const std::vector<Field>& fields, Json::Value& document) {
   for (const Field& field : fields) {
     if (!document.isMember(field.name)) document[field.name] = ToJson(field.value);
   }
-}
-
-Json::Value ErrorAnswer(const Error& error) {
-  Json::Value answer(Json::objectValue);
-  answer["success"] = false;
-  answer["error"]["code"] = static_cast<int>(error.code());
-  answer["error"]["msg"] = error.reason();
-  return answer;
 }
 
 }  // namespace
@@ -108,17 +101,14 @@ Json::Value ExtractService::Answer(const std::string& request) {
   GetJsonValue(path, data, "path", true);
   GetJsonValue(options, data, "options", false);
   GetJsonValue(need_meta, options, "need_meta", isObject(options) && options.isMember("need_meta"));
-  Json::Value answer(Json::objectValue);
-  answer["data"] = ParseFile(path, need_meta);
-  answer["success"] = true;
-  return answer;
+  return daemon::SuccessReply(ParseFile(path, need_meta));
 }
 
 std::string ExtractService::Handle(const std::string& request) {
   try {
     return toString(Answer(request));
   } catch (const Error& error) {
-    return toString(ErrorAnswer(error));
+    return toString(daemon::FailureReply(error.code(), error.reason()));
   }
 }
 
