@@ -43,6 +43,8 @@ int Run(CLI::App& app, int argc, char** argv) {
     return quarry::cli::kExitDone;
   } catch (const CLI::ParseError& error) {
     return app.exit(error) == 0 ? quarry::cli::kExitDone : kExitUsage;
+  } catch (const quarry::cli::Unwell&) {
+    return kExitFailed;
   } catch (const quarry::Error& error) {
     return Fail(json, error.code(), error.reason(), quarry::cli::Explain(error));
   } catch (const quarry::cli::Problem& problem) {
@@ -76,6 +78,7 @@ int main(int argc, char** argv) {
   quarry::cli::AddSearchCommand(app);
   quarry::cli::AddStatusCommand(app);
   quarry::cli::AddQueueCommand(app);
+  quarry::cli::AddDoctorCommand(app);
   quarry::cli::AddPauseCommands(app);
   quarry::cli::AddVolumeCommand(app);
   quarry::cli::AddHomeCommand(app);

@@ -3,6 +3,7 @@
 #ifndef QUARRY_CLI_PROBLEM_H_
 #define QUARRY_CLI_PROBLEM_H_
 
+#include <exception>
 #include <stdexcept>
 #include <string>
 
@@ -17,6 +18,12 @@ enum ExitCode { kExitDone = 0, kExitFailed = 1, kExitUsage = 2 };
 class Problem : public std::runtime_error {
  public:
   explicit Problem(const std::string& sentence) : std::runtime_error(sentence) {}
+};
+
+// Ends a command whose output says already what is wrong.
+class Unwell : public std::exception {
+ public:
+  const char* what() const noexcept override { return "Something is wrong."; }
 };
 
 // The library's error as one line for a person: what happened and, where something can be done

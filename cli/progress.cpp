@@ -1,14 +1,11 @@
 #include "cli/progress.h"
 
-#include <sys/ioctl.h>
-#include <unistd.h>
-
 #include <chrono>
-#include <iostream>
 #include <thread>
 
 #include "cli/folder_status.h"
 #include "cli/folders.h"
+#include "cli/moving_line.h"
 #include "cli/output.h"
 #include "cli/problem.h"
 #include "cli/system.h"
@@ -22,28 +19,6 @@ using std::chrono::milliseconds;
 constexpr milliseconds kLookEvery{100};
 // A daemon that died is back well within this time.
 constexpr std::chrono::seconds kSilence{60};
-
-// One line that is written over and over.
-class MovingLine {
- public:
-  MovingLine() : terminal_(isatty(STDERR_FILENO) == 1) {}
-  ~MovingLine() { Show(""); }
-  MovingLine(const MovingLine&) = delete;
-  MovingLine& operator=(const MovingLine&) = delete;
-
-  void Show(const std::string& text) const {
-    if (terminal_) std::cerr << "\r\033[K" << text.substr(0, Columns() - 1) << std::flush;
-  }
-
- private:
-  static std::size_t Columns() {
-    winsize size{};
-    const bool known = ioctl(STDERR_FILENO, TIOCGWINSZ, &size) == 0 && size.ws_col > 1;
-    return known ? size.ws_col : 80;
-  }
-
-  bool terminal_;
-};
 
 std::shared_ptr<fileindex::Folder> Governing(const std::string& share_path) {
   auto folder = GoverningFolder(share_path);

@@ -14,6 +14,7 @@ void AddFolderCommand(CLI::App& app);
 void AddSearchCommand(CLI::App& app);
 void AddStatusCommand(CLI::App& app);
 void AddQueueCommand(CLI::App& app);
+void AddDoctorCommand(CLI::App& app);
 void AddIndexCommand(CLI::App& app);
 void AddVolumeCommand(CLI::App& app);
 void AddHomeCommand(CLI::App& app);

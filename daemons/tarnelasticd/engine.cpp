@@ -103,6 +103,7 @@ const std::map<std::string, Engine::Command>& Engine::Commands() {
       {"index_pause", {&Engine::IndexPause, true}},
       {"index_resume", {&Engine::IndexResume, true}},
       {"index_config_set", {&Engine::IndexConfigSet, true}},
+      {"index_check", {&Engine::IndexCheck, false}},
       {"document_upsert_by_id", {&Engine::DocumentUpsert, false}},
       {"document_set_by_id", {&Engine::DocumentSet, false}},
       {"document_del_by_id", {&Engine::DocumentDelete, false}},

@@ -69,6 +69,7 @@ class Engine {
   Json::Value IndexPause(const Json::Value& data);
   Json::Value IndexResume(const Json::Value& data);
   Json::Value IndexConfigSet(const Json::Value& data);
+  Json::Value IndexCheck(const Json::Value& data);
   Json::Value DocumentUpsert(const Json::Value& data);
   Json::Value DocumentSet(const Json::Value& data);
   Json::Value DocumentDelete(const Json::Value& data);
