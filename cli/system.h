@@ -28,9 +28,9 @@ bool ServicesAreManaged();
 // Throws Problem, naming what does not run, unless folders can be changed now.
 void RequireRunningSystem();
 
-// The supervisor's work, in the foreground until it is told to stop. Throws Problem or Error when
-// it cannot begin.
-void RunSystem();
+// The supervisor's work, in the foreground until it is told to stop. Without `full_speed` what is
+// indexed is indexed in the background. Throws Problem or Error when it cannot begin.
+void RunSystem(bool full_speed);
 
 }  // namespace quarry::cli
 

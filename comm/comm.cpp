@@ -5,6 +5,7 @@
 #include <cerrno>
 #include <cstdlib>
 #include <string>
+#include <utility>
 
 #include "comm/socket_path.h"
 #include "common/error.h"
@@ -88,12 +89,29 @@ void LogRetry(unsigned int attempt, const Json::Value& request) {
               ", db: " + TextOf(Member(Member(request, "data"), "id")));
 }
 
+// Null: sleep.
+thread_local const BusyWait::Function* busy_wait = nullptr;
+
 // Many processes wait for the same engine: they must not come back in the same second.
 unsigned int RetryPause() {
   return 900 + 60 * static_cast<unsigned int>(rand() % 5);
 }
 
+void WaitWhileBusy(unsigned int waited) {
+  if (busy_wait != nullptr) {
+    (*busy_wait)(waited);
+  } else {
+    sleep(RetryPause());
+  }
+}
+
 }  // namespace
+
+BusyWait::BusyWait(const Function& wait) : outer_(std::exchange(busy_wait, &wait)) {}
+
+BusyWait::~BusyWait() {
+  busy_wait = outer_;
+}
 
 void SendRequestImpl(Json::Value& response, const Json::Value& request) {
   response = Json::Value();
@@ -136,7 +154,7 @@ void SendRequest(Json::Value& response, const Json::Value& request) {
       NotifyLackOfMemory();
       notified = true;
     }
-    sleep(RetryPause());
+    WaitWhileBusy(attempt - 1);
   }
 }
 

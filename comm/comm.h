@@ -9,6 +9,8 @@
 
 #include <json/json.h>
 
+#include <functional>
+
 #include "common/export.h"
 
 namespace quarry::fileindex::elastic {
@@ -25,8 +27,25 @@ QUARRY_EXPORT void SendRequestImpl(Json::Value& response, const Json::Value& req
 
 // The same, but sends the request again for as long as the engine answers that it is busy (1400,
 // 1401), 15 to 19 minutes apart and without limit, since work must not be dropped. Administrators
-// are notified once when the engine stays busy. Hold no lock that other work needs.
+// are notified once when the engine stays busy. Hold no lock that other work needs. See BusyWait.
 QUARRY_EXPORT void SendRequest(Json::Value& response, const Json::Value& request);
+
+// As long as one lives, SendRequest on the thread that made it calls `wait` instead of sleeping,
+// with the number of times that it has waited for this request before. What `wait` throws leaves
+// SendRequest, and ends the request. Objects of one thread end in reverse order.
+class QUARRY_EXPORT BusyWait {
+ public:
+  using Function = std::function<void(unsigned int waited)>;
+
+  // `wait` must outlive the object.
+  explicit BusyWait(const Function& wait);
+  ~BusyWait();
+  BusyWait(const BusyWait&) = delete;
+  BusyWait& operator=(const BusyWait&) = delete;
+
+ private:
+  const Function* outer_;
+};
 
 }  // namespace quarry::fileindex::elastic
 

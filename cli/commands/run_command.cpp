@@ -1,3 +1,5 @@
+#include <memory>
+
 #include "cli/commands/commands.h"
 #include "cli/system.h"
 #include "common/lock_file.h"
@@ -11,7 +13,10 @@ void AddRunCommand(CLI::App& app) {
   Examples(*run,
            "  quarry run                                   the system of this machine (as root)\n"
            "  QUARRY_ROOT=~/.local/state/quarry quarry run a private one");
-  run->callback(RunSystem);
+  auto full_speed = std::make_shared<bool>(false);
+  run->add_flag("--full-speed", *full_speed,
+                "Do not leave the processors and disks to others while indexing");
+  run->callback([full_speed] { RunSystem(*full_speed); });
 
   CLI::App* prepare =
       app.add_subcommand("prepare-services", "Start or stop the services as the folder list needs");

@@ -27,11 +27,13 @@ std::string OwnProgram() {
 }
 
 // The daemons lie beside this program, in a build tree as after an installation.
-std::vector<ServiceSpec> Services() {
+std::vector<ServiceSpec> Services(bool full_speed) {
   const std::string directory = Dirname(OwnProgram()) + "/";
+  std::vector<std::string> speed;
+  if (full_speed) speed.emplace_back("--full-speed");
   return {{"tarnelasticd", directory + "tarnelasticd", EngineSocket(), true},
           {"tarncontentextractd", directory + "tarncontentextractd", ExtractorSocket(), false},
-          {"fileindexd", directory + "fileindexd", IndexDaemonSocket(), false}};
+          {"fileindexd", directory + "fileindexd", IndexDaemonSocket(), false, speed}};
 }
 
 std::string Answer(Supervisor& supervisor, const std::string& text) {
@@ -42,12 +44,12 @@ std::string Answer(Supervisor& supervisor, const std::string& text) {
 
 }  // namespace
 
-void RunSystem() {
+void RunSystem(bool full_speed) {
   EnsureLayout();
   daemon::OpenLog("quarry", true);
   const daemon::SingleInstance instance("quarry");
   daemon::StopSignal stop;
-  Supervisor supervisor(Services());
+  Supervisor supervisor(Services(full_speed));
   daemon::SocketServer server(
       SupervisorSocket(),
       [&](const std::string& request, const daemon::Peer&) { return Answer(supervisor, request); });

@@ -10,6 +10,7 @@
 #include "common/json.h"
 #include "daemons/common/client.h"
 #include "daemons/common/log.h"
+#include "daemons/common/reply.h"
 
 namespace quarry::cli {
 namespace {
@@ -22,14 +23,6 @@ constexpr milliseconds kLongestPause{30'000};
 constexpr milliseconds kStableTime{10'000};
 constexpr milliseconds kReadyTime{10'000};
 constexpr int kStopMilliseconds = 10'000;
-
-Json::Value Failure(int code, const std::string& message) {
-  Json::Value reply;
-  reply["success"] = false;
-  reply["error"]["code"] = code;
-  reply["error"]["msg"] = message;
-  return reply;
-}
 
 }  // namespace
 
@@ -87,9 +80,9 @@ Json::Value Supervisor::Handle(const Json::Value& request) {
   try {
     return Serve(request);
   } catch (const Error& error) {
-    return Failure(error.code(), error.reason());
+    return daemon::FailureReply(error.code(), error.reason());
   } catch (const Problem& problem) {
-    return Failure(kErrorSystem, problem.what());
+    return daemon::FailureReply(kErrorSystem, problem.what());
   }
 }
 
@@ -101,7 +94,7 @@ Supervisor::Service& Supervisor::Find(const std::string& name) {
 
 void Supervisor::Spawn(Service& service) {
   RemoveSocket(service);
-  service.child.emplace(service.spec.program, std::vector<std::string>{});
+  service.child.emplace(service.spec.program, service.spec.arguments);
   service.started = now_();
   daemon::LogInfo("started " + service.spec.name + ", pid " + std::to_string(service.child->Pid()));
 }
@@ -181,10 +174,9 @@ Json::Value Supervisor::Serve(const Json::Value& request) {
   } else if (command != "status") {
     throw Problem("There is no command \"" + command + "\"");
   }
-  Json::Value reply;
-  reply["success"] = true;
-  reply["data"]["services"] = Status();
-  return reply;
+  Json::Value answer;
+  answer["services"] = Status();
+  return daemon::SuccessReply(std::move(answer));
 }
 
 }  // namespace quarry::cli

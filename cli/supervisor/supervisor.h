@@ -21,6 +21,7 @@ struct ServiceSpec {
   std::string program;      // full path
   std::string socket_path;  // at which it listens once it is ready
   bool wanted = false;      // started without being asked
+  std::vector<std::string> arguments{};
 };
 
 // Starts services, restarts those that die, with growing pauses, and leaves alone those that were

@@ -1,8 +1,11 @@
 #include "daemons/fileindexd/elastic_index.h"
 
+#include <unistd.h>
+
+#include <algorithm>
+#include <chrono>
 #include <utility>
 
-#include "comm/comm.h"
 #include "comm/elastic_control.h"
 #include "common/error.h"
 #include "common/json.h"
@@ -17,13 +20,31 @@ namespace elastic = fileindex::elastic;
 
 constexpr char kIsDirField[] = "TARNMDIsDir";
 
-// The library waits a quarter of a minute for a missing socket and logs each second of it; a worker
-// has better things to do.
-void RequireEngine() {
-  if (!daemon::IsListening(EngineSocketPath())) {
-    throw Error(kErrorEngineRequest, "The search engine (tarnelasticd) is not running");
-  }
+// Between two questions to an engine that is busy.
+constexpr std::chrono::milliseconds kFirstRest = std::chrono::seconds(1);
+constexpr std::chrono::milliseconds kLongestRest = std::chrono::minutes(1);
+constexpr unsigned int kMostDoublings = 6;
+
+Error NotRunning() {
+  return Error(kErrorEngineRequest, "The search engine (tarnelasticd) is not running");
 }
+
+// To be asked before what would otherwise be the first to fail.
+void RequireEngine() {
+  if (!daemon::IsListening(EngineSocketPath())) throw NotRunning();
+}
+
+// Lives as long as a request to the engine. The library waits a quarter of a minute for a missing
+// socket, and a quarter of an hour for a busy engine; a worker has better things to do.
+class Exchange {
+ public:
+  explicit Exchange(const elastic::BusyWait::Function& rest) : wait_(rest) {
+    if (access(EngineSocketPath().c_str(), F_OK) != 0) throw NotRunning();
+  }
+
+ private:
+  const elastic::BusyWait wait_;
+};
 
 Document ToDocument(const Json::Value& fields) {
   Document document;
@@ -46,8 +67,10 @@ const std::string& ExtractorSocketPath() {
   return path;
 }
 
-ElasticIndex::ElasticIndex(const std::string& share)
-    : share_(share), id_(elastic::GetFileIndexID(share)) {}
+ElasticIndex::ElasticIndex(const std::string& share, Gate& gate)
+    : share_(share), id_(elastic::GetFileIndexID(share)), rest_([&gate](unsigned int attempt) {
+        gate.Rest(std::min(kFirstRest * (1 << std::min(attempt, kMostDoublings)), kLongestRest));
+      }) {}
 
 Json::Value ElasticIndex::EngineStatus() {
   RequireEngine();
@@ -55,6 +78,7 @@ Json::Value ElasticIndex::EngineStatus() {
   request["command"] = "engine_status";
   request["data"] = Json::Value(Json::objectValue);
   Json::Value response;
+  const Exchange exchange(rest_);
   elastic::SendRequest(response, request);
   return response["data"];
 }
@@ -80,31 +104,38 @@ std::uint64_t ElasticIndex::Count() {
 
 void ElasticIndex::Create() {
   RequireEngine();
+  const Exchange exchange(rest_);
   elastic::ShareIndexCreate(share_);
 }
 
 void ElasticIndex::Commit() {
   RequireEngine();
+  const Exchange exchange(rest_);
   elastic::IndexCommit(share_);
 }
 
 void ElasticIndex::Upsert(const std::string& path, bool need_meta) {
+  const Exchange exchange(rest_);
   elastic::IndexUpsert(share_, path, need_meta);
 }
 
 void ElasticIndex::SetAttributes(const std::string& path) {
+  const Exchange exchange(rest_);
   elastic::IndexAttr(share_, path);
 }
 
 void ElasticIndex::Delete(const std::string& path) {
+  const Exchange exchange(rest_);
   elastic::IndexDel(share_, path);
 }
 
 void ElasticIndex::DeleteBelow(const std::string& dir) {
+  const Exchange exchange(rest_);
   elastic::IndexDelDir(share_, dir);
 }
 
 void ElasticIndex::Rename(const std::string& new_path, const std::string& old_path) {
+  const Exchange exchange(rest_);
   elastic::IndexRename(share_, new_path, old_path);
 }
 
@@ -123,6 +154,7 @@ std::vector<Document> ElasticIndex::Query(const char* kind, const char* field,
     data["query"]["load_field"].append(name);
   }
   Json::Value response;
+  const Exchange exchange(rest_);
   elastic::SendRequest(response, request);
   if (!response["data"].isArray()) {
     throw Error(kErrorEngineQuery, "The search engine's list of documents is malformed");

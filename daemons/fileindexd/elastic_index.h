@@ -9,15 +9,19 @@
 #include <string>
 #include <vector>
 
+#include "comm/comm.h"
+#include "daemons/fileindexd/gate.h"
 #include "daemons/fileindexd/index.h"
 
 namespace quarry::fileindexd {
 
 // Asks an engine that does not run once and fails, instead of waiting for it: the worker does that.
-// An engine that says it is busy is asked again for as long as it takes.
+// An engine that says it is busy is asked again for as long as it takes, sooner than the library
+// would by itself; that wait ends when the gate stops, with Interrupted.
 class ElasticIndex : public Index {
  public:
-  explicit ElasticIndex(const std::string& share);
+  // The gate must outlive the index.
+  ElasticIndex(const std::string& share, Gate& gate);
 
   std::string Epoch() override;
   void Create() override;
@@ -42,6 +46,7 @@ class ElasticIndex : public Index {
 
   const std::string share_;
   const std::string id_;
+  const fileindex::elastic::BusyWait::Function rest_;
 };
 
 // Where the engine and the reader of files listen.

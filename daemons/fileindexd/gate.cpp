@@ -38,6 +38,11 @@ void Gate::Pass() {
   if (stopping_) throw Interrupted();
 }
 
+void Gate::Rest(std::chrono::milliseconds time) {
+  std::unique_lock<std::mutex> lock(mutex_);
+  if (changed_.wait_for(lock, time, [this] { return stopping_; })) throw Interrupted();
+}
+
 bool Gate::WaitFor(std::chrono::milliseconds time) {
   std::unique_lock<std::mutex> lock(mutex_);
   changed_.wait_for(lock, time, [this] { return stopping_ || woken_; });

@@ -26,6 +26,9 @@ class Gate {
   // Blocks while paused. Throws Interrupted once Stop() was called.
   void Pass();
 
+  // Waits that long. Throws Interrupted once Stop() was called, be it meanwhile.
+  void Rest(std::chrono::milliseconds time);
+
   // Waits that long, or until Stop() or Wake(). Returns whether it was woken.
   bool WaitFor(std::chrono::milliseconds time);
 

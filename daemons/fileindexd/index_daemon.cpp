@@ -26,16 +26,6 @@ daemon::SocketServerOptions ServerOptions() {
   return options;
 }
 
-std::unique_ptr<Worker> MakeWorker(const std::string& share, Slots& slots, std::size_t threads) {
-  WorkerParts parts;
-  parts.host = MakeShareHost(share);
-  parts.index = std::make_unique<ElasticIndex>(share);
-  parts.files = std::make_unique<PosixFileSystem>();
-  parts.slots = &slots;
-  parts.threads = threads;
-  return std::make_unique<Worker>(share, std::move(parts));
-}
-
 // Loading a state file fails as long as somebody has made nonsense of it: what was known before
 // goes on until the file changes again.
 void Guarded(const char* what, const std::function<void()>& load) {
@@ -53,18 +43,30 @@ const std::string& CommandSocketPath() {
   return path;
 }
 
-IndexDaemon::IndexDaemon(std::size_t threads)
+IndexDaemon::IndexDaemon(std::size_t threads, bool full_speed)
     : threads_(threads),
+      full_speed_(full_speed),
       slots_(threads),
       folders_watch_(fileindex::kFileIndexFoldersCfgPath),
       status_watch_(fileindex::kFileIndexStatusCfgPath),
-      workers_([this](const std::string& share) { return MakeWorker(share, slots_, threads_); }),
+      workers_([this](const std::string& share) { return MakeWorker(share); }),
       server_(std::make_unique<daemon::SocketServer>(
           CommandSocketPath(),
           [this](const std::string& request, const daemon::Peer&) {
             return HandleCommand(*this, request);
           },
           ServerOptions())) {}
+
+std::unique_ptr<Worker> IndexDaemon::MakeWorker(const std::string& share) {
+  WorkerParts parts;
+  parts.host = MakeShareHost(share);
+  parts.index = std::make_unique<ElasticIndex>(share, *parts.gate);
+  parts.files = std::make_unique<PosixFileSystem>();
+  parts.slots = &slots_;
+  parts.threads = threads_;
+  parts.full_speed = full_speed_;
+  return std::make_unique<Worker>(share, std::move(parts));
+}
 
 void IndexDaemon::Step(int timeout_ms) {
   FollowStatus();

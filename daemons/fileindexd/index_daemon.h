@@ -23,9 +23,9 @@ const std::string& CommandSocketPath();
 // Keeps one worker per share with indexed folders and answers commands. One thread.
 class IndexDaemon : private CommandTarget {
  public:
-  // `threads` documents are in work at a time. Listens at once; workers are started by Step().
-  // Throws Error 502 when somebody listens there already.
-  explicit IndexDaemon(std::size_t threads);
+  // `threads` documents are in work at a time, in the background unless `full_speed`. Listens at
+  // once; workers are started by Step(). Throws Error 502 when somebody listens there already.
+  explicit IndexDaemon(std::size_t threads, bool full_speed = false);
 
   // Waits up to `timeout_ms` for a command, answers what has come, and follows what has changed.
   void Step(int timeout_ms);
@@ -46,12 +46,15 @@ class IndexDaemon : private CommandTarget {
   void DeleteWorker(const std::string& share) override;
   Json::Value Status() const override;
 
+  std::unique_ptr<Worker> MakeWorker(const std::string& share);
+
   void FollowFolders();
   void FollowStatus();
   void ApplyPause();
   void SweepQueues();
 
   const std::size_t threads_;
+  const bool full_speed_;
   Slots slots_;
   FileWatch folders_watch_;
   FileWatch status_watch_;

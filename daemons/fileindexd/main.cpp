@@ -11,6 +11,7 @@
 #include <string>
 #include <thread>
 
+#include "daemons/common/command_line.h"
 #include "daemons/common/log.h"
 #include "daemons/common/single_instance.h"
 #include "daemons/common/stop_signal.h"
@@ -28,7 +29,7 @@ constexpr char kExamples[] =
     "Examples:\n"
     "  fileindexd                                 the system's own daemon\n"
     "  QUARRY_ROOT=$HOME/quarry fileindexd        a private system's\n"
-    "  fileindexd --threads 8                     for a machine with fast disks\n"
+    "  fileindexd --threads 8 --full-speed        for a machine that does nothing else\n"
     "\n"
     "The daemon stays in the foreground until it gets SIGTERM or SIGINT, and logs to the system "
     "log\n"
@@ -38,10 +39,10 @@ constexpr char kExamples[] =
     "\n"
     "Exit status: 0 after a signal, 1 when it cannot start (it runs already, for instance).";
 
-void Serve(std::size_t threads) {
+void Serve(std::size_t threads, bool full_speed) {
   daemon::StopSignal stop;
   const daemon::SingleInstance single(kName);
-  fileindexd::IndexDaemon daemon(threads);
+  fileindexd::IndexDaemon daemon(threads, full_speed);
   daemon.WakeOn(stop.Fd());
   daemon::LogInfo("Started");
   while (!stop.Requested()) daemon.Step(kStepMs);
@@ -49,8 +50,8 @@ void Serve(std::size_t threads) {
     daemon::LogInfo("Stopped");
     return;
   }
-  // A worker may be asleep for a quarter of an hour until the engine is less busy. Everything that
-  // it has not finished is in its snapshot, which the next start begins with.
+  // A worker may wait for an answer of the engine. Everything that it has not finished is in its
+  // snapshot, which the next start begins with.
   daemon::LogInfo("Stopped in the middle of a pass, which the next start will do again");
   _exit(EXIT_SUCCESS);
 }
@@ -63,10 +64,13 @@ int main(int argc, char** argv) {
   std::size_t threads = std::max(1U, std::thread::hardware_concurrency());
   app.add_option("--threads", threads, "Documents in work at a time (default: the machine's cores)")
       ->check(CLI::Range(1, 64));
-  CLI11_PARSE(app, argc, argv);
+  bool full_speed = false;
+  app.add_flag("--full-speed", full_speed,
+               "Do not leave the processors and disks to others (default: nice 10, idle I/O)");
+  if (const auto status = daemon::ParseCommandLine(&app, argc, argv)) return *status;
   daemon::OpenLog(kName, true);
   try {
-    Serve(threads);
+    Serve(threads, full_speed);
   } catch (const std::exception& error) {
     daemon::LogError(std::string("Cannot run: ") + error.what());
     return EXIT_FAILURE;

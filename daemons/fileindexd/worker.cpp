@@ -8,6 +8,7 @@
 
 #include "common/error.h"
 #include "daemons/common/log.h"
+#include "daemons/common/priority.h"
 #include "daemons/fileindexd/failure.h"
 
 namespace quarry::fileindexd {
@@ -47,6 +48,7 @@ bool HasNewlyActive(const FolderRules& before, const FolderRules& now) {
 Worker::Worker(const std::string& share, WorkerParts parts)
     : share_(share),
       parts_(std::move(parts)),
+      gate_(*parts_.gate),
       progress_(share),
       survey_(
           *parts_.files, [this] { return CurrentRules(); },
@@ -64,6 +66,7 @@ void Worker::Reload() {
 }
 
 void Worker::Run() {
+  if (!parts_.full_speed) daemon::WorkInBackground();
   daemon::LogInfo("Worker of share " + share_ + " started");
   // What has its worker started queues its event only now: one walk can do for both.
   gate_.WaitFor(kPoll);

@@ -26,11 +26,13 @@ namespace quarry::fileindexd {
 
 // One worker's parts, which it owns, and what all workers share.
 struct WorkerParts {
+  std::unique_ptr<Gate> gate = std::make_unique<Gate>();  // what the index waits at, too
   std::unique_ptr<ShareHost> host;
   std::unique_ptr<Index> index;
   std::unique_ptr<FileSystem> files;
   Slots* slots = nullptr;   // outlives the worker
   std::size_t threads = 1;  // documents in work at a time
+  bool full_speed = false;  // else it works in the background
 };
 
 // Looks for work, does a pass when there is some, and waits longer and longer while passes fail. It
@@ -76,7 +78,7 @@ class Worker {
 
   const std::string share_;
   WorkerParts parts_;
-  Gate gate_;
+  Gate& gate_;
   Progress progress_;
   SetAside aside_;
   std::atomic<bool> reload_{true};

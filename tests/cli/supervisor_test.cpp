@@ -69,6 +69,15 @@ TEST_F(SupervisorTest, StartsWhatIsWanted) {
   EXPECT_EQ(Service(supervisor, 0)["state"].asString(), "stopped");
 }
 
+TEST_F(SupervisorTest, GivesItsServicesTheirArguments) {
+  ServiceSpec spec = Spec("a", "[ \"$*\" = \"--full-speed x\" ] && exit 4", true);
+  spec.arguments = {"--full-speed", "x"};
+  Supervisor supervisor({spec}, Clock());
+  supervisor.Step();
+  StepUntil(supervisor, [&] { return Service(supervisor)["state"] == "restarting"; });
+  EXPECT_EQ(Service(supervisor)["last_end"].asString(), "exit code 4");
+}
+
 TEST_F(SupervisorTest, RestartsWhatDiesAfterAGrowingPause) {
   Supervisor supervisor({Spec("a", "exit 3", true)}, Clock());
   supervisor.Step();

@@ -403,6 +403,37 @@ TEST_F(CommTest, SendRequestRetriesWhileBusy) {
   EXPECT_THAT(NotifyCalls(), IsEmpty());
 }
 
+TEST_F(CommTest, WhoWantsToWaitOtherwiseIsAsked) {
+  for (int i = 0; i < 4; ++i) fake::QueueReply(std::string(kBusy));
+  std::vector<unsigned int> waits;
+  const BusyWait::Function note = [&](unsigned int waited) { waits.push_back(waited); };
+  const BusyWait::Function give_up = [](unsigned int) { throw Error(7, "enough"); };
+  Json::Value response;
+  {
+    const BusyWait outer(note);
+    {
+      const BusyWait inner(give_up);
+      EXPECT_THROW(SendRequest(response, Json::Value()), Error);
+    }
+    SendRequest(response, Json::Value());
+    EXPECT_THAT(waits, ElementsAre(0, 1, 2));
+    EXPECT_THAT(fake::Logs(), SizeIs(4));
+    EXPECT_THAT(fake::Sleeps(), IsEmpty());
+    // Another thread waits in its own way.
+    std::thread([] {
+      fake::QueueReply(std::string(kBusy));
+      Json::Value other;
+      SendRequest(other, Json::Value());
+    }).join();
+    EXPECT_THAT(waits, SizeIs(3));
+    EXPECT_THAT(fake::Sleeps(), SizeIs(1));
+  }
+  fake::QueueReply(std::string(kBusy));
+  SendRequest(response, Json::Value());
+  EXPECT_THAT(waits, SizeIs(3));
+  EXPECT_THAT(fake::Sleeps(), SizeIs(2));
+}
+
 TEST_F(CommTest, SendRequestRetriesABusyBatch) {
   fake::QueueReply(std::string(R"({"success":true,"has_fail":true,"data":[{"success":false,)"
                                R"("error":{"code":1401,"msg":"busy"}}]})"));

@@ -6,10 +6,12 @@
 #include <deque>
 #include <memory>
 #include <mutex>
+#include <thread>
 
 #include "common/error.h"
 #include "common/json.h"
 #include "tests/daemons/common/harness.h"
+#include "tests/support/files.h"
 #include "tests/support/root.h"
 
 namespace quarry::fileindexd {
@@ -69,7 +71,8 @@ class ElasticIndexTest : public ::testing::Test {
   }
 
   std::unique_ptr<ScriptedEngine> engine_;
-  ElasticIndex index_{"photo"};
+  Gate gate_;
+  ElasticIndex index_{"photo", gate_};
 };
 
 TEST_F(ElasticIndexTest, AsksForTheEpoch) {
@@ -175,7 +178,8 @@ TEST_F(ElasticIndexTest, AnEngineThatDoesNotRunIsNotWaitedFor) {
   engine_.reset();
   for (const auto& call : std::vector<std::function<void()>>{
            [this] { index_.Epoch(); }, [this] { index_.Count(); }, [this] { index_.Commit(); },
-           [this] { index_.Create(); }}) {
+           [this] { index_.Create(); }, [this] { index_.Delete("/v/a"); },
+           [this] { index_.Find("/v/a"); }}) {
     try {
       call();
       ADD_FAILURE();
@@ -184,6 +188,24 @@ TEST_F(ElasticIndexTest, AnEngineThatDoesNotRunIsNotWaitedFor) {
       EXPECT_EQ("The search engine (tarnelasticd) is not running", error.reason());
     }
   }
+}
+
+constexpr char kBusy[] = R"({"success":false,"error":{"code":1400,"msg":"busy"}})";
+
+TEST_F(ElasticIndexTest, ABusyEngineIsAskedAgainSoon) {
+  engine_->Answer(kBusy);
+  index_.Delete("/v/a");
+  EXPECT_EQ(2U, engine_->Asked().size());
+}
+
+TEST_F(ElasticIndexTest, ABusyEngineIsAskedUntilTheWorkerStops) {
+  for (int i = 0; i < 100; ++i) engine_->Answer(kBusy);
+  std::thread stopper([this] {
+    EXPECT_TRUE(test::WaitUntil([this] { return !engine_->Asked().empty(); }));
+    gate_.Stop();
+  });
+  EXPECT_THROW(index_.Delete("/v/a"), Interrupted);
+  stopper.join();
 }
 
 TEST_F(ElasticIndexTest, CannotReadWithoutTheReader) {

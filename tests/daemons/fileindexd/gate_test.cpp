@@ -66,5 +66,18 @@ TEST(GateTest, StopEndsAWait) {
   EXPECT_FALSE(gate.WaitFor(hours(1)));
 }
 
+TEST(GateTest, AStopEndsARest) {
+  Gate gate;
+  gate.Rest(std::chrono::milliseconds(1));
+  gate.Wake();
+  gate.SetPaused(true);
+  gate.Rest(std::chrono::milliseconds(1));
+  EXPECT_TRUE(gate.WaitFor(std::chrono::hours(1))) << "the rest has taken the wake";
+  std::thread stopper([&] { gate.Stop(); });
+  EXPECT_THROW(gate.Rest(std::chrono::hours(1)), Interrupted);
+  stopper.join();
+  EXPECT_THROW(gate.Rest(std::chrono::hours(1)), Interrupted);
+}
+
 }  // namespace
 }  // namespace quarry::fileindexd

@@ -15,6 +15,7 @@
 #include "common/paths.h"
 #include "daemons/common/client.h"
 #include "daemons/common/frame.h"
+#include "daemons/fileindexd/elastic_index.h"
 #include "fileindex/config/folder_mgr.h"
 #include "fileindex/config/status_mgr.h"
 #include "tests/daemons/common/harness.h"
@@ -229,6 +230,27 @@ TEST_F(IndexDaemonTest, AnswersWhileTheCallerHoldsEveryLock) {
   EXPECT_TRUE(Ask("pause", data)["success"].asBool());
   EXPECT_TRUE(Ask("resume")["success"].asBool());
   EXPECT_TRUE(Ask("status")["success"].asBool());
+}
+
+// An engine that is busy with one share, and answers for the other.
+TEST_F(IndexDaemonTest, ABusyEngineHoldsUpNoOtherShareAndNoCommand) {
+  const test::ServerThread engine(
+      EngineSocketPath(), [](const std::string& request, const daemon::Peer&) -> std::string {
+        if (request.find("engine_status") != std::string::npos) {
+          return R"({"success":true,"data":{"epoch":"e","indexes":[]}})";
+        }
+        if (request.find("fileindex_s") == std::string::npos)
+          return R"({"success":true,"data":[]})";
+        return R"({"success":false,"error":{"code":1401,"msg":"busy"}})";
+      });
+  SaveFolders({"/s", "/t"});
+  StartDaemon();
+  // The other share gets as far as it can without a reader of files.
+  EXPECT_TRUE(Becomes({{"s", "indexing"}, {"t", "retrying"}}));
+  SendCommandToDaemon("worker_delete", Share("s"));
+  EXPECT_TRUE(Becomes({{"s", "stopped"}, {"t", "retrying"}}));
+  SendCommandToDaemon("worker_create", Share("s"));
+  EXPECT_TRUE(Becomes({{"s", "indexing"}, {"t", "retrying"}}));
 }
 
 TEST_F(IndexDaemonTest, GarbageHurtsNobody) {

@@ -64,8 +64,9 @@ class SharedFiles : public FileSystem {
 
 // What a worker of the share "s" needs; all of it stays the caller's.
 inline std::unique_ptr<Worker> MakeWorker(HostState& host, FakeIndex& index, FakeDisk& disk,
-                                          Slots& slots) {
+                                          Slots& slots, bool full_speed = false) {
   WorkerParts parts;
+  parts.full_speed = full_speed;
   parts.host = std::make_unique<FakeHost>(host);
   parts.index = std::make_unique<SharedIndex>(index);
   parts.files = std::make_unique<SharedFiles>(disk);

@@ -167,10 +167,38 @@ TEST_F(TaskLaneTest, SlotsBoundSeveralLanesTogether) {
 
 TEST(SlotsTest, NobodyWaitsForeverForASlot) {
   Slots slots(1, std::chrono::milliseconds(1));
-  EXPECT_TRUE(slots.Acquire());
-  EXPECT_FALSE(slots.Acquire());
-  slots.Release();
-  EXPECT_TRUE(slots.Acquire());
+  const auto first = slots.Acquire();
+  const auto second = slots.Acquire();
+  slots.Release(first);
+  slots.Release(second);
+  slots.Release(slots.Acquire());
+}
+
+TEST(SlotsTest, ASlotThatIsReleasedIsFreeAtOnce) {
+  Slots slots(2, std::chrono::hours(1));
+  const auto held = slots.Acquire();
+  auto second = slots.Acquire();
+  std::atomic<bool> got{false};
+  std::thread waiter([&] {
+    const SlotHolder slot(slots);
+    got = true;
+  });
+  EXPECT_FALSE(got);
+  slots.Release(second);
+  waiter.join();
+  EXPECT_TRUE(got);
+  slots.Release(held);
+}
+
+// Tasks of one share that all wait for the engine cost the others one wait, not one for each task.
+TEST(SlotsTest, WhoHoldsASlotForLongCountsNoLonger) {
+  constexpr auto kPatience = std::chrono::milliseconds(200);
+  Slots slots(1, kPatience);
+  const auto stuck = slots.Acquire();
+  const auto begin = Slots::Clock::now();
+  for (int i = 0; i < 100; ++i) slots.Release(slots.Acquire());
+  EXPECT_LT(Slots::Clock::now() - begin, 50 * kPatience);
+  slots.Release(stuck);
 }
 
 // Random tasks: those that meet are done in order of submission, whatever the threads do.

@@ -2,11 +2,14 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <sys/resource.h>
 
 #include <thread>
 
+#include "daemons/common/priority.h"
 #include "daemons/tarnelasticd/engine_error.h"
 #include "fileindex/queue/queue_mgr.h"
+#include "tests/daemons/common/io_class.h"
 #include "tests/daemons/fileindexd/share_fixture.h"
 #include "tests/daemons/fileindexd/shared_parts.h"
 #include "tests/support/files.h"
@@ -638,6 +641,51 @@ TEST_F(WorkerTest, RunsUntilItIsStopped) {
   worker_->Stop();
   thread.join();
   EXPECT_EQ(milliseconds(0), worker_->Step());
+}
+
+// The nice value and the I/O class of the thread that makes a document in a worker's run.
+std::pair<int, long> PriorityOfWork(Worker& worker, FakeIndex& index) {
+  std::pair<int, long> priority{-100, -1};
+  index.SetHook([&](const std::string& command) {
+    if (command != "upsert /v/s") return;
+    priority = {getpriority(PRIO_PROCESS, 0), test::IoClass()};
+    worker.Stop();
+  });
+  std::thread([&] { worker.Run(); }).join();
+  index.SetHook(nullptr);
+  return priority;
+}
+
+TEST_F(WorkerTest, WorksInTheBackground) {
+  const auto priority = PriorityOfWork(*worker_, index_);
+  EXPECT_GE(priority.first, daemon::kBackgroundNice);
+  EXPECT_EQ(test::kIdleIoClass, priority.second);
+}
+
+TEST_F(WorkerTest, WorksAtFullSpeedOnRequest) {
+  worker_ = MakeWorker(host_, index_, disk_, slots_, true);
+  const auto priority = PriorityOfWork(*worker_, index_);
+  EXPECT_EQ(getpriority(PRIO_PROCESS, 0), priority.first);
+  EXPECT_NE(test::kIdleIoClass, priority.second);
+}
+
+// Each pass takes what was queued when it began: one file's events cannot keep others waiting.
+TEST_F(WorkerTest, AFileThatChangesAllTheTimeKeepsNoOtherWaiting) {
+  worker_->Step();
+  disk_.WriteFile("/v/s/hot.log");
+  Queue(EVENT_MODIFY, "/v/s/hot.log");
+  index_.SetHook([this](const std::string& command) {
+    if (command != "upsert /v/s/hot.log content") return;
+    disk_.WriteFile("/v/s/hot.log");
+    for (int i = 0; i < 10; ++i) Queue(EVENT_MODIFY, "/v/s/hot.log");
+  });
+  for (int i = 0; i < 5; ++i) {
+    const std::string path = "/v/s/" + std::to_string(i) + ".txt";
+    disk_.WriteFile(path);
+    Queue(EVENT_CREATE, path);
+    EXPECT_THAT(CommandsOfStep(), ::testing::ElementsAre("upsert /v/s/hot.log content",
+                                                         "upsert " + path + " content"));
+  }
 }
 
 TEST_F(WorkerTest, AStopInTheMiddleLeavesTheSnapshotAndIsNoFailure) {
