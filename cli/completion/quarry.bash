@@ -17,6 +17,7 @@ _quarry_words() {
     folder:add:* | folder:set:*) echo --name --only --with --without --json ;;
     folder:list:*) echo --offset --limit --sort --desc --status --json ;;
     home:*) echo --accounts --json ;;
+    doctor:*) echo --check --json ;;
     run:* | completion:* | index:*) ;;
     *) echo --json ;;
   esac
@@ -25,7 +26,7 @@ _quarry_words() {
 _quarry() {
   local current=${COMP_WORDS[COMP_CWORD]} command=${COMP_WORDS[1]} words=""
   case $COMP_CWORD:$command in
-    1:*) words="run index share folder search status queue pause resume volume home user suggest
+    1:*) words="run index share folder search status queue doctor pause resume volume home user suggest
                 completion --help --version" ;;
     2:share) words="add list remove rename migrate pause resume clear" ;;
     2:folder) words="add set list get reindex delete" ;;
