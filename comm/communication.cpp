@@ -45,8 +45,7 @@ class SigpipeGuard {
   ~SigpipeGuard() {
     const int saved_errno = errno;
     const timespec no_wait{};
-    while (!was_pending_ && sigtimedwait(&sigpipe_, nullptr, &no_wait) < 0 && errno == EINTR) {
-    }
+    if (!was_pending_) sigtimedwait(&sigpipe_, nullptr, &no_wait);
     pthread_sigmask(SIG_SETMASK, &saved_, nullptr);
     errno = saved_errno;
   }
@@ -107,7 +106,7 @@ void Connect(int fd) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
   kSocketPath.copy(address.sun_path, sizeof(address.sun_path) - 1);
-  for (int attempt = 1; attempt <= kConnectAttempts; ++attempt) {
+  for (int attempt = 1;; ++attempt) {
     if (connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof(address)) == 0) return;
     if (errno != ENOENT || attempt == kConnectAttempts) return;
     sleep(1);

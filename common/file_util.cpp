@@ -31,7 +31,8 @@ bool Lstat(const std::string& path, struct stat& info) {
 std::string LinkText(const std::string& path) {
   std::array<char, 4096> text{};
   const ssize_t length = readlink(path.c_str(), text.data(), text.size());
-  return length < 0 ? std::string() : std::string(text.data(), static_cast<size_t>(length));
+  if (length < 0) return "";
+  return std::string(text.data(), static_cast<size_t>(length));
 }
 
 char LowerAscii(char c) {

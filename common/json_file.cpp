@@ -110,7 +110,8 @@ class Replacement {
 
 // The directory that holds `path`, without a "/" at its end.
 std::string DirectoryOf(const std::string& path) {
-  return path.find('/') == std::string::npos ? "." : Dirname(path);
+  if (path.find('/') == std::string::npos) return ".";
+  return Dirname(path);
 }
 
 // Some file systems cannot sync a directory and need not.

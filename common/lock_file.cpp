@@ -58,7 +58,6 @@ LockFile::LockFile(const std::string& path, bool exclusive) : fd_(-1), path_(pat
 }
 
 LockFile::~LockFile() {
-  if (fd_ < 0) return;
   const int saved_errno = errno;
   flock(fd_, LOCK_UN);
   close(fd_);

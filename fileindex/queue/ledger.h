@@ -127,7 +127,8 @@ class Ledger {
   static bool HasFront(const OPNode& node) {
     return node.record_index_ && !node.record_index_->front.empty();
   }
-  static bool IsShort(const OPNode& node) { return node.ops.size() <= 32 && !HasFront(node); }
+  // A list with a front is long: only what is longer leaves one, see Receive.
+  static bool IsShort(const OPNode& node) { return node.ops.size() <= 32; }
   static OPNode::ChildIndex& Children(OPNode& node);
   static const std::shared_ptr<OPNode>* Find(OPNode& node, std::string_view name);
   static void Adopt(OPNode& node);

@@ -155,11 +155,15 @@ void OPTree::InsertEvent(std::shared_ptr<Event> event) {
   const std::shared_ptr<OPNode> node = GetNodeByPath(event->path);
   const auto rec = std::make_shared<OP>(node, OP_NONE, "", Json::Value());
   const auto has = [&event](EventKind kind) { return (event->op & kind) != 0; };
+  const auto has_for_dir = [&](EventKind kind) { return has(kind) && event->is_dir; };
+  const auto has_for_file = [&](EventKind kind) { return has(kind) && !event->is_dir; };
 
-  if (has(EVENT_CREATE)) event->is_dir ? HandleReindex(node, rec) : HandleCreate(node, rec);
+  if (has_for_dir(EVENT_CREATE)) HandleReindex(node, rec);
+  if (has_for_file(EVENT_CREATE)) HandleCreate(node, rec);
   if (has(EVENT_ATTR)) HandleAttr(node, rec);
   if (has(EVENT_MODIFY)) HandleModify(node, rec);
-  if (has(EVENT_DELETE)) event->is_dir ? HandleReindex(node, rec) : HandleDelete(node, rec);
+  if (has_for_dir(EVENT_DELETE)) HandleReindex(node, rec);
+  if (has_for_file(EVENT_DELETE)) HandleDelete(node, rec);
   if (has(EVENT_RENAME)) {
     rec->src = event->path_old;
     HandleRename(node, rec);
@@ -247,7 +251,7 @@ void OPTree::Settle() {
 void OPTree::TraverseNodeDescendant(std::shared_ptr<OPNode> node,
                                     std::function<void(std::shared_ptr<OPNode>)> fn,
                                     bool skip_self) {
-  std::vector<std::shared_ptr<OPNode>> waiting{node};
+  std::vector<std::shared_ptr<OPNode>> waiting(1, node);
   while (!waiting.empty()) {
     const std::shared_ptr<OPNode> at = std::move(waiting.back());
     waiting.pop_back();

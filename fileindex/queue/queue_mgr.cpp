@@ -22,7 +22,7 @@ namespace quarry::fileindex {
 namespace {
 
 const std::string& CheckedQueuePath(const std::string& path) {
-  if (!StringStartWith(path, "/") || Basename(path).empty() ||
+  if (path.empty() || path.front() != '/' || path.back() == '/' ||
       path.find('\0') != std::string::npos) {
     throw Error(kErrorBadParameter, "Not a queue path: " + path);
   }

@@ -109,6 +109,12 @@ TEST_F(FileUtilTest, RelativeLinkIsTakenFromTheWorkingDirectory) {
   fs::current_path(before);
 }
 
+TEST_F(FileUtilTest, LinkThatCannotBeReadLeadsNowhere) {
+  fake::FailSystemCall("readlink", 1, EACCES);
+  EXPECT_FALSE(IsDirExist(dir_ / "dir_link", true));
+  EXPECT_TRUE(IsDirExist(dir_ / "dir_link", true));
+}
+
 TEST_F(FileUtilTest, LongestLinkTextIsFollowed) {
   std::string target = directory_;
   while (target.size() < 4000) target += "/../directory";
@@ -322,6 +328,20 @@ TEST_F(FileUtilTest, MissingServiceAccountIsAnError) {
   EXPECT_TRUE(fake::Logs().empty());
   EXPECT_TRUE(sdk::SDKMutex().TryLock());
   sdk::SDKMutex().Unlock();
+  EXPECT_EQ(fake::SystemCallCount("chown"), 0);
+}
+
+TEST_F(FileUtilTest, SuccessWithoutAnAccountIsAnErrorToo) {
+  fake::Failure nobody;
+  nobody.result = 0;
+  fake::FailCall("TARNUserGet", 1, nobody);
+  try {
+    ChownQuarry(file_);
+    FAIL() << "nothing was thrown";
+  } catch (const Error& error) {
+    EXPECT_EQ(error.code(), 801);
+    EXPECT_EQ(error.reason(), "");
+  }
   EXPECT_EQ(fake::SystemCallCount("chown"), 0);
 }
 

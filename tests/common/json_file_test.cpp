@@ -137,6 +137,16 @@ TEST_F(JsonFileTest, FailedReadIsNull) {
   EXPECT_EQ(errno, EACCES);
 }
 
+TEST_F(JsonFileTest, FileThatCannotBeAskedForItsKindIsNull) {
+  WriteFile(path_, "1");
+  fake::FailSystemCall("fstat", 1, EIO);
+  Json::Value read(1);
+  EXPECT_FALSE(fromFile(read, path_));
+  EXPECT_EQ(errno, EIO);
+  EXPECT_TRUE(read.isNull());
+  EXPECT_EQ(fake::SystemCallCount("read"), 0);
+}
+
 TEST_F(JsonFileTest, InterruptedReadGoesOn) {
   WriteFile(path_, "[1,2]");
   fake::FailSystemCall("read", 1, EINTR);
@@ -208,6 +218,7 @@ TEST_F(JsonFileTest, SuccessLeavesErrnoAlone) {
 TEST_F(JsonFileTest, EveryFailureKeepsTheOldFileAndErrno) {
   ExpectFailure("open", 1, EACCES);
   ExpectFailure("open", 2, EMFILE);
+  ExpectFailure("fstat", 1, EIO);
   ExpectFailure("fchmod", 1, EPERM);
   ExpectFailure("write", 1, ENOSPC);
   ExpectFailure("fsync", 1, EIO);
@@ -308,6 +319,11 @@ TEST_F(JsonFileTest, OwnerIsKeptWhereTheProcessMay) {
   struct stat info {};
   ASSERT_EQ(stat(path_.c_str(), &info), 0);
   EXPECT_EQ(info.st_uid, 1234u);
+  EXPECT_EQ(info.st_gid, 4321u);
+  ASSERT_EQ(chown(path_.c_str(), geteuid(), 4321), 0);
+  ASSERT_TRUE(toFile(new_, path_));
+  ASSERT_EQ(stat(path_.c_str(), &info), 0);
+  EXPECT_EQ(info.st_uid, geteuid());
   EXPECT_EQ(info.st_gid, 4321u);
   fake::FailSystemCall("fchown", 1, EPERM);
   EXPECT_TRUE(toFile(old_, path_));

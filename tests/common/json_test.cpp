@@ -72,7 +72,7 @@ TEST_F(JsonTest, WhatIsNotOneValueIsRefusedAndLeavesNull) {
       "[1,]",   "{\"a\":1,}",  "[,]",       "[1,,2]",  "//c\n1",  "1//c",  "/*c*/1", "[1/*c*/]",
       "{/**/}", "nul",         "True",      "{a:1}",   "{1:1}",   "'a'",   "\"a",    "NaN",
       "Inf",    "{\"a\":}",    "{\"a\" 1}", "[1 2]",   "\"\\x\"", "{,}",   "\xff{}", "{\"a\":1 ",
-      "[[]",    "\"\\ud800\"", "1e",        "{}\n//c",
+      "[[]",    "\"\\ud800\"", "1e",        "{}\n//c", "\"\\",
   };
   for (const std::string& text : refused) {
     Json::Value out = Doc("{\"old\":1}");

@@ -1,7 +1,6 @@
 #include "common/paths.h"
 
 #include <gtest/gtest.h>
-#include <unistd.h>
 
 #include <cstdio>
 #include <cstdlib>
@@ -18,8 +17,7 @@ namespace {
 const bool is_told = [] {
   if (std::getenv("QUARRY_TEST_TELL_PATH") == nullptr) return false;
   std::printf("[%s] [%s]", Root().c_str(), RootedPath("/var/run/x.sock").c_str());
-  std::fflush(stdout);
-  _exit(0);
+  std::exit(0);
 }();
 
 // What the program says when `setting` ("-u NAME" or "NAME=value") is applied to its environment.

@@ -20,9 +20,9 @@
 namespace quarry::fake {
 namespace {
 
-constexpr std::array<const char*, 15> kCallNames = {
-    "open",   "rename", "read",   "write",  "fsync",   "flock",   "close",    "chmod",
-    "fchmod", "chown",  "fchown", "unlink", "seteuid", "setegid", "setgroups"};
+constexpr std::array<const char*, 18> kCallNames = {
+    "open",  "rename", "read",   "pread", "write",  "fsync",  "fstat",   "readlink", "flock",
+    "close", "chmod",  "fchmod", "chown", "fchown", "unlink", "seteuid", "setegid",  "setgroups"};
 
 size_t CallIndex(const char* name) {
   for (size_t i = 0; i < kCallNames.size(); ++i) {
@@ -346,6 +346,11 @@ ssize_t read(int fd, void* data, size_t size) {
   return Enter("read").fails ? -1 : real(fd, data, size);
 }
 
+ssize_t pread(int fd, void* data, size_t size, off_t offset) {
+  static const auto real = Real<ssize_t (*)(int, void*, size_t, off_t)>("pread");
+  return Enter("pread").fails ? -1 : real(fd, data, size, offset);
+}
+
 ssize_t write(int fd, const void* data, size_t size) {
   static const auto real = Real<ssize_t (*)(int, const void*, size_t)>("write");
   const quarry::fake::Verdict verdict = Enter("write");
@@ -357,6 +362,16 @@ int fsync(int fd) {
   static const auto real = Real<int (*)(int)>("fsync");
   if (Enter("fsync").fails) return -1;
   return TheState().sync_skipped ? 0 : real(fd);
+}
+
+int fstat(int fd, struct stat* info) noexcept {
+  static const auto real = Real<int (*)(int, struct stat*)>("fstat");
+  return Enter("fstat").fails ? -1 : real(fd, info);
+}
+
+ssize_t readlink(const char* path, char* text, size_t size) noexcept {
+  static const auto real = Real<ssize_t (*)(const char*, char*, size_t)>("readlink");
+  return Enter("readlink").fails ? -1 : real(path, text, size);
 }
 
 int flock(int fd, int operation) noexcept {

@@ -50,9 +50,9 @@ void SetTime(std::time_t now);
 
 // ---- Failures of system calls
 
-// The calls that can be made to fail or be watched: "open", "rename", "read", "write", "fsync",
-// "flock", "close", "chmod", "fchmod", "chown", "fchown", "unlink", "seteuid", "setegid",
-// "setgroups".
+// The calls that can be made to fail or be watched: "open", "rename", "read", "pread", "write",
+// "fsync", "fstat", "readlink", "flock", "close", "chmod", "fchmod", "chown", "fchown", "unlink",
+// "seteuid", "setegid", "setgroups".
 // Makes the nth call from now on, counted from 1, fail with `error_number` and without effect but
 // for close, which closes.
 void FailSystemCall(const std::string& name, int nth, int error_number);

@@ -83,6 +83,45 @@ TEST_F(OPNodeTest, FirstOfTwoChildrenOfOneNameIsFound) {
   }
 }
 
+// The lists are open to everybody.
+TEST_F(OPNodeTest, ChildTakenAwayIsMadeAnew) {
+  for (const int kept : {0, 20}) {
+    const auto parent = root_->GetChild("parent" + std::to_string(kept));
+    for (int i = 0; i < kept; ++i) parent->GetChild(std::to_string(i));
+    const auto gone = parent->GetChild("child");
+    parent->children.pop_back();
+    const auto made = parent->GetChild("child");
+    EXPECT_NE(made, gone);
+    EXPECT_EQ(parent->children.back(), made);
+    EXPECT_EQ(parent->children.size(), size_t(kept) + 1);
+    for (size_t i = 0; i < size_t(kept); ++i) {
+      EXPECT_EQ(parent->GetChild(std::to_string(i)), parent->children[i]);
+    }
+    EXPECT_EQ(parent->children.size(), size_t(kept) + 1);
+  }
+}
+
+TEST_F(OPNodeTest, RecordsTakenAwayPlayNoPartAnyMore) {
+  const auto node = tree_.GetNodeByPath("/a");
+  const auto rename_to_node = [&] {
+    const auto rec = std::make_shared<OP>(node, OP_NONE, "", Json::Value());
+    rec->src = "/from";
+    tree_.HandleRename(node, rec);
+  };
+  const auto modify = [&] {
+    tree_.HandleModify(node, std::make_shared<OP>(node, OP_NONE, "", Json::Value()));
+  };
+  for (int i = 0; i < 100; ++i) rename_to_node();
+  modify();
+  modify();
+  EXPECT_EQ(Text(*node->ops.back()), "index /a");
+  EXPECT_EQ(node->ops.size(), 101u);
+  node->ops.resize(50);
+  modify();
+  EXPECT_EQ(Text(*node->ops.back()), "index /a");
+  EXPECT_EQ(node->ops.size(), 51u);
+}
+
 TEST_F(OPNodeTest, PathJoinsTheNames) {
   EXPECT_EQ(root_->GetPath(), "");
   EXPECT_EQ(root_->GetChild("volume1")->GetChild("s")->GetChild("a")->GetPath(), "/volume1/s/a");
@@ -125,6 +164,7 @@ TEST_F(OPNodeTest, RecordPrintsItsKindPathAndData) {
   EXPECT_EQ(Streamed(OP(node, OP_UPDATE_CFG, "", Parsed(R"({"audio":true})"))),
             "[4] /s/b, data={\"audio\":true}");
   EXPECT_EQ(Streamed(OP(root_, OP_FULL_REINDEX, "", Json::Value())), "[7] , data=null");
+  EXPECT_EQ(Streamed(OP(nullptr, OP_FULL_REINDEX, "", Json::Value())), "[7] , data=null");
 }
 
 TEST_F(OPNodeTest, NodePrintsItsRecordsIndented) {

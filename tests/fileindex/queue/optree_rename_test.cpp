@@ -60,6 +60,23 @@ TEST_F(RenameTest, KindsThatAreMovedKeepTheirPathAndTheirPlaceInTheOrder) {
   EXPECT_EQ(At(tree, "/e/c"), Strings{"rename /x -> /d/c"});
 }
 
+TEST_F(RenameTest, RenamesAloneAreMovedToo) {
+  // So many that they are no longer looked at one by one.
+  constexpr std::size_t kMany = 50;
+  std::string lines;
+  Strings expected;
+  for (std::size_t i = 0; i < kMany; ++i) {
+    lines += RenameLine("/x", "/d/c");
+    expected.push_back("rename /x -> /d/c");
+  }
+  const QueueFile queue(lines + RenameLine("/d", "/e"));
+  OPTree tree(queue.path());
+  EXPECT_EQ(At(tree, "/d/c"), Strings{});
+  EXPECT_EQ(At(tree, "/e/c"), expected);
+  expected.push_back("rename /d -> /e");
+  EXPECT_EQ(HandedOut(tree), expected);
+}
+
 TEST_F(RenameTest, NothingPendingMeansNothingToCarry) {
   const QueueFile queue(RenameLine("/s/a", "/s/b"));
   OPTree tree(queue.path());

@@ -315,6 +315,27 @@ TEST_F(CustomEventTest, AQueueThatCannotBeOpenedLosesTheEventSilently) {
   EXPECT_EQ(Status(), 0);
 }
 
+TEST_F(CustomEventTest, AQueueThatCannotBeAskedForItsSizeLosesTheEventSilently) {
+  SetQueue("");
+  // The lock asks first.
+  fake::FailSystemCall("fstat", 2, EIO);
+  AddModest();
+  EXPECT_EQ(Queue(), "");
+  EXPECT_THAT(fake::Logs(), IsEmpty());
+  EXPECT_EQ(Status(), 0);
+}
+
+TEST_F(CustomEventTest, AnEndThatCannotBeReadCountsAsTheEndOfALine) {
+  SetQueue(R"({"event":2,"path":"/volume1/photo/b"})"
+           "\n");
+  fake::FailSystemCall("pread", 1, EIO);
+  AddModest();
+  EXPECT_EQ(Queue(), R"({"event":2,"path":"/volume1/photo/b"})"
+                     "\n" +
+                         std::string(kModestLine));
+  EXPECT_EQ(Status(), 0);
+}
+
 TEST_F(CustomEventTest, AShortWriteIsContinued) {
   fake::CutWrite(1, 7);
   AddModest();
