@@ -9,6 +9,7 @@
 
 #include "common/error.h"
 #include "common/paths.h"
+#include "daemons/common/command_line.h"
 #include "daemons/common/log.h"
 #include "daemons/common/single_instance.h"
 #include "daemons/common/socket_server.h"
@@ -74,7 +75,7 @@ int RunDaemon(int argc, char** argv) {
       "  QUARRY_ROOT=$HOME/q tarncontentextractd            in a private system\n\n"
       "The socket is $QUARRY_ROOT/var/run/tarncontentextractd.sock; docs/extractor-protocol.md\n"
       "says what may be asked there.");
-  CLI11_PARSE(app, argc, argv);
+  if (const auto status = daemon::ParseCommandLine(&app, argc, argv)) return *status;
   daemon::OpenLog(kName, true);
   try {
     return Serve(workers);

@@ -13,6 +13,7 @@
 
 #include "common/error.h"
 #include "common/paths.h"
+#include "daemons/common/command_line.h"
 #include "daemons/common/log.h"
 #include "daemons/common/single_instance.h"
 #include "daemons/common/socket_server.h"
@@ -132,7 +133,7 @@ int Main(int argc, char** argv) {
       ->check(CLI::Range(64, 65536))
       ->capture_default_str();
   app.add_flag("--quiet", settings.quiet, "Log to the system log only");
-  CLI11_PARSE(app, argc, argv);
+  if (const auto status = daemon::ParseCommandLine(&app, argc, argv)) return *status;
   daemon::OpenLog(kName, !settings.quiet);
   try {
     Serve(settings);

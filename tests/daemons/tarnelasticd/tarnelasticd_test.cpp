@@ -26,11 +26,11 @@ class ProgramTest : public testing::Test {
     if (pid_ > 0) Kill(SIGKILL);
   }
 
-  pid_t Spawn() {
+  pid_t Spawn(const char* option = "--quiet") {
     const pid_t pid = fork();
     if (pid == 0) {
       setenv("QUARRY_ROOT", dir_.path().c_str(), 1);
-      execl(TARNELASTICD_PROGRAM, TARNELASTICD_PROGRAM, "--quiet", nullptr);
+      execl(TARNELASTICD_PROGRAM, TARNELASTICD_PROGRAM, option, nullptr);
       _exit(127);
     }
     return pid;
@@ -176,6 +176,15 @@ TEST_F(ProgramTest, SaysWhyItCannotStart) {
   test::WriteFile(dir_ / "var/lib/quarry/engine/indexes.json", "{");
   const int status = Wait(Spawn());
   EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == EXIT_FAILURE);
+}
+
+TEST_F(ProgramTest, HelpsAndRefusesWhatItDoesNotKnow) {
+  const int helped = Wait(Spawn("--help"));
+  EXPECT_TRUE(WIFEXITED(helped) && WEXITSTATUS(helped) == 0);
+  for (const char* option : {"--unknown", "--threads", "--memory=1", "x"}) {
+    const int status = Wait(Spawn(option));
+    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 2) << option;
+  }
 }
 
 }  // namespace
