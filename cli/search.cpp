@@ -3,6 +3,7 @@
 #include <editline/readline.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <cstdlib>
 #include <iostream>
 #include <memory>
@@ -13,6 +14,7 @@
 #include "cli/system.h"
 #include "common/file_util.h"
 #include "common/json.h"
+#include "daemons/common/client.h"
 
 namespace quarry::cli {
 namespace {
@@ -89,6 +91,34 @@ Json::Value Search(const SearchRequest& request) {
   return AskEngine("search", data);
 }
 
+std::vector<std::string> Completions(const std::string& prefix) {
+  daemon::ClientOptions options;
+  options.connect_timeout = options.timeout = std::chrono::seconds(1);
+  Json::Value request;
+  request["command"] = "complete";
+  request["data"]["prefix"] = prefix;
+  std::vector<std::string> words;
+  try {
+    const Json::Value reply = daemon::Request("tarnelasticd", EngineSocket(), request, options);
+    for (const Json::Value& word : reply["data"]["words"]) words.push_back(word["word"].asString());
+  } catch (const Error&) {
+    words.clear();
+  } catch (const Json::Exception&) {
+    words.clear();
+  }
+  return words;
+}
+
+void CollectWords(const std::string& id) {
+  Json::Value data;
+  data["db_name"] = id;
+  data["doc_id_field"] = "TARNMDPath";
+  AskEngine("update_term_suggestion", data);
+  Json::Value index;
+  index["id"] = id;
+  AskEngine("commit", index);
+}
+
 void PrintHits(std::ostream& out, const Json::Value& found, unsigned int offset, bool colours) {
   try {
     const Json::Value& hits = found["hits"];
@@ -99,6 +129,9 @@ void PrintHits(std::ostream& out, const Json::Value& found, unsigned int offset,
       out << "Nothing found.\n";
     } else if (number < total) {
       out << number - offset << " of " << total << " shown.\n";
+    }
+    if (found.isMember("suggestion")) {
+      out << "Did you mean \"" << Printable(found["suggestion"].asString()) << "\"?\n";
     }
     for (const Json::Value& index : found["skipped"]) {
       out << "The index " << Printable(index["id"].asString())

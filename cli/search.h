@@ -22,11 +22,20 @@ struct SearchRequest {
 // those with blanks were quoted for the shell and are phrases.
 std::string QueryOf(const std::vector<std::string>& words);
 
-// The engine's answer: {"total", "hits": [...]}, over all indexed shares. Throws Problem or Error.
+// The engine's answer: {"total", "hits": [...]}, over all indexed shares, and "suggestion", another
+// spelling of the query, where that finds more. Throws Problem or Error.
 Json::Value Search(const SearchRequest& request);
 
-// The hits for a person, numbered from `offset` + 1, how many there are, and which indexes could
-// not be searched; matches are marked where `colours` says so.
+// Words of the indexes that begin with `prefix`, the most frequent first. None where no engine
+// answers at once: a shell that completes a line must neither wait nor be told why. Never throws.
+std::vector<std::string> Completions(const std::string& prefix);
+
+// Has the words of the index `id` collected, from which the engine suggests. Blocks until that is
+// done. Throws Problem or Error.
+void CollectWords(const std::string& id);
+
+// The hits for a person, numbered from `offset` + 1, how many there are, what may have been meant
+// instead, and which indexes could not be searched; matches are marked where `colours` says so.
 void PrintHits(std::ostream& out, const Json::Value& found, unsigned int offset, bool colours);
 
 // Asks for words and shows hits at and below the full path `inside` until the end of the input. A

@@ -12,6 +12,7 @@
 #include "cli/shares.h"
 #include "cli/system.h"
 #include "common/file_util.h"
+#include "common/sdk/share.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/queue/event.h"
 #include "fileindex/util/custom_event.h"
@@ -70,6 +71,7 @@ void Index(const std::string& argument, const std::vector<std::string>& words) {
   WaitUntilIndexed(place.folder);
   std::cerr << DocumentCount(place.share) << " documents in the index of " << Printable(place.share)
             << ", up to date after " << HumanDuration(SecondsSince(start)) << '\n';
+  CollectWords(sdk::SDKShare(place.share).GetDBName());
   const std::string inside = fileindex::GetFullPath(place.folder);
   if (words.empty()) {
     SearchPrompt(inside);

@@ -75,10 +75,18 @@ TEST(PrintHitsTest, NamesAnIndexThatCouldNotBeSearched) {
       "Nothing found.\nThe index fileindex_a could not be searched: It is damaged.\n");
 }
 
+TEST(PrintHitsTest, AsksWhetherSomethingElseWasMeant) {
+  EXPECT_EQ(Shown(R"({"total":0,"hits":[],"suggestion":"a \"big harbour\""})"),
+            "Nothing found.\nDid you mean \"a \"big harbour\"\"?\n");
+  EXPECT_EQ(Shown(R"({"total":1,"hits":[{"path":"/v/a","is_dir":true}],"suggestion":"\u001b[2J"})"),
+            "1. /v/a\nDid you mean \"\\x1b[2J\"?\n");
+}
+
 TEST(PrintHitsTest, RefusesAnswersOfAnotherShape) {
-  for (const char* found : {R"([])", R"({"total":"many","hits":[]})", R"({"total":1,"hits":[7]})",
-                            R"({"total":1,"hits":[{"path":[]}]})",
-                            R"({"total":1,"hits":[{"path":"/a","is_dir":true,"snippet":[1]}]})"}) {
+  for (const char* found :
+       {R"([])", R"({"total":"many","hits":[]})", R"({"total":1,"hits":[7]})",
+        R"({"total":1,"hits":[{"path":[]}]})", R"({"total":0,"hits":[],"suggestion":["a"]})",
+        R"({"total":1,"hits":[{"path":"/a","is_dir":true,"snippet":[1]}]})"}) {
     EXPECT_THROW(Shown(found), Problem) << found;
   }
 }

@@ -273,13 +273,6 @@ TEST_F(OperationsTest, HomesAndAccounts) {
   EXPECT_EQ(system_.Quarry({"home", "enable", "--accounts", "all"}).end, "exit code 2");
 }
 
-TEST_F(OperationsTest, Suggestions) {
-  IndexDocs();
-  EXPECT_EQ(system_.QuarryJson({"suggest"})["indexes"][0], "fileindex_docs");
-  EXPECT_EQ(system_.QuarryJson({"suggest", "docs"})["indexes"].size(), 1U);
-  EXPECT_TRUE(Refuses({"suggest", "nobody"}, "There is no share named \"nobody\""));
-}
-
 TEST_F(OperationsTest, WithoutASystemNothingIsBegun) {
   IndexDocs();
   system_.Stop();
