@@ -377,6 +377,17 @@ TEST_F(RealDaemonsTest, RefusesToRunTwice) {
   EXPECT_TRUE(daemon::IsListening(CommandSocketPath()));
 }
 
+TEST_F(RealDaemonsTest, HelpsAndRefusesWhatItDoesNotKnow) {
+  const auto end = [this](const std::vector<std::string>& arguments) {
+    cli::Child daemon(ProgramPath("fileindexd"), arguments, volume_ / "options.log");
+    return daemon.WaitEnded(60000) ? *daemon.Ended() : "still running";
+  };
+  EXPECT_EQ("exit code 0", end({"--help"}));
+  EXPECT_EQ("exit code 2", end({"--unknown"}));
+  EXPECT_EQ("exit code 2", end({"--threads", "0"}));
+  EXPECT_EQ("exit code 2", end({"x"}));
+}
+
 // Its worker hangs in a question that nobody will answer.
 TEST_F(RealDaemonsTest, StopsThoughTheEngineDoesNotAnswer) {
   std::promise<void> go;
