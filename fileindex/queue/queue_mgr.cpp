@@ -85,7 +85,8 @@ int QueueMgr::DeleteTmp() {
   const int result = unlink(queue_path_tmp_.c_str());
   // Not left to closing: a child of fork may have the same open file.
   flock(seen_->get(), LOCK_UN);
-  if (result == 0) seen_.reset();
+  // The tree is kept, but what will be at the name next was never read.
+  if (result == 0) seen_ = std::make_shared<const UniqueFd>();
   return result;
 }
 
@@ -128,7 +129,7 @@ std::int32_t QueueMgr::ProcessOP(std::function<void(std::shared_ptr<OP>)> fn, bo
   }
   if (!use_tmp) return GetOPTree()->ProcessOP(std::move(fn));
   const std::shared_ptr<OPTree> tree = GetOPTreeTmp();
-  if (seen_) Claim(seen_->get());
+  Claim(seen_->get());
   return tree->ProcessOP(std::move(fn));
 }
 

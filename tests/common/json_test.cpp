@@ -72,7 +72,7 @@ TEST_F(JsonTest, WhatIsNotOneValueIsRefusedAndLeavesNull) {
       "[1,]",   "{\"a\":1,}",  "[,]",       "[1,,2]",  "//c\n1",  "1//c",  "/*c*/1", "[1/*c*/]",
       "{/**/}", "nul",         "True",      "{a:1}",   "{1:1}",   "'a'",   "\"a",    "NaN",
       "Inf",    "{\"a\":}",    "{\"a\" 1}", "[1 2]",   "\"\\x\"", "{,}",   "\xff{}", "{\"a\":1 ",
-      "[[]",    "\"\\ud800\"", "1e",        "{}\n//c", "\"\\",
+      "[[]",    "\"\\ud800\"", "1e",        "{}\n//c", "\"\\",    "\\1",
   };
   for (const std::string& text : refused) {
     Json::Value out = Doc("{\"old\":1}");
@@ -82,8 +82,9 @@ TEST_F(JsonTest, WhatIsNotOneValueIsRefusedAndLeavesNull) {
 }
 
 TEST_F(JsonTest, NulBytesAreRefusedWhereverTheyStand) {
-  for (const std::string& text : {std::string("{}\0", 3), std::string("{}\0x", 4),
-                                  std::string("\0{}", 3), std::string("\"a\0b\"", 5)}) {
+  for (const std::string& text :
+       {std::string("{}\0", 3), std::string("{}\0x", 4), std::string("\0{}", 3),
+        std::string("\"a\0b\"", 5), std::string("\"a\\\0b\"", 6)}) {
     Json::Value out(1);
     EXPECT_FALSE(fromString(out, text));
     EXPECT_TRUE(out.isNull());

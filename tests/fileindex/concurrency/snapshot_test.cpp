@@ -63,6 +63,19 @@ TEST_F(SnapshotTest, OneInThePlaceOfTheProcessedOneStays) {
   EXPECT_EQ(third.DeleteTmp(), 0);
 }
 
+TEST_F(SnapshotTest, OneThatFollowsTheRemovedOneStays) {
+  WriteLive("/a");
+  QueueMgr manager(live_);
+  EXPECT_EQ(Process(manager), "/a");
+  EXPECT_EQ(manager.DeleteTmp(), 0);
+  WriteLive("/b");
+  EXPECT_EQ(Process(manager), "/a");
+  ExpectKept(manager);
+  QueueMgr next(live_);
+  EXPECT_EQ(Process(next), "/b");
+  EXPECT_EQ(next.DeleteTmp(), 0);
+}
+
 TEST_F(SnapshotTest, OneThatIsGoneIsReported) {
   WriteLive("/a");
   QueueMgr manager(live_);

@@ -77,6 +77,38 @@ TEST_F(RenameTest, RenamesAloneAreMovedToo) {
   EXPECT_EQ(HandedOut(tree), expected);
 }
 
+// Rounds of: `event` at /e/c, and /e is moved to /d.
+std::string RoundsOf(EventKind event, int rounds) {
+  std::string lines;
+  for (int i = 0; i < rounds; ++i) lines += Line(event, "/e/c") + RenameLine("/e", "/d");
+  return lines;
+}
+
+TEST_F(RenameTest, ListWithoutARenameOfItsOwnIsMovedHoweverLong) {
+  for (const int rounds : {1, 50}) {
+    const QueueFile queue(RoundsOf(EVENT_DELETE, rounds) + RenameLine("/d", "/f"));
+    OPTree tree(queue.path());
+    EXPECT_EQ(At(tree, "/d/c"), Strings{});
+    EXPECT_EQ(At(tree, "/f/c"), Strings(static_cast<std::size_t>(rounds), "delete /e/c"));
+  }
+}
+
+TEST_F(RenameTest, ListWhereAllIsCancelledStaysHoweverLong) {
+  for (const int rounds : {1, 50}) {
+    const QueueFile queue(RoundsOf(EVENT_MODIFY, rounds) + Line(EVENT_REINDEX, "/d") +
+                          RenameLine("/d", "/f"));
+    OPTree tree(queue.path());
+    Strings cancelled;
+    for (int i = 0; i < rounds; ++i) {
+      cancelled.push_back("none /e/c");
+      cancelled.push_back("none /d/c");
+    }
+    EXPECT_EQ(At(tree, "/d/c"), cancelled);
+    EXPECT_EQ(At(tree, "/f/c"), Strings{});
+    EXPECT_EQ(HandedOut(tree).back(), "reindex /f");
+  }
+}
+
 TEST_F(RenameTest, NothingPendingMeansNothingToCarry) {
   const QueueFile queue(RenameLine("/s/a", "/s/b"));
   OPTree tree(queue.path());
