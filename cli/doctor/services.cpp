@@ -18,6 +18,8 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
+// A service that has just been started is given some time; one that is started here, more.
+constexpr std::chrono::seconds kGrace{3};
 constexpr std::chrono::seconds kStartTime{10};
 constexpr std::chrono::milliseconds kLook{50};
 
@@ -30,8 +32,8 @@ const std::map<std::string, std::string>& Sockets() {
 }
 
 // Whether somebody listens there, or does so soon.
-bool Listens(const std::string& service) {
-  const auto end = Clock::now() + kStartTime;
+bool Listens(const std::string& service, std::chrono::seconds patience) {
+  const auto end = Clock::now() + patience;
   while (!daemon::IsListening(Sockets().at(service))) {
     if (Clock::now() > end) return false;
     std::this_thread::sleep_for(kLook);
@@ -60,7 +62,7 @@ void CheckSupervised(Examination& examination, const Json::Value& report) {
   } else if (state == "restarting") {
     examination.Mend(name + " does not stay (" + report["last_end"].asString() + ")",
                      "started again", [&] { return Order("start", name); });
-  } else if (!Listens(name)) {
+  } else if (!Listens(name, kGrace)) {
     examination.Mend(name + " runs, but nobody can reach it", "stopped and started again", [&] {
       Order("stop", name);
       return Order("start", name);
@@ -75,7 +77,7 @@ void CheckUnits(Examination& examination) {
     examination.Mend(name + " does not run", "started", [service = name] {
       const FolderLock lock;
       fileindex::PrepareServices();
-      if (!Listens(service)) throw Problem("Start it with: systemctl start " + service);
+      if (!Listens(service, kStartTime)) throw Problem("Start it with: systemctl start " + service);
       return "";
     });
   }
@@ -96,8 +98,8 @@ void CheckAnswers(Examination& examination, const std::string& name,
 
 void CheckServices(Examination& examination) {
   if (daemon::IsListening(SupervisorSocket())) {
-    const Json::Value nothing(Json::objectValue);
-    for (const Json::Value& service : AskSupervisor("status", nothing)["services"]) {
+    const Json::Value status = AskSupervisor("status", Json::Value(Json::objectValue));
+    for (const Json::Value& service : status["services"]) {
       CheckSupervised(examination, service);
     }
   } else if (ServicesAreManaged()) {

@@ -10,10 +10,11 @@ namespace {
 // The structure of every page; a reader's statements stop at its deadline.
 void CheckPages(Database* db) {
   Statement check = db->Prepare("PRAGMA quick_check(1)");
-  if (check.Step() && check.Text(0) != "ok") {
-    throw Error(kDamagedIndex,
-                "The index's database is damaged: " + std::string(check.Text(0).substr(0, 200)));
-  }
+  if (!check.Step() || check.Text(0) == "ok") return;
+  const std::string report(check.Text(0));
+  // The lines before the last one name the database.
+  const std::string finding = report.substr(report.rfind('\n') + 1);
+  throw Error(kDamagedIndex, "The index's database is damaged: " + finding);
 }
 
 }  // namespace

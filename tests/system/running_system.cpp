@@ -28,8 +28,12 @@ RunningSystem::RunningSystem() {
   ResetTestRoot();
 }
 
-void RunningSystem::Start() {
+void RunningSystem::StartSupervisor() {
   supervisor_.emplace(Program(), std::vector<std::string>{"run"}, scratch_ / "run.log");
+}
+
+void RunningSystem::Start() {
+  StartSupervisor();
   ASSERT_TRUE(WaitUntil([] {
     return daemon::IsListening(cli::SupervisorSocket()) && daemon::IsListening(cli::EngineSocket());
   })) << ReadFile(scratch_ / "run.log");
@@ -102,6 +106,10 @@ std::multiset<std::string> RunningSystem::Documents(const std::string& share_pat
     paths.insert(document["TARNMDPath"].asString());
   }
   return paths;
+}
+
+std::string RunningSystem::Log() const {
+  return ReadFile(scratch_ / "run.log");
 }
 
 pid_t RunningSystem::Pid(const std::string& service) const {

@@ -28,6 +28,8 @@ class RunningSystem {
 
   // Starts "quarry run" and waits until the engine listens.
   void Start();
+  // Only starts it.
+  void StartSupervisor();
   // Asks it to stop and waits until it has. Kill() does not ask.
   void Stop();
   void Kill();
@@ -51,6 +53,9 @@ class RunningSystem {
   // How many queues are registered with the change monitor. What was being written when its writer
   // was killed does not count.
   std::ptrdiff_t Registrations() const;
+
+  // What the supervisor and the daemons have logged since the first start.
+  std::string Log() const;
 
   // The process of a service, 0 when it does not run.
   pid_t Pid(const std::string& service) const;
