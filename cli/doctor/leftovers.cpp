@@ -1,13 +1,15 @@
 // What processes that were killed have left behind.
 
-#include <dirent.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <cctype>
 #include <cerrno>
 #include <ctime>
 #include <filesystem>
 #include <system_error>
+#include <vector>
 
 #include "cli/doctor/checks.h"
 #include "cli/doctor/known_places.h"
@@ -73,35 +75,47 @@ void CheckSocketPlace(Examination& examination, const std::string& program) {
                    "set aside", [&] { return "set aside as " + SetAside(path); });
 }
 
-bool EndsInSixCharacters(const std::string& name) {
-  static const char* const letters =
-      "abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789";
+// Whether the name ends in what is drawn for a temporary file. Some of these are words; a copy that
+// somebody has called ".backup" must not be taken for one.
+bool EndsAtRandom(const std::string& name) {
   const std::string end = GetFileExtension(name, false);
-  return end.size() == 6 && end.find_first_not_of(letters) == std::string::npos;
+  const auto count = [&](int (*is)(int)) {
+    return std::count_if(end.begin(), end.end(),
+                         [is](char c) { return is(static_cast<unsigned char>(c)) != 0; });
+  };
+  return end.size() == 6 && count(std::isalnum) == 6 && count(std::islower) < 6;
 }
 
-// Names under which state files are written before they get their own.
-bool IsTemporaryName(const std::string& name) {
+// Where state files are written under another name before they get their own. Queues, and the
+// directories of indexes, may have any name that does not begin with a point.
+struct Place {
+  std::string directory;
+  std::vector<std::string> prefixes;  // of names that end at random
+};
+
+bool IsTemporaryName(const std::string& name, const Place& place) {
   if (StringStartWith(name, ".quarry-")) return GetFileExtension(name, false) == "tmp";
-  const bool replaced = StringStartWith(name, "shares.json.") ||
-                        StringStartWith(name, "samba-spotlight.conf.") ||
-                        name.find(".json.") != std::string::npos;
-  return replaced && EndsInSixCharacters(name);
+  return std::any_of(place.prefixes.begin(), place.prefixes.end(), [&](const std::string& prefix) {
+    return StringStartWith(name, prefix) && EndsAtRandom(name);
+  });
 }
 
-bool IsOldFile(const std::string& path) {
+// Nobody else may read it before it is whole, unless its writer thinks otherwise.
+bool IsOldDraft(const std::string& path) {
   struct stat info {};
+  const bool hidden = Basename(path).front() == '.';
   return lstat(path.c_str(), &info) == 0 && S_ISREG(info.st_mode) &&
+         (hidden || (info.st_mode & 0777) == 0600) &&
          info.st_mtime < std::time(nullptr) - kOldSeconds;
 }
 
-void CheckTemporaryFiles(Examination& examination, const std::string& directory) {
+void CheckTemporaryFiles(Examination& examination, const Place& place) {
   std::error_code failure;
-  std::filesystem::directory_iterator entry(directory, failure);
+  std::filesystem::directory_iterator entry(place.directory, failure);
   for (const std::filesystem::directory_iterator end; !failure && entry != end;
        entry.increment(failure)) {
     const std::string path = entry->path();
-    if (!IsTemporaryName(entry->path().filename()) || !IsOldFile(path)) continue;
+    if (!IsTemporaryName(entry->path().filename(), place) || !IsOldDraft(path)) continue;
     examination.Mend("A writer that was killed has left " + path, "removed", [&] {
       Remove(path);
       return "";
@@ -116,11 +130,12 @@ void CheckLeftovers(Examination& examination) {
     CheckTraces(examination, program);
     CheckSocketPlace(examination, program);
   }
-  for (const std::string& directory :
-       {Dirname(fileindex::kFileIndexFoldersCfgPath), RootedPath("/etc/quarry"),
-        Dirname(EngineListPath()), MonitorDirectory(), RootedPath("/var/lib/quarry/queue")}) {
-    CheckTemporaryFiles(examination, directory);
-  }
+  const Place places[] = {{Dirname(fileindex::kFileIndexFoldersCfgPath), {}},
+                          {Dirname(EngineListPath()), {}},
+                          {RootedPath("/var/lib/quarry/queue"), {}},
+                          {RootedPath("/etc/quarry"), {"shares.json.", "samba-spotlight.conf."}},
+                          {MonitorDirectory(), {"fileindex-"}}};
+  for (const Place& place : places) CheckTemporaryFiles(examination, place);
 }
 
 }  // namespace quarry::cli
