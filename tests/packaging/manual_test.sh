@@ -18,7 +18,7 @@ subcommands() {
 
 # The long options in the help of a command.
 options() {
-  "$@" --help | grep -oE '^  (-h,)?--[a-z]+' | grep -oE -- '--.*'
+  "$@" --help | grep -oE '^  (-h,)?--[a-z-]+' | grep -oE -- '--.*'
 }
 
 # All commands, one a line, as they are typed.
