@@ -5,6 +5,7 @@
 #include "cli/system.h"
 #include "common/json.h"
 #include "daemons/common/client.h"
+#include "fileindex/config/folder_mgr.h"
 
 namespace quarry::cli {
 namespace {
@@ -73,6 +74,26 @@ Json::Value SetAside(const Json::Value& report) {
       work["share"] = share["share"];
       list.append(work);
     }
+  }
+  return list;
+}
+
+Json::Value UnusableIndexes() {
+  Json::Value list(Json::arrayValue);
+  if (!daemon::IsListening(EngineSocket())) return list;
+  try {
+    const Json::Value status = AskEngine("engine_status", Json::Value(Json::objectValue));
+    for (const std::string& share : fileindex::FolderMgr().GetIndexedShares()) {
+      for (const Json::Value& index : status["indexes"]) {
+        if (index["id"] != "fileindex_" + share || !index.isMember("problem")) continue;
+        Json::Value entry;
+        entry["share"] = share;
+        entry["problem"] = index["problem"];
+        list.append(entry);
+      }
+    }
+  } catch (const Problem&) {
+    // It stopped in between.
   }
   return list;
 }

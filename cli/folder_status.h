@@ -22,6 +22,9 @@ Json::Value FolderStatus(const fileindex::Folder& folder, const Json::Value& rep
 // What the daemon has given up for now: {"share", "path", "error"} each.
 Json::Value SetAside(const Json::Value& report);
 
+// {"share", "problem"} of each index that the engine cannot use. None while it does not answer.
+Json::Value UnusableIndexes();
+
 // A state of FolderStatus in words for a person.
 std::string StateInWords(const Json::Value& status);
 

@@ -36,6 +36,7 @@ Json::Value Collect() {
   const Json::Value report = IndexDaemonReport();
   status["folders"] = Folders(report);
   status["set_aside"] = SetAside(report);
+  status["unusable_indexes"] = UnusableIndexes();
   return status;
 }
 
@@ -74,6 +75,14 @@ void PrintSetAside(const Json::Value& list) {
   }
 }
 
+void PrintUnusable(const Json::Value& list) {
+  for (const Json::Value& index : list) {
+    std::cout << "\nThe index of the share " << Printable(index["share"].asString())
+              << " cannot be used (" << Printable(index["problem"].asString())
+              << "). Mend it with: quarry doctor\n";
+  }
+}
+
 void Print(const Json::Value& status) {
   PrintServices(status);
   PrintPause(status["resume_time"].asInt64());
@@ -89,6 +98,7 @@ void Print(const Json::Value& status) {
                     Printable(StateInWords(folder))});
   }
   PrintTable(std::cout, rows);
+  PrintUnusable(status["unusable_indexes"]);
   PrintSetAside(status["set_aside"]);
 }
 

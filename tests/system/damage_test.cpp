@@ -137,6 +137,8 @@ TEST_F(DamageTest, AnIndexWhoseFileIsOverwritten) {
   WriteFile(Database(), std::string(20'000, 'x'));
   system_.Start();
   EXPECT_TRUE(LogSays("An index cannot be used: "));
+  EXPECT_TRUE(StatusSays("The index of the share docs cannot be used"));
+  EXPECT_TRUE(StatusSays("quarry doctor"));
   Mended();
   Run({"resume"});
   ExpectWhole();
