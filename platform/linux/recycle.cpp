@@ -23,15 +23,15 @@ std::string TakeComponent(std::string* path) {
   return component;
 }
 
-// Splits `full_path` into its share's name and the rest. False when no share holds it.
-bool SplitPath(const char* full_path, std::string* share_name, std::string* rest) {
+// Finds the share that holds `full_path`, and where in it that is. False when none does.
+bool SplitPath(const char* full_path, ShareRecord* share, std::string* rest) {
   if (full_path == nullptr || *full_path != '/') return false;
   const ShareList shares = TryLoadShares();
   if (shares == nullptr) return false;
   const std::string path = full_path;
-  const ShareRecord* share = ShareHolding(*shares, path);
-  if (share == nullptr) return false;
-  *share_name = share->name;
+  const ShareRecord* holder = ShareHolding(*shares, path);
+  if (holder == nullptr) return false;
+  *share = *holder;
   *rest = path.substr(share->path.size());
   return true;
 }
@@ -44,19 +44,20 @@ using namespace quarry::platform;
 
 extern "C" {
 
+// Where the recycle bin is switched off, a directory of its name is one like any other.
 int TARNShareIsShareRecycle(const char* full_path) {
-  std::string share;
+  ShareRecord share;
   std::string rest;
   if (!SplitPath(full_path, &share, &rest)) return QUARRY_PLATFORM_FAIL(kErrNotFound);
-  return TakeComponent(&rest) == kRecycleName ? 1 : 0;
+  return share.recycle_bin && TakeComponent(&rest) == kRecycleName ? 1 : 0;
 }
 
 int TARNRecycleUserHomePathIsExist(const char* full_path, int kind) {
-  std::string share;
+  ShareRecord share;
   std::string rest;
   if (kind != kHomeRecycleKind) return QUARRY_PLATFORM_FAIL(kErrBadParameter);
   if (!SplitPath(full_path, &share, &rest)) return QUARRY_PLATFORM_FAIL(kErrNotFound);
-  if (share != kHomesShare || TakeComponent(&rest).empty()) return 0;
+  if (!share.recycle_bin || share.name != kHomesShare || TakeComponent(&rest).empty()) return 0;
   return TakeComponent(&rest) == kRecycleName ? 1 : 0;
 }
 

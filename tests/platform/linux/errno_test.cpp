@@ -41,7 +41,7 @@ TEST_F(ErrnoTest, WithoutAShareFile) {
 }
 
 TEST_F(ErrnoTest, OfPlaces) {
-  const std::string share = Add("photo").path;
+  const std::string share = Add("photo", true).path;
   const std::string file = share + "/f";
   test::WriteFile(file, "");
   ASSERT_EQ(access(file.c_str(), X_OK), -1);

@@ -10,7 +10,7 @@ constexpr int kKind = 11;
 class RecycleTest : public ShareTest {};
 
 TEST_F(RecycleTest, AShareHasOneRecycleBinAtItsTop) {
-  const std::string share = Add("photo").path;
+  const std::string share = Add("photo", true).path;
   const auto in_bin = [&](const std::string& inner) {
     return TARNShareIsShareRecycle((share + inner).c_str());
   };
@@ -27,8 +27,8 @@ TEST_F(RecycleTest, AShareHasOneRecycleBinAtItsTop) {
 }
 
 TEST_F(RecycleTest, AUsersHomeHasARecycleBinAtItsTop) {
-  const std::string homes = Add("homes").path;
-  const std::string other = Add("other").path;
+  const std::string homes = Add("homes", true).path;
+  const std::string other = Add("other", true).path;
   const auto in_bin = [&](const std::string& path) {
     return TARNRecycleUserHomePathIsExist(path.c_str(), kKind);
   };
@@ -41,6 +41,21 @@ TEST_F(RecycleTest, AUsersHomeHasARecycleBinAtItsTop) {
   EXPECT_EQ(in_bin(other + "/alice/#recycle"), 0);
   EXPECT_LT(in_bin("/nowhere"), 0);
   EXPECT_LT(TARNRecycleUserHomePathIsExist((homes + "/alice/#recycle").c_str(), 10), 0);
+}
+
+TEST_F(RecycleTest, WithoutARecycleBinADirectoryOfItsNameIsOneLikeAnyOther) {
+  ShareRecord photo = Add("photo");
+  ShareRecord homes = Add("homes");
+  const std::string in_photo = photo.path + "/#recycle/x";
+  const std::string in_homes = homes.path + "/alice/#recycle/x";
+  EXPECT_EQ(TARNShareIsShareRecycle(in_photo.c_str()), 0);
+  EXPECT_EQ(TARNRecycleUserHomePathIsExist(in_homes.c_str(), kKind), 0);
+  photo.recycle_bin = true;
+  homes.recycle_bin = true;
+  AddShare(photo);
+  AddShare(homes);
+  EXPECT_EQ(TARNShareIsShareRecycle(in_photo.c_str()), 1);
+  EXPECT_EQ(TARNRecycleUserHomePathIsExist(in_homes.c_str(), kKind), 1);
 }
 
 }  // namespace

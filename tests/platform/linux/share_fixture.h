@@ -20,8 +20,9 @@ class ShareTest : public ::testing::Test {
   ShareTest() { test::ResetTestRoot(); }
 
   // Makes the share's directory and registers it.
-  ShareRecord Add(const std::string& name) {
+  ShareRecord Add(const std::string& name, bool recycle_bin = false) {
     ShareRecord share;
+    share.recycle_bin = recycle_bin;
     share.name = name;
     share.path = volume_ / name;
     test::MakeDirs(share.path);
