@@ -14,7 +14,7 @@ constexpr int kTARNFSTypeRefused = 12;
 
 // How TARNFileCopy copies. Zero-filled but for the flags that are wanted.
 struct TARNCOPYARGS {
-  int preserve;      // 1: keep owner, mode and times
+  int preserve;      // 1: keep owner, mode, times, access lists and other attributes
   int move;          // 1: remove the source once it is copied
   int reserved[14];  // the platform's own
 };

@@ -3,6 +3,7 @@
 #include <fcntl.h>
 #include <fts.h>
 #include <sys/stat.h>
+#include <sys/xattr.h>
 #include <unistd.h>
 
 #include <atomic>
@@ -103,12 +104,59 @@ bool IsOwnerOutOfReach(int error) {
   return error == EPERM || error == EINVAL;
 }
 
-// Owner before mode: a change of owner takes the set-id bits away. Where the owner cannot be kept
-// they are not either: they would lend the rights of another user than they did.
-bool CopyAttributes(const struct stat& info, const std::string& to) {
+// Whether the target's file system has no such attributes, or this process may not set this one:
+// those of the kernel and of security modules belong to whoever writes the file.
+bool IsAttributeOutOfReach(int error) {
+  return error == ENOTSUP || error == EPERM || error == EACCES || error == EINVAL;
+}
+
+// The bytes that `ask(buffer, size)` gives, which tells their number when it gets no room. False,
+// with errno set, when it cannot be asked.
+template <typename Ask>
+bool TakeAll(const Ask& ask, std::string* bytes) {
+  while (true) {
+    const ssize_t size = ask(nullptr, 0);
+    if (size < 0) return false;
+    bytes->resize(static_cast<std::size_t>(size));
+    const ssize_t got = size == 0 ? 0 : ask(bytes->data(), bytes->size());
+    if (got < 0 && errno == ERANGE) continue;  // it has grown in between
+    if (got < 0) return false;
+    bytes->resize(static_cast<std::size_t>(got));
+    return true;
+  }
+}
+
+bool CopyExtendedAttribute(const char* from, const std::string& to, const char* name) {
+  std::string value;
+  const auto ask = [&](void* room, std::size_t size) { return lgetxattr(from, name, room, size); };
+  if (!TakeAll(ask, &value)) return errno == ENODATA || IsAttributeOutOfReach(errno);
+  return lsetxattr(to.c_str(), name, value.data(), value.size(), 0) == 0 ||
+         IsAttributeOutOfReach(errno);
+}
+
+// Access lists are among them.
+bool CopyExtendedAttributes(const char* from, const std::string& to) {
+  std::string names;
+  const auto ask = [&](void* room, std::size_t size) {
+    return llistxattr(from, static_cast<char*>(room), size);
+  };
+  if (!TakeAll(ask, &names)) return IsAttributeOutOfReach(errno);
+  // A file that is to be read-only takes none; it gets its mode afterwards. Links have none.
+  if (!names.empty()) fchmodat(AT_FDCWD, to.c_str(), S_IRWXU, AT_SYMLINK_NOFOLLOW);
+  for (std::size_t begin = 0; begin < names.size(); begin = names.find('\0', begin) + 1) {
+    if (!CopyExtendedAttribute(from, to, names.c_str() + begin)) return false;
+  }
+  return true;
+}
+
+// Owner before the rest: a change of owner takes the set-id bits away. Where the owner cannot be
+// kept they are not either: they would lend the rights of another user than they did.
+bool CopyAttributes(const FTSENT& entry, const std::string& to) {
+  const struct stat& info = *entry.fts_statp;
   const bool owned = lchown(to.c_str(), info.st_uid, info.st_gid) == 0;
   if (!owned && !IsOwnerOutOfReach(errno)) return false;
   const mode_t mode = info.st_mode & (owned ? kPermissions : kPlainPermissions);
+  if (!CopyExtendedAttributes(entry.fts_accpath, to)) return false;
   if (!S_ISLNK(info.st_mode) && chmod(to.c_str(), mode) != 0) return false;
   const timespec times[] = {info.st_atim, info.st_mtim};
   return utimensat(AT_FDCWD, to.c_str(), times, AT_SYMLINK_NOFOLLOW) == 0;
@@ -116,11 +164,11 @@ bool CopyAttributes(const struct stat& info, const std::string& to) {
 
 // A directory must stay writable until all is in it; afterwards it gets the mode that it was to
 // have. `preserve` false asks for the source's mode as the umask leaves it.
-bool FinishDirectory(const struct stat& info, const std::string& to, bool preserve) {
-  if (preserve) return CopyAttributes(info, to);
+bool FinishDirectory(const FTSENT& entry, const std::string& to, bool preserve) {
+  if (preserve) return CopyAttributes(entry, to);
   struct stat made {};
   if (stat(to.c_str(), &made) != 0) return false;
-  const mode_t wanted = made.st_mode & info.st_mode & kPlainPermissions;
+  const mode_t wanted = made.st_mode & entry.fts_statp->st_mode & kPlainPermissions;
   return wanted == (made.st_mode & kPlainPermissions) || chmod(to.c_str(), wanted) == 0;
 }
 
@@ -132,7 +180,7 @@ bool CopyEntry(const FTSENT& entry, const std::string& to, bool preserve) {
     case FTS_D:
       return mkdir(to.c_str(), plain | S_IRWXU) == 0;
     case FTS_DP:
-      return FinishDirectory(info, to, preserve);
+      return FinishDirectory(entry, to, preserve);
     case FTS_F:
       copied = CopyRegular(entry.fts_accpath, to, plain);
       break;
@@ -144,7 +192,7 @@ bool CopyEntry(const FTSENT& entry, const std::string& to, bool preserve) {
       copied = mknod(to.c_str(), info.st_mode, info.st_rdev) == 0;
       break;
   }
-  return copied && (!preserve || CopyAttributes(info, to));
+  return copied && (!preserve || CopyAttributes(entry, to));
 }
 
 bool RemoveEntry(const FTSENT& entry) {

@@ -8,8 +8,8 @@
 namespace quarry::platform {
 
 // Copies `from` with all that is in it to `to`, which must not exist. Links are copied as links.
-// With `preserve` owner (as far as allowed), mode and times are kept. Returns false, with errno
-// set, on failure; part of the copy may be there.
+// With `preserve` mode, times, and as far as they can be owner, access lists and other extended
+// attributes are kept. Returns false, with errno set, on failure; part of the copy may be there.
 bool CopyTree(const std::string& from, const std::string& to, bool preserve);
 
 // Removes `path` with all that is in it, following no link. False, with errno set, on failure.

@@ -5,9 +5,12 @@
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
+#include <sys/xattr.h>
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstdint>
+#include <cstring>
 #include <string>
 
 #include "platform/include/filesystem.h"
@@ -127,6 +130,48 @@ TEST(FileCopyTest, PreservesModeAndTimesWhenAsked) {
   EXPECT_EQ(Status(dir / "b/sub/deep").st_mtim.tv_sec, 3000);
   EXPECT_EQ(Status(dir / "b/sub").st_mtim.tv_sec, 4000);
   EXPECT_EQ(Status(dir / "b").st_mtim.tv_sec, 5000);
+}
+
+// An access list as the kernel takes it: the owner, user 12345 and the mask may do everything.
+std::string AccessList() {
+  const auto entry = [](int tag, int permissions, std::uint32_t id) {
+    std::string bytes{static_cast<char>(tag), 0, static_cast<char>(permissions), 0};
+    for (int shift = 0; shift < 32; shift += 8) bytes += static_cast<char>(id >> shift & 0xFFU);
+    return bytes;
+  };
+  constexpr std::uint32_t kNone = 0xFFFFFFFFU;
+  return std::string("\2\0\0\0", 4) + entry(1, 7, kNone) + entry(2, 7, 12345) + entry(4, 0, kNone) +
+         entry(16, 7, kNone) + entry(32, 0, kNone);
+}
+
+// The value of an attribute, or why there is none.
+std::string Attribute(const std::string& path, const char* name) {
+  std::string value(4096, '\0');
+  const ssize_t size = lgetxattr(path.c_str(), name, value.data(), value.size());
+  return size < 0 ? strerror(errno) : value.substr(0, static_cast<std::size_t>(size));
+}
+
+// What the file system of the tests does not keep is not kept by a copy on it either.
+TEST(FileCopyTest, PreservesAccessListsAndOtherAttributesWhenAsked) {
+  const TempDir dir;
+  const std::string acl = AccessList();
+  WriteFile(dir / "tree/file", "text");
+  for (const std::string& path : {dir / "tree/file", dir / "tree"}) {
+    setxattr(path.c_str(), "user.quarry", "a\0b", 3, 0);
+    setxattr(path.c_str(), "system.posix_acl_access", acl.data(), acl.size(), 0);
+  }
+  ASSERT_EQ(chmod((dir / "tree/file").c_str(), 0440), 0);
+  ASSERT_EQ(Copy(dir / "tree", dir / "kept", 1), 0);
+  ASSERT_EQ(Copy(dir / "tree", dir / "plain"), 0);
+  for (const std::string name : {"", "/file"}) {
+    for (const char* attribute : {"user.quarry", "system.posix_acl_access"}) {
+      EXPECT_EQ(Attribute(dir / "kept" + name, attribute),
+                Attribute(dir / "tree" + name, attribute));
+    }
+    EXPECT_EQ(Status(dir / "kept" + name).st_mode, Status(dir / "tree" + name).st_mode);
+    EXPECT_EQ(Attribute(dir / "plain" + name, "user.quarry"),
+              Attribute(dir / "kept" + name, "user.none"));
+  }
 }
 
 TEST(FileCopyTest, WithoutAskingNewFilesAreOrdinaryOnes) {
