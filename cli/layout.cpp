@@ -1,8 +1,11 @@
 #include "cli/layout.h"
 
 #include <sys/un.h>
+#include <unistd.h>
 
+#include <cerrno>
 #include <filesystem>
+#include <system_error>
 
 #include "cli/problem.h"
 #include "common/paths.h"
@@ -13,6 +16,12 @@ namespace {
 constexpr const char* kDirectories[] = {
     "/etc/quarry", "/tmp", "/var/run", "/var/log", "/var/lib/quarry", "/var/packages/Quarry/etc"};
 constexpr const char* kLongestSocket = "/var/run/tarncontentextractd.sock";
+
+[[noreturn]] void Refuse(const std::string& what) {
+  throw Problem(what +
+                ". Run as the user who owns the system, or as root; or set QUARRY_ROOT to a " +
+                "directory of your own.");
+}
 
 }  // namespace
 
@@ -36,9 +45,9 @@ void EnsureLayout() {
     std::error_code error;
     const std::string path = RootedPath(directory);
     std::filesystem::create_directories(path, error);
-    if (error) {
-      throw Problem("Cannot make the directory " + path + ": " + error.message() +
-                    ". Run as root, or set QUARRY_ROOT to a directory of your own.");
+    if (error) Refuse("Cannot make the directory " + path + ": " + error.message());
+    if (access(path.c_str(), W_OK | X_OK) != 0) {
+      Refuse("Cannot write in " + path + ": " + std::generic_category().message(errno));
     }
   }
 }

@@ -2,6 +2,9 @@
 
 #include <algorithm>
 
+#include "cli/state_check.h"
+#include "common/file_util.h"
+
 namespace quarry::cli {
 namespace {
 
@@ -13,12 +16,11 @@ struct Explanation {
 // What each code means to somebody who only sees the command line.
 constexpr Explanation kExplanations[] = {
     {kErrorBadParameter, "The request was not understood; check its arguments"},
-    {kErrorShareEnum, "The list of shares cannot be read; look at etc/quarry/shares.json"},
+    {kErrorShareEnum, "The list of shares cannot be read; see the system log"},
     {kErrorSystem,
-     "A call to the system or to the index daemon failed; see that \"quarry run\" is "
-     "running, then try again"},
+     "A call to the system or to a daemon failed; \"quarry doctor\" finds out what is wrong"},
     {kErrorCredentials, "The right to act as another user is missing; run as root"},
-    {kErrorLoadFile, "A state file is damaged; restore it from a backup or move it away"},
+    {kErrorLoadFile, "A state file is damaged; mend it with \"quarry doctor\""},
     {kErrorSaveFile, "A state file cannot be written; check free space and permissions"},
     {kErrorLock, "Another process holds the lock; try again when it is done"},
     {kErrorShareNotFound, "There is no such share; \"quarry share list\" names those there are"},
@@ -30,9 +32,9 @@ constexpr Explanation kExplanations[] = {
      "No such folder is indexed; \"quarry folder list\" names those there are"},
     {kErrorPathNotIndexable,
      "The place cannot be indexed; it must be an existing directory on a local disk, in a share "
-     "that "
-     "is neither encrypted nor read-only, named without symbolic links"},
-    {kErrorMalformedEvent, "The share's queue holds a line that cannot be read"},
+     "that is neither encrypted nor read-only, named without symbolic links"},
+    {kErrorMalformedEvent,
+     "The share's queue holds a line that cannot be read; mend it with \"quarry doctor\""},
     {kErrorEngineRequest,
      "The search engine (tarnelasticd) did not answer; start it with \"quarry run\""},
     {kErrorParseDocument,
@@ -43,19 +45,50 @@ constexpr Explanation kExplanations[] = {
     {kErrorEngineBusyMemory, "The search engine is busy; try again in a while"},
 };
 
-}  // namespace
+// The library's words for state that is damaged or missing are the same as for a wrong argument.
+std::string CauseInState(const Error& error) {
+  switch (error.code()) {
+    case kErrorBadParameter:
+    case kErrorShareEnum:
+    case kErrorSystem:
+    case kErrorLoadFile:
+      return UnreadableState();
+    case kErrorShareNotFound: {
+      const std::string unreadable = UnreadableState();
+      const std::vector<std::string> vanished = VanishedShares();
+      if (!unreadable.empty() || vanished.empty()) return unreadable;
+      return HowToRegain(vanished);
+    }
+    default:
+      return "";
+  }
+}
 
-std::string Explain(const Error& error) {
-  const int code = error.code();
+const char* Meaning(const Error& error) {
+  if (error.code() == kErrorLock && StringStartWith(error.reason(), "open failed")) {
+    return "A lock file cannot be used; run as the user who started the system, or as root";
+  }
   const auto* found = std::find_if(std::begin(kExplanations), std::end(kExplanations),
-                                   [&](const Explanation& e) { return e.code == code; });
+                                   [&](const Explanation& e) { return e.code == error.code(); });
+  return found == std::end(kExplanations) ? nullptr : found->text;
+}
+
+std::string General(const Error& error) {
+  const char* meaning = Meaning(error);
   std::string text = error.reason();
-  if (found != std::end(kExplanations)) {
-    text = std::string(found->text) + (text.empty() ? text : ": " + text);
+  if (meaning != nullptr) {
+    text = meaning + (text.empty() ? text : ": " + text);
   } else if (text.empty()) {
     text = "The request failed";  // the engine gives a reason with each code of its own
   }
-  return text + " (code " + std::to_string(code) + ")";
+  return text;
+}
+
+}  // namespace
+
+std::string Explain(const Error& error) {
+  const std::string cause = CauseInState(error);
+  return (cause.empty() ? General(error) : cause) + " (code " + std::to_string(error.code()) + ")";
 }
 
 }  // namespace quarry::cli

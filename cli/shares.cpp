@@ -1,6 +1,8 @@
 #include "cli/shares.h"
 
 #include "cli/problem.h"
+#include "cli/share_plan.h"
+#include "cli/state_check.h"
 #include "common/file_util.h"
 #include "common/sdk/share.h"
 #include "fileindex/config/folder_mgr.h"
@@ -8,6 +10,19 @@
 #include "platform/linux/share_registry.h"
 
 namespace quarry::cli {
+namespace {
+
+// What stands for a place in a share, but the share is none of those that can be used.
+[[noreturn]] void RefuseUnknownShare(const std::string& name, const std::string& argument) {
+  for (const platform::ShareRecord& share : platform::ReadShares()) {
+    if (share.name == name) RequireArrived(share);
+  }
+  if (fileindex::FolderMgr().IsShareIndexed(name)) throw Problem(HowToRegain({name}) + ".");
+  throw Problem("There is no share named \"" + name + "\", and no directory \"" + argument +
+                "\". \"quarry share list\" names the shares there are.");
+}
+
+}  // namespace
 
 void AddShare(const Place& place) {
   platform::ShareRecord record;
@@ -31,6 +46,7 @@ std::string SharePathOf(const std::string& argument) {
     for (const KnownShare& share : shares) {
       if (share.name == name) return argument;
     }
+    if (!IsDirExist(argument, true)) RefuseUnknownShare(name, argument);
   }
   const std::string directory = ResolveDirectory(argument);
   const Place place = PlanPlace(directory, shares);
@@ -42,6 +58,7 @@ std::string SharePathOf(const std::string& argument) {
 }
 
 std::vector<std::string> IndexedShares() {
+  platform::ReadShares();  // when it fails, no share would be found below
   std::vector<std::string> ids;
   for (const std::string& share : fileindex::FolderMgr().GetIndexedShares()) {
     try {
@@ -50,6 +67,8 @@ std::vector<std::string> IndexedShares() {
       continue;  // a share that has vanished is not searched, the others are
     }
   }
+  const std::vector<std::string> vanished = VanishedShares();
+  if (ids.empty() && !vanished.empty()) throw Problem(HowToRegain(vanished) + ".");
   return ids;
 }
 

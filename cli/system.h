@@ -25,6 +25,9 @@ Json::Value AskIndexDaemon(const std::string& command, const Json::Value& data);
 // root of its own.
 bool ServicesAreManaged();
 
+// Why nobody does, and what to do about it, in a sentence; "" when somebody does.
+std::string WhyNotManaged();
+
 // Throws Problem, naming what does not run, unless folders can be changed now.
 void RequireRunningSystem();
 

@@ -70,18 +70,29 @@ void Add(const Choice& choice, bool json) {
   Report("Indexing", folder, json);
 }
 
+// The library does not name what it has not found.
+Json::Value FolderAt(const std::string& argument) {
+  const std::string path = SharePathOf(argument);
+  Json::Value folder;
+  try {
+    fileindex::FolderGet(folder, path);
+  } catch (const Error& error) {
+    if (error.code() != kErrorFolderNotFound) throw;
+    throw Error(error.code(), path);
+  }
+  return folder;
+}
+
 void Set(const Choice& choice, bool json) {
   RequireRunningSystem();
-  Json::Value folder;
-  fileindex::FolderGet(folder, SharePathOf(choice.path));
+  Json::Value folder = FolderAt(choice.path);
   ApplyChoice(choice, folder);
   fileindex::FolderSet(ListOf(folder), false);
   Report("Changed", folder, json);
 }
 
 void Get(const std::string& path, bool json) {
-  Json::Value folder;
-  fileindex::FolderGet(folder, SharePathOf(path));
+  const Json::Value folder = FolderAt(path);
   if (json) {
     PrintJson(std::cout, folder);
     return;

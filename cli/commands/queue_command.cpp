@@ -1,8 +1,13 @@
+#include <unistd.h>
+
+#include <cerrno>
 #include <iostream>
 #include <memory>
 
 #include "cli/commands/commands.h"
 #include "cli/output.h"
+#include "cli/problem.h"
+#include "cli/share_plan.h"
 #include "common/file_util.h"
 #include "common/sdk/share.h"
 #include "fileindex/queue/queue_mgr.h"
@@ -42,6 +47,13 @@ Json::Value Describe(const fileindex::OP& operation, bool in_work) {
   return entry;
 }
 
+// A queue in a directory that may not be searched would look as if it was not there.
+void RequireReadable(const std::string& directory) {
+  if (access(directory.c_str(), X_OK) == 0 || errno == ENOENT) return;
+  throw Problem("You may not read what waits in " + directory +
+                ". Run as the user who started the system, or as root.");
+}
+
 // The operations of the snapshot that the index daemon works on, and then those of the live queue.
 Json::Value Operations(const std::string& queue_path) {
   Json::Value list(Json::arrayValue);
@@ -49,6 +61,7 @@ Json::Value Operations(const std::string& queue_path) {
   const auto take = [&](const std::shared_ptr<fileindex::OP>& operation) {
     list.append(Describe(*operation, in_work));
   };
+  RequireReadable(Dirname(queue_path));
   const fileindex::QueueMgr queue(queue_path);
   if (IsFileExist(queue_path + ".tmp")) queue.GetOPTreeTmp()->ProcessOP(take);
   in_work = false;
@@ -57,6 +70,7 @@ Json::Value Operations(const std::string& queue_path) {
 }
 
 void Show(const std::string& share, bool json) {
+  RequireArrived(RequireShare(platform::ReadShares(), share));
   const Json::Value list = Operations(sdk::SDKShare(share).GetQueuePath());
   if (json) {
     PrintJson(std::cout, list);

@@ -50,7 +50,7 @@ void PrintPause(std::int64_t resume_time) {
 
 void PrintServices(const Json::Value& status) {
   if (!status["running"].asBool()) {
-    std::cout << "The system is not running. Start it with: quarry run\n";
+    std::cout << WhyNotManaged() << '\n';
   }
   for (const Json::Value& service : status["services"]) {
     if (service["state"] != "restarting" && service["restarts"].asUInt() == 0) continue;

@@ -31,7 +31,7 @@ struct ShareRecord {
   std::string moved_from;
 };
 
-// All shares, in the order of the file. Throws quarry::Error 502 when the file cannot be read, is
+// All shares, in the order of the file. Throws quarry::Error 504 when the file cannot be read, is
 // no such document, or holds a share that ValidateShare refuses.
 QUARRY_EXPORT std::vector<ShareRecord> ReadShares();
 

@@ -23,7 +23,7 @@ namespace {
 constexpr std::size_t kMaxFileBytes = std::size_t{16} << 20;
 
 [[noreturn]] void Bad(const std::string& what) {
-  throw Error(kErrorSystem, "The share file " + ShareFilePath() + " " + what);
+  throw Error(kErrorLoadFile, "The share file " + ShareFilePath() + " " + what);
 }
 
 std::string TextOf(const Json::Value& share, const char* key) {

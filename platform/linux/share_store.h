@@ -27,7 +27,7 @@ bool IsShown(const ShareRecord& share);
 // The deepest share that holds the absolute path, or null.
 const ShareRecord* ShareHolding(const std::vector<ShareRecord>& shares, const std::string& path);
 
-// The shares in the text of a share file. Throws quarry::Error 502.
+// The shares in the text of a share file. Throws quarry::Error 504.
 std::vector<ShareRecord> ParseShares(const std::string& text);
 
 }  // namespace quarry::platform

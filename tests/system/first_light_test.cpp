@@ -113,7 +113,8 @@ TEST_F(FirstLightTest, ReadsOnlyTheKindsThatAreWanted) {
 TEST_F(FirstLightTest, RefusesBeforeAnythingIsChanged) {
   const Ran idle = system_.Quarry({"folder", "add", "/docs"});
   EXPECT_EQ(idle.end, "exit code 1");
-  EXPECT_NE(idle.output.find("The supervisor is not running."), std::string::npos) << idle.output;
+  EXPECT_NE(idle.output.find("The supervisor (quarry run) is not running."), std::string::npos)
+      << idle.output;
 
   system_.Start();
   EXPECT_EQ(system_.Quarry({"share", "add", "/"}).end, "exit code 1");

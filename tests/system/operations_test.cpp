@@ -105,7 +105,7 @@ TEST_F(OperationsTest, ReindexRefusesPlacesOutsideOfFolders) {
   Run({"folder", "add", "/docs/a"});
   EXPECT_TRUE(Refuses({"folder", "reindex", "/docs/b"}, "lies in no indexed folder"));
   Run({"folder", "reindex", "/docs"});
-  EXPECT_TRUE(Refuses({"folder", "reindex", "/nowhere/x"}, "Cannot open \"/nowhere/x\""));
+  EXPECT_TRUE(Refuses({"folder", "reindex", "/nowhere/x"}, "no share named \"nowhere\""));
 }
 
 TEST_F(OperationsTest, DeletedFoldersAreNotFoundAnyLonger) {
@@ -197,7 +197,7 @@ TEST_F(OperationsTest, KilledAnywhereAndRunAgain) {
 TEST_F(OperationsTest, AShareThatHasVanishedIsClearedByItsPath) {
   IndexDocs();
   WriteFile(TestRoot() + "/etc/quarry/shares.json", R"({"shares":[]})");
-  EXPECT_TRUE(StatusSays("There is no such share")) << Status();
+  EXPECT_TRUE(StatusSays("is not known any more")) << Status();
   EXPECT_TRUE(Refuses({"share", "clear", "docs"}, "Say where it lived"));
   Run({"share", "clear", "docs", docs_});
   EXPECT_EQ(Count("index"), 0U);

@@ -177,7 +177,7 @@ TEST_F(ShareRegistryTest, ABadFileIsAnErrorAndIsNotReplaced) {
   share.path = volume_ / "new";
   for (const auto& [text, what] : cases) {
     WriteShareFile(text);
-    const std::string error = "502 The share file " + ShareFilePath() + " " + what;
+    const std::string error = "504 The share file " + ShareFilePath() + " " + what;
     EXPECT_EQ(ErrorOf([] { ReadShares(); }), error) << text;
     EXPECT_EQ(ErrorOf([&] { AddShare(share); }), error) << text;
     EXPECT_EQ(ErrorOf([] { RemoveShare("photo"); }), error) << text;
@@ -188,7 +188,7 @@ TEST_F(ShareRegistryTest, ABadFileIsAnErrorAndIsNotReplaced) {
 TEST_F(ShareRegistryTest, AFileOfAnotherKindIsAnError) {
   test::MakeDirs(ShareFilePath());
   EXPECT_EQ(ErrorOf([] { ReadShares(); }),
-            "502 The share file " + ShareFilePath() + " cannot be read: Invalid argument");
+            "504 The share file " + ShareFilePath() + " cannot be read: Invalid argument");
 }
 
 TEST_F(ShareRegistryTest, SeesEveryReplacementOfTheFile) {
