@@ -30,9 +30,13 @@ std::string Format(const char* format, double value) {
 
 std::string Printable(const std::string& text) {
   std::string result;
+  unsigned char before = 0;
   for (const char c : text) {
     const auto byte = static_cast<unsigned char>(c);
-    if (byte >= 0x20 && byte != 0x7F) {
+    // The second byte of the controls U+0080 to U+009F; escaped, it leaves the first without one.
+    const bool upper_control = before == 0xC2 && byte >= 0x80 && byte < 0xA0;
+    before = byte;
+    if (byte >= 0x20 && byte != 0x7F && !upper_control) {
       result += c;
       continue;
     }
@@ -63,6 +67,7 @@ void PrintJson(std::ostream& out, const Json::Value& value) {
   Json::StreamWriterBuilder builder;
   builder["indentation"] = "  ";
   builder["emitUTF8"] = true;
+  builder["precision"] = 15;  // 0.1 is to be 0.1
   out << Json::writeString(builder, value) << '\n';
 }
 

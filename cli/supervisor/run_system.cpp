@@ -4,6 +4,7 @@
 
 #include <optional>
 
+#include "cli/doctor/checks.h"
 #include "cli/layout.h"
 #include "cli/problem.h"
 #include "cli/supervisor/supervisor.h"
@@ -48,6 +49,7 @@ void RunSystem(bool full_speed) {
   EnsureLayout();
   daemon::OpenLog("quarry", true);
   const daemon::SingleInstance instance("quarry");
+  Examination(true).Part("what is left of dead processes", CheckLeftovers);
   daemon::StopSignal stop;
   Supervisor supervisor(Services(full_speed));
   daemon::SocketServer server(

@@ -10,6 +10,9 @@ namespace {
 
 TEST(PrintableTest, EscapesWhatSteersATerminal) {
   EXPECT_EQ(Printable("a\033[2Jb\n\x7f"), "a\\x1b[2Jb\\x0a\\x7f");
+  EXPECT_EQ(Printable("a\xc2\x9b"
+                      "2J\xc2\xa0"),
+            "a\xc2\\x9b2J\xc2\xa0");
   EXPECT_EQ(Printable("gr\xc3\xbc\xc3\x9f\xff"), "gr\xc3\xbc\xc3\x9f\xff");
 }
 
@@ -23,6 +26,15 @@ TEST(PrintTableTest, PrintsNothingForNoRows) {
   std::ostringstream out;
   PrintTable(out, {});
   EXPECT_EQ(out.str(), "");
+}
+
+TEST(PrintJsonTest, WritesNumbersAsTheyWereMeant) {
+  std::ostringstream out;
+  Json::Value value(Json::arrayValue);
+  value.append(0.9);
+  value.append(1.4);
+  PrintJson(out, value);
+  EXPECT_EQ(out.str().find("0000"), std::string::npos) << out.str();
 }
 
 TEST(PrintJsonTest, KeepsBytesAndEndsTheLine) {

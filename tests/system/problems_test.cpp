@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include <chrono>
 #include <csignal>
 #include <filesystem>
 
@@ -62,6 +63,20 @@ TEST_F(ProblemsTest, DoesNotTakeADamagedListOfSharesForNone) {
   EXPECT_EQ(Refusal({"search", "capybara"}), cause + " (code 504)\n");
   EXPECT_EQ(Refusal({"share", "list"}), cause + " (code 121)\n");
   EXPECT_EQ(Refusal({"queue", "show", "docs"}), cause + " (code 504)\n");
+}
+
+TEST_F(ProblemsTest, AStartRemovesWhatKilledWritersHaveLeft) {
+  system_.Kill();
+  const std::string directory = TestRoot() + "/var/packages/Quarry/etc/";
+  const std::string old_draft = directory + ".quarry-1-2.tmp";
+  const std::string new_draft = directory + ".quarry-3-4.tmp";
+  for (const std::string& draft : {old_draft, new_draft}) WriteFile(draft, "[");
+  std::filesystem::last_write_time(
+      old_draft, std::filesystem::file_time_type::clock::now() - std::chrono::hours(1));
+  system_.Start();
+  EXPECT_FALSE(std::filesystem::exists(old_draft));
+  EXPECT_TRUE(std::filesystem::exists(new_draft));
+  EXPECT_EQ(system_.QuarryJson({"folder", "list"})["total"].asInt(), 1);
 }
 
 TEST_F(ProblemsTest, NamesTheFolderThatIsNotIndexed) {
