@@ -67,7 +67,7 @@ Json::Value FolderStatus(const fileindex::Folder& folder, const Json::Value& rep
   return status;
 }
 
-Json::Value SetAside(const Json::Value& report) {
+Json::Value WorkSetAside(const Json::Value& report) {
   Json::Value list(Json::arrayValue);
   for (const Json::Value& share : report["shares"]) {
     for (Json::Value work : share["set_aside"]) {

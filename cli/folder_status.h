@@ -20,7 +20,7 @@ Json::Value IndexDaemonReport();
 Json::Value FolderStatus(const fileindex::Folder& folder, const Json::Value& report);
 
 // What the daemon has given up for now: {"share", "path", "error"} each.
-Json::Value SetAside(const Json::Value& report);
+Json::Value WorkSetAside(const Json::Value& report);
 
 // {"share", "problem"} of each index that the engine cannot use. None while it does not answer.
 Json::Value UnusableIndexes();

@@ -35,7 +35,7 @@ Json::Value Collect() {
   status["services"] = Services();
   const Json::Value report = IndexDaemonReport();
   status["folders"] = Folders(report);
-  status["set_aside"] = SetAside(report);
+  status["set_aside"] = WorkSetAside(report);
   status["unusable_indexes"] = UnusableIndexes();
   return status;
 }
