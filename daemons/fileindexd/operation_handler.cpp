@@ -91,7 +91,9 @@ void OperationHandler::MoveRenamed(const std::string& new_path, const std::strin
   const bool aside = old_path.empty() || tools_.survey.rules()->TouchesPaused(old_path) ||
                      tools_.survey.rules()->TouchesPaused(new_path);
   if (!aside && !PathsMeet(new_path, old_path)) {
-    for (const auto& [to, from] : RenameRoots(new_path, old_path)) {
+    for (const auto& roots : RenameRoots(new_path, old_path)) {
+      const std::string& to = roots.first;
+      const std::string& from = roots.second;
       tools_.aside.Try(from + " -> " + to, [&] { MoveDocuments(to, from); });
     }
   }
