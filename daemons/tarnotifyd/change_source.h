@@ -15,6 +15,8 @@ namespace quarry::notify {
 struct Change {
   std::uint32_t kind = 0;
   bool is_dir = false;
+  // Of EVENT_MODIFY: the writer has not closed the file, so more is likely to come.
+  bool in_progress = false;
   std::string path;      // full path, any bytes
   std::string path_old;  // of a rename
 };
@@ -39,9 +41,9 @@ class ChangeSource {
   virtual int Descriptor() const = 0;
 
   // Watches these directories, whole, in place of the earlier ones: full paths without a "/" at the
-  // end. `ignore` names are not watched at any depth. A directory that cannot be watched (yet) is
-  // told to the sink as doubtful once it is watched; one that was watched before stays so without
-  // a gap.
+  // end, some perhaps below others. `ignore` names need not be watched at any depth. Every directory
+  // that was not among the earlier ones is told to the sink as doubtful once it is watched, now or
+  // by a later Read() or Refresh(); one that was stays watched without a gap.
   virtual void SetDirectories(const std::vector<std::string>& directories,
                               const std::vector<std::string>& ignore, ChangeSink& sink) = 0;
 
