@@ -1,0 +1,165 @@
+#include "daemons/tarnotifyd/directory_handle.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <climits>
+#include <cstddef>
+#include <cstdint>
+#include <cstring>
+#include <memory>
+#include <utility>
+
+namespace quarry::notify {
+namespace {
+
+using Answer = DirectoryLookup::Answer;
+
+constexpr int kOpenFlags = O_PATH | O_DIRECTORY | O_CLOEXEC;
+constexpr std::size_t kTypeSize = sizeof(std::int32_t);
+// Several renames in a row may each come between two looks. Their events are still to be read.
+constexpr int kAttempts = 4;
+
+// A handle with room for the largest one.
+struct HandleBuffer {
+  HandleBuffer() : bytes(sizeof(file_handle) + MAX_HANDLE_SZ) {
+    get()->handle_bytes = MAX_HANDLE_SZ;
+  }
+  file_handle* get() { return reinterpret_cast<file_handle*>(bytes.data()); }
+  std::vector<char> bytes;
+};
+
+UniqueFd OpenHandle(int mount, std::string_view handle) {
+  HandleBuffer buffer;
+  if (handle.size() < kTypeSize || handle.size() - kTypeSize > MAX_HANDLE_SZ) {
+    errno = ESTALE;
+    return UniqueFd();
+  }
+  file_handle* raw = buffer.get();
+  std::memcpy(&raw->handle_type, handle.data(), kTypeSize);
+  raw->handle_bytes = static_cast<unsigned int>(handle.size() - kTypeSize);
+  std::memcpy(raw->f_handle, handle.data() + kTypeSize, raw->handle_bytes);
+  return UniqueFd(open_by_handle_at(mount, raw, kOpenFlags));
+}
+
+bool IsSame(const struct stat& one, const struct stat& other) {
+  return one.st_dev == other.st_dev && one.st_ino == other.st_ino;
+}
+
+// The last name of the path that the kernel has for `fd`; empty when there is none.
+std::string LastNameOf(int fd) {
+  char path[PATH_MAX];
+  const std::string link = "/proc/self/fd/" + std::to_string(fd);
+  const ssize_t length = readlink(link.c_str(), path, sizeof(path));
+  if (length <= 0) return std::string();
+  const std::string_view whole(path, static_cast<std::size_t>(length));
+  return std::string(whole.substr(whole.rfind('/') + 1));
+}
+
+// The entry of `parent` with this inode; empty when there is none. For a path that is too long for
+// the kernel to tell, and for what another mount covers.
+std::string SearchName(int parent, ino_t inode) {
+  UniqueFd fd(openat(parent, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (!fd.valid()) return std::string();
+  const std::unique_ptr<DIR, int (*)(DIR*)> entries(fdopendir(fd.get()), closedir);
+  if (entries == nullptr) return std::string();
+  fd.Release();
+  while (const dirent* entry = readdir(entries.get())) {
+    const std::string name = entry->d_name;
+    if (entry->d_ino == inode && name != "." && name != "..") return name;
+  }
+  return std::string();
+}
+
+std::string NameIn(int parent, int fd, const struct stat& status) {
+  std::string name = LastNameOf(fd);
+  struct stat named {};
+  if (!name.empty() && fstatat(parent, name.c_str(), &named, AT_SYMLINK_NOFOLLOW) == 0 &&
+      IsSame(named, status)) {
+    return name;
+  }
+  return status.st_nlink == 0 ? std::string() : SearchName(parent, status.st_ino);
+}
+
+bool IsOutOfResources(int error) {
+  return error == EMFILE || error == ENFILE || error == ENOMEM || error == EPERM ||
+         error == EACCES || error == EIO;
+}
+
+// kGone when nothing could be made of it, kFound with an empty parent when the mount ends here.
+Answer PlaceOf(int fd, DirectoryPlace* place) {
+  const std::optional<DirectoryIdentity> own = IdentifyDirectory(fd);
+  struct stat status {};
+  if (!own || fstat(fd, &status) != 0)
+    return IsOutOfResources(errno) ? Answer::kFailed : Answer::kGone;
+  const UniqueFd parent(openat(fd, "..", kOpenFlags));
+  *place = DirectoryPlace{};
+  // A directory that a mount does not show has no parent there.
+  if (!parent.valid()) return IsOutOfResources(errno) ? Answer::kFailed : Answer::kFound;
+  std::optional<DirectoryIdentity> above = IdentifyDirectory(parent.get());
+  if (!above || above->mount != own->mount || above->handle == own->handle) return Answer::kFound;
+  place->name = NameIn(parent.get(), fd, status);
+  if (place->name.empty()) return Answer::kGone;
+  place->parent = std::move(above->handle);
+  return Answer::kFound;
+}
+
+Answer FindThrough(int mount, std::string_view handle, DirectoryPlace* place) {
+  Answer answer = Answer::kGone;
+  for (int attempt = 0; attempt < kAttempts && answer == Answer::kGone; ++attempt) {
+    const UniqueFd fd = OpenHandle(mount, handle);
+    if (!fd.valid()) return IsOutOfResources(errno) ? Answer::kFailed : Answer::kGone;
+    answer = PlaceOf(fd.get(), place);
+  }
+  return answer;
+}
+
+}  // namespace
+
+std::optional<DirectoryIdentity> IdentifyDirectory(int fd) {
+  HandleBuffer buffer;
+  DirectoryIdentity identity;
+  if (name_to_handle_at(fd, "", buffer.get(), &identity.mount, AT_EMPTY_PATH) != 0) {
+    return std::nullopt;
+  }
+  const file_handle* raw = buffer.get();
+  identity.handle.assign(reinterpret_cast<const char*>(&raw->handle_type), kTypeSize);
+  identity.handle.append(reinterpret_cast<const char*>(raw->f_handle), raw->handle_bytes);
+  return identity;
+}
+
+void MountedDirectories::AddEntrance(const std::string& path) {
+  entrances_.push_back(path);
+}
+
+void MountedDirectories::RemoveEntrance(const std::string& path) {
+  const auto found = std::find(entrances_.begin(), entrances_.end(), path);
+  if (found != entrances_.end()) entrances_.erase(found);
+  open_.erase(path);
+}
+
+int MountedDirectories::OpenEntrance(const std::string& path) {
+  const auto known = open_.find(path);
+  if (known != open_.end()) return known->second.get();
+  UniqueFd fd(open(path.c_str(), kOpenFlags));
+  struct stat status {};
+  if (!fd.valid() || fstat(fd.get(), &status) != 0 || status.st_dev != device_) fd.Reset();
+  return open_.emplace(path, std::move(fd)).first->second.get();
+}
+
+DirectoryLookup::Answer MountedDirectories::Find(std::string_view handle, DirectoryPlace* place) {
+  Answer best = Answer::kGone;
+  for (const std::string& entrance : entrances_) {
+    const int mount = OpenEntrance(entrance);
+    if (mount < 0) continue;
+    const Answer answer = FindThrough(mount, handle, place);
+    if (answer == Answer::kFound && !place->parent.empty()) return answer;
+    if (answer != Answer::kGone) best = answer;
+  }
+  return best;
+}
+
+}  // namespace quarry::notify

@@ -1,0 +1,63 @@
+// From the kernel's events of one file system to changes below watched directories.
+
+#ifndef QUARRY_DAEMONS_TARNOTIFYD_EVENT_TRANSLATOR_H_
+#define QUARRY_DAEMONS_TARNOTIFYD_EVENT_TRANSLATOR_H_
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "daemons/tarnotifyd/change_source.h"
+#include "daemons/tarnotifyd/directory_tree.h"
+#include "daemons/tarnotifyd/fanotify_event.h"
+
+namespace quarry::notify {
+
+// The kernel folds what happened to one entry into one event, in the place of the first; even a
+// rename that is undone and done again is told only twice. So an event names places to look at, and
+// a rename both of its places. One thread.
+class EventTranslator {
+ public:
+  // `tree` must outlive the translator.
+  explicit EventTranslator(DirectoryTree& tree) : tree_(tree) {}
+
+  // Tells what a buffer of events means. Bytes that are no events put every watched directory of
+  // the tree in doubt, as does a queue that was full.
+  void Translate(std::string_view events, ChangeSink& sink);
+
+  // To be called when there are no more events for now: a kernel that does not know renames tells
+  // of two halves, and the second one may be missing.
+  void Finish(ChangeSink& sink);
+
+ private:
+  // The first half of a move, until the second is seen.
+  struct Departure {
+    std::string directory;
+    std::string name;
+    std::int32_t process = 0;
+    bool is_dir = false;
+  };
+  struct Move {
+    FanotifyEntry from;
+    FanotifyEntry to;
+    std::string_view target;
+    bool is_dir = false;
+  };
+
+  void Translate(const FanotifyEvent& event, ChangeSink& sink);
+  bool TakeMove(const FanotifyEvent& event, ChangeSink& sink);
+  void TellMove(const Move& move, ChangeSink& sink);
+  void TellEntry(const FanotifyEvent& event, ChangeSink& sink);
+  void NoteDirectory(const FanotifyEvent& event);
+  std::vector<std::string> PathsOf(const FanotifyEntry& entry, ChangeSink& sink);
+  void DoubtAll(ChangeSink& sink);
+
+  DirectoryTree& tree_;
+  std::optional<Departure> departure_;
+};
+
+}  // namespace quarry::notify
+
+#endif  // QUARRY_DAEMONS_TARNOTIFYD_EVENT_TRANSLATOR_H_
