@@ -32,7 +32,7 @@ struct HandleBuffer {
   std::vector<char> bytes;
 };
 
-UniqueFd OpenHandle(int mount, std::string_view handle) {
+UniqueFd OpenHandle(int mount, std::string_view handle, int flags) {
   HandleBuffer buffer;
   if (handle.size() < kTypeSize || handle.size() - kTypeSize > MAX_HANDLE_SZ) {
     errno = ESTALE;
@@ -42,21 +42,25 @@ UniqueFd OpenHandle(int mount, std::string_view handle) {
   std::memcpy(&raw->handle_type, handle.data(), kTypeSize);
   raw->handle_bytes = static_cast<unsigned int>(handle.size() - kTypeSize);
   std::memcpy(raw->f_handle, handle.data() + kTypeSize, raw->handle_bytes);
-  return UniqueFd(open_by_handle_at(mount, raw, kOpenFlags));
+  return UniqueFd(open_by_handle_at(mount, raw, flags));
 }
 
 bool IsSame(const struct stat& one, const struct stat& other) {
   return one.st_dev == other.st_dev && one.st_ino == other.st_ino;
 }
 
-// The last name of the path that the kernel has for `fd`; empty when there is none.
-std::string LastNameOf(int fd) {
+// The path that the kernel has for `fd`; empty when there is none, or one that is too long to tell.
+std::string PathOf(int fd) {
   char path[PATH_MAX];
   const std::string link = "/proc/self/fd/" + std::to_string(fd);
   const ssize_t length = readlink(link.c_str(), path, sizeof(path));
-  if (length <= 0) return std::string();
-  const std::string_view whole(path, static_cast<std::size_t>(length));
-  return std::string(whole.substr(whole.rfind('/') + 1));
+  return length > 0 ? std::string(path, static_cast<std::size_t>(length)) : std::string();
+}
+
+bool IsEntry(int directory, const std::string& name, const struct stat& status) {
+  struct stat named {};
+  return !name.empty() && fstatat(directory, name.c_str(), &named, AT_SYMLINK_NOFOLLOW) == 0 &&
+         IsSame(named, status);
 }
 
 // The entry of `parent` with this inode; empty when there is none. For a path that is too long for
@@ -75,12 +79,9 @@ std::string SearchName(int parent, ino_t inode) {
 }
 
 std::string NameIn(int parent, int fd, const struct stat& status) {
-  std::string name = LastNameOf(fd);
-  struct stat named {};
-  if (!name.empty() && fstatat(parent, name.c_str(), &named, AT_SYMLINK_NOFOLLOW) == 0 &&
-      IsSame(named, status)) {
-    return name;
-  }
+  std::string name = PathOf(fd);
+  name.erase(0, name.rfind('/') + 1);
+  if (IsEntry(parent, name, status)) return name;
   return status.st_nlink == 0 ? std::string() : SearchName(parent, status.st_ino);
 }
 
@@ -110,11 +111,27 @@ Answer PlaceOf(int fd, DirectoryPlace* place) {
 Answer FindThrough(int mount, std::string_view handle, DirectoryPlace* place) {
   Answer answer = Answer::kGone;
   for (int attempt = 0; attempt < kAttempts && answer == Answer::kGone; ++attempt) {
-    const UniqueFd fd = OpenHandle(mount, handle);
+    const UniqueFd fd = OpenHandle(mount, handle, kOpenFlags);
     if (!fd.valid()) return IsOutOfResources(errno) ? Answer::kFailed : Answer::kGone;
     answer = PlaceOf(fd.get(), place);
   }
   return answer;
+}
+
+Answer PlaceOfFile(int fd, DirectoryPlace* place) {
+  struct stat status {};
+  if (fstat(fd, &status) != 0) return Answer::kFailed;
+  if (status.st_nlink == 0) return Answer::kGone;
+  const std::string path = PathOf(fd);
+  const std::size_t slash = path.rfind('/');
+  if (slash == std::string::npos) return Answer::kFailed;
+  place->name = path.substr(slash + 1);
+  const UniqueFd parent(open(path.substr(0, slash + 1).c_str(), kOpenFlags));
+  if (!parent.valid() || !IsEntry(parent.get(), place->name, status)) return Answer::kFailed;
+  std::optional<DirectoryIdentity> above = IdentifyDirectory(parent.get());
+  if (!above) return Answer::kFailed;
+  place->parent = std::move(above->handle);
+  return Answer::kFound;
 }
 
 }  // namespace
@@ -160,6 +177,20 @@ DirectoryLookup::Answer MountedDirectories::Find(std::string_view handle, Direct
     if (answer != Answer::kGone) best = answer;
   }
   return best;
+}
+
+DirectoryLookup::Answer MountedDirectories::FindFile(std::string_view handle,
+                                                     DirectoryPlace* place) {
+  Answer answer = Answer::kGone;
+  for (const std::string& entrance : entrances_) {
+    const int mount = OpenEntrance(entrance);
+    if (mount < 0) continue;
+    const UniqueFd fd = OpenHandle(mount, handle, O_PATH | O_NOFOLLOW | O_CLOEXEC);
+    if (!fd.valid() && errno == ESTALE) continue;
+    answer = fd.valid() ? PlaceOfFile(fd.get(), place) : Answer::kFailed;
+    if (answer != Answer::kFailed) return answer;
+  }
+  return answer;
 }
 
 }  // namespace quarry::notify

@@ -39,6 +39,7 @@ class MountedDirectories : public DirectoryLookup {
   void RemoveEntrance(const std::string& path);
 
   Answer Find(std::string_view handle, DirectoryPlace* place) override;
+  Answer FindFile(std::string_view handle, DirectoryPlace* place) override;
 
   // To be called after a number of Find()s: nobody can unmount what is kept open.
   void Release() { open_.clear(); }

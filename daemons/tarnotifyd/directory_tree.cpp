@@ -60,6 +60,14 @@ bool DirectoryTree::PathsOf(std::string_view directory, std::string_view name,
   return false;
 }
 
+bool DirectoryTree::PathsOfFile(std::string_view file, std::vector<std::string>* paths) {
+  paths->clear();
+  DirectoryPlace place;
+  const DirectoryLookup::Answer answer = lookup_.FindFile(file, &place);
+  if (answer != DirectoryLookup::Answer::kFound) return answer == DirectoryLookup::Answer::kGone;
+  return PathsOf(place.parent, place.name, paths);
+}
+
 void DirectoryTree::AddPaths(const std::string& directory, const std::vector<std::string>& names,
                              std::vector<std::string>* paths) const {
   const auto root = roots_.find(directory);

@@ -48,6 +48,9 @@ class DirectoryLookup {
 
   virtual ~DirectoryLookup() = default;
   virtual Answer Find(std::string_view handle, DirectoryPlace* place) = 0;
+  // Of what is no directory: one of its places. Those that the kernel has not met since it came up
+  // are not known to it: kFailed.
+  virtual Answer FindFile(std::string_view handle, DirectoryPlace* place) = 0;
 };
 
 // The directories of one file system. One thread.
@@ -69,6 +72,9 @@ class DirectoryTree {
   // where it lies outside, is ignored or is gone. Returns false when some may be missing because a
   // directory could not be looked up.
   bool PathsOf(std::string_view directory, std::string_view name, std::vector<std::string>* paths);
+
+  // The same of any place of the file `file`, for which false is more likely.
+  bool PathsOfFile(std::string_view file, std::vector<std::string>* paths);
 
   // Takes note of events, in their order.
   void Placed(std::string_view directory, std::string_view parent, std::string_view name);

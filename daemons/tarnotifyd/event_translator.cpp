@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <cstddef>
+#include <utility>
 
 #include "fileindex/queue/event.h"
 
@@ -70,7 +71,7 @@ void EventTranslator::Translate(std::string_view events, ChangeSink& sink) {
 
 void EventTranslator::Translate(const FanotifyEvent& event, ChangeSink& sink) {
   if ((event.mask & FAN_Q_OVERFLOW) != 0) {
-    Finish(sink);
+    TellDeparture(sink);
     // A rename may be among what was lost.
     tree_.Forget();
     DoubtAll(sink);
@@ -92,7 +93,7 @@ bool EventTranslator::TakeMove(const FanotifyEvent& event, ChangeSink& sink) {
     TellMove({{from.directory, from.name}, event.entry, event.target, from.is_dir}, sink);
     return true;
   }
-  Finish(sink);
+  TellDeparture(sink);
   if (!IsOnly(event, FAN_MOVED_FROM)) return false;
   departure_ = Departure{std::string(event.entry.directory), std::string(event.entry.name),
                          event.process, IsDirectory(event)};
@@ -100,6 +101,11 @@ bool EventTranslator::TakeMove(const FanotifyEvent& event, ChangeSink& sink) {
 }
 
 void EventTranslator::Finish(ChangeSink& sink) {
+  TellDeparture(sink);
+  PlaceFiles(sink);
+}
+
+void EventTranslator::TellDeparture(ChangeSink& sink) {
   if (!departure_) return;
   const Departure from = *std::move(departure_);
   departure_.reset();
@@ -131,12 +137,45 @@ void EventTranslator::TellMove(const Move& move, ChangeSink& sink) {
 }
 
 void EventTranslator::TellEntry(const FanotifyEvent& event, ChangeSink& sink) {
-  // The last name of a file that is still open is gone: nobody finds it any more.
-  if (event.entry.directory.empty()) return;
+  if (event.entry.directory.empty()) return KeepUnplaced(event);
+  if ((event.mask & FAN_DELETE) != 0) ForgetLostName(event);
   if (IsDirectory(event)) NoteDirectory(event);
   for (const std::string& path : PathsOf(event.entry, sink)) {
     for (const Change& change : ChangesOf(event.mask, path)) sink.OnChange(change);
   }
+}
+
+// The event is about a file that was not reached through a directory, or not through one that still
+// has it.
+void EventTranslator::KeepUnplaced(const FanotifyEvent& event) {
+  if (event.target.empty() || (event.mask & (kWritten | FAN_ATTRIB)) == 0) return;
+  if (unplaced_.size() < kMaxUnplaced) {
+    unplaced_[std::string(event.target)] |= event.mask;
+  } else {
+    is_doubtful_ = true;
+  }
+}
+
+// The first event of a deletion says, of the file as such, that it has a name less. This is what
+// was meant.
+void EventTranslator::ForgetLostName(const FanotifyEvent& event) {
+  const auto file = unplaced_.find(std::string(event.target));
+  if (file != unplaced_.end() && (file->second & kWritten) == 0) unplaced_.erase(file);
+}
+
+void EventTranslator::PlaceFiles(ChangeSink& sink) {
+  std::vector<std::string> paths;
+  for (const auto& [file, mask] : std::exchange(unplaced_, {})) {
+    if (!tree_.PathsOfFile(file, &paths)) is_doubtful_ = true;
+    for (const std::string& path : paths) {
+      for (const Change& change : ChangesOf(mask, path)) sink.OnChange(change);
+    }
+  }
+  if (pause_ > 0) --pause_;
+  if (!is_doubtful_ || pause_ > 0) return;
+  is_doubtful_ = false;
+  pause_ = kDoubtPause;
+  DoubtAll(sink);
 }
 
 void EventTranslator::NoteDirectory(const FanotifyEvent& event) {

@@ -3,7 +3,9 @@
 #ifndef QUARRY_DAEMONS_TARNOTIFYD_EVENT_TRANSLATOR_H_
 #define QUARRY_DAEMONS_TARNOTIFYD_EVENT_TRANSLATOR_H_
 
+#include <cstddef>
 #include <cstdint>
+#include <map>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -27,9 +29,16 @@ class EventTranslator {
   // the tree in doubt, as does a queue that was full.
   void Translate(std::string_view events, ChangeSink& sink);
 
-  // To be called when there are no more events for now: a kernel that does not know renames tells
-  // of two halves, and the second one may be missing.
+  // Tells what waits for an event that may not come. To be called every second or so: a kernel that
+  // does not know renames tells of two halves, and what is written through a handle, as for a
+  // client of an NFS server, has no place.
   void Finish(ChangeSink& sink);
+
+  // How many calls of Finish() at least lie between two doubts because of files whose place could
+  // not be found: one may be written to for hours.
+  static constexpr int kDoubtPause = 30;
+  // Files without a place that are kept apart.
+  static constexpr std::size_t kMaxUnplaced = 1024;
 
  private:
   // The first half of a move, until the second is seen.
@@ -49,13 +58,20 @@ class EventTranslator {
   void Translate(const FanotifyEvent& event, ChangeSink& sink);
   bool TakeMove(const FanotifyEvent& event, ChangeSink& sink);
   void TellMove(const Move& move, ChangeSink& sink);
+  void TellDeparture(ChangeSink& sink);
   void TellEntry(const FanotifyEvent& event, ChangeSink& sink);
+  void KeepUnplaced(const FanotifyEvent& event);
+  void ForgetLostName(const FanotifyEvent& event);
+  void PlaceFiles(ChangeSink& sink);
   void NoteDirectory(const FanotifyEvent& event);
   std::vector<std::string> PathsOf(const FanotifyEntry& entry, ChangeSink& sink);
   void DoubtAll(ChangeSink& sink);
 
   DirectoryTree& tree_;
   std::optional<Departure> departure_;
+  std::map<std::string, std::uint64_t> unplaced_;  // handles of files, and what happened to them
+  bool is_doubtful_ = false;                       // there are files that have no place
+  int pause_ = 0;
 };
 
 }  // namespace quarry::notify

@@ -117,6 +117,11 @@ void MarkedFileSystem::RemoveRoot(const std::string& path) {
   tree_.RemoveRoot(path);
 }
 
+void MarkedFileSystem::Finish(ChangeSink& sink) {
+  translator_.Finish(sink);
+  directories_.Release();
+}
+
 void MarkedFileSystem::Read(ChangeSink& sink) {
   const ssize_t got = read(fd_.get(), buffer_.data(), buffer_.size());
   if (got > 0) {

@@ -53,8 +53,8 @@ class MarkedFileSystem {
 
   // Tells what a bounded number of events mean.
   void Read(ChangeSink& sink);
-  // Tells what waits for the second half of a move. To be called every now and then.
-  void Finish(ChangeSink& sink) { translator_.Finish(sink); }
+  // See EventTranslator::Finish().
+  void Finish(ChangeSink& sink);
 
  private:
   bool ShowsMark() const;
