@@ -90,7 +90,10 @@ void InotifySource::Read(ChangeSink& sink) {
 bool InotifySource::HandleEvents(ChangeSink& sink) {
   for (int i = 0; i < kEventsAtATime; ++i) {
     const auto event = events_.Next(Clock::now());
-    if (!event) return true;
+    if (!event) {
+      if (i > 0) watches_->LookForMissing();
+      return true;
+    }
     if ((event->mask & IN_Q_OVERFLOW) != 0) return false;
     Handle(*event, sink);
   }
@@ -111,8 +114,6 @@ void InotifySource::HandleSelf(Id directory, const InotifyEvent& event, ChangeSi
   const std::string path = watches_->tree().Path(directory);
   if ((event.mask & IN_IGNORED) != 0) {
     watches_->Lost(directory);
-    // Of a root FollowRoot() finds it.
-    if (!is_root) watches_->AddAgain(directory);
   } else if (is_root && (event.mask & IN_ATTRIB) != 0) {
     sink.OnChange({EVENT_ATTR, true, false, path, ""});
   } else if (is_root && (event.mask & (IN_DELETE_SELF | IN_MOVE_SELF)) != 0) {
@@ -141,11 +142,12 @@ void InotifySource::Appear(Id directory, const InotifyEvent& event, ChangeSink& 
 }
 
 void InotifySource::Vanish(Id directory, const InotifyEvent& event, ChangeSink& sink) {
-  if ((event.mask & IN_ISDIR) != 0) {
-    const Id child = watches_->tree().Child(directory, event.name);
-    if (child != WatchTree::kNone) watches_->Remove(child);
-  }
   sink.OnChange(MakeChange(EVENT_DELETE, event, PathOf(directory, event.name)));
+  if ((event.mask & IN_ISDIR) == 0) return;
+  const Id child = watches_->tree().Child(directory, event.name);
+  if (child != WatchTree::kNone) watches_->Remove(child);
+  // Of two directories that change places the one that comes is told first.
+  if ((event.mask & IN_MOVED_FROM) != 0) watches_->AddNew(directory, event.name, sink);
 }
 
 // A directory may have become one that can be read.
@@ -153,7 +155,7 @@ void InotifySource::ChangeAttributes(Id directory, const InotifyEvent& event, Ch
   sink.OnChange(MakeChange(EVENT_ATTR, event, PathOf(directory, event.name)));
   if ((event.mask & IN_ISDIR) == 0) return;
   const Id child = watches_->tree().Child(directory, event.name);
-  if (child != WatchTree::kNone && watches_->tree().Watch(child) < 0) watches_->AddAgain(child);
+  if (child != WatchTree::kNone && watches_->tree().Watch(child) < 0) watches_->Check(child, sink);
 }
 
 void InotifySource::HandleDeparture(Id directory, const InotifyEvent& event, ChangeSink& sink) {
@@ -181,7 +183,7 @@ void InotifySource::MoveDirectory(Id from, const std::string& old_name, Id to,
   const bool is_known = moved != WatchTree::kNone && tree.Watch(moved) >= 0;
   if (is_known && replaced == WatchTree::kNone && !tree.IsAtOrBelow(to, moved)) {
     tree.Move(moved, to, new_name);
-    return;
+    return watches_->Check(moved, sink);
   }
   // An empty directory was replaced, or two have changed places, or the disk was listed after the
   // move. Looking anew at both places settles it.

@@ -46,21 +46,27 @@ InotifyWatches::InotifyWatches(const std::unordered_set<std::string>& ignored)
 
 InotifyWatches::Id InotifyWatches::AddRoot(const std::string& path) {
   const Id root = tree_.AddRoot(path);
-  AddScan(root, NewJob(root, true));
+  AddScan(root, NewJob(root, Outcome::kDoubtIfWatched));
   return root;
 }
 
 void InotifyWatches::AddNew(Id parent, const std::string& name, ChangeSink& sink) {
-  if (tree_.Child(parent, name) != WatchTree::kNone) return;
+  const Id known = tree_.Child(parent, name);
+  if (known != WatchTree::kNone) return Check(known, sink);
   const Id directory = tree_.AddChild(parent, name);
-  AddScan(directory, NewJob(directory, false));
+  AddScan(directory, NewJob(directory, Outcome::kCreated));
   // At once: events of directories that have been renamed since are told by their right paths only
   // if what they are about is known.
   DoLastScan(sink);
 }
 
-void InotifyWatches::AddAgain(Id directory) {
-  AddScan(directory, NewJob(directory, false));
+void InotifyWatches::Check(Id directory, ChangeSink& sink) {
+  CheckLater(directory);
+  DoLastScan(sink);
+}
+
+void InotifyWatches::CheckLater(Id directory) {
+  AddScan(directory, NewJob(directory, Outcome::kCreatedIfWatched));
 }
 
 void InotifyWatches::Remove(Id directory) {
@@ -71,6 +77,8 @@ void InotifyWatches::Remove(Id directory) {
 
 void InotifyWatches::Lost(Id directory) {
   tree_.SetWatch(directory, -1);
+  // Of a root its owner finds it.
+  if (tree_.Parent(directory) != WatchTree::kNone) CheckLater(directory);
 }
 
 void InotifyWatches::Doom(const std::vector<int>& watches) {
@@ -91,10 +99,10 @@ void InotifyWatches::Work(ChangeSink& sink) {
   RemoveDoomed();
 }
 
-std::uint32_t InotifyWatches::NewJob(Id top, bool is_doubt) {
+std::uint32_t InotifyWatches::NewJob(Id top, Outcome outcome) {
   Job& job = jobs_[++last_job_];
   job.top = tree_.RefTo(top);
-  job.is_doubt = is_doubt;
+  job.outcome = outcome;
   return last_job_;
 }
 
@@ -129,6 +137,8 @@ void InotifyWatches::Watch(const Scan& scan, UniqueFd fd, ChangeSink& sink) {
   const int watch =
       inotify_add_watch(inotify_.get(), self.c_str(), kEvents | (is_root ? kRootEvents : 0U));
   if (watch < 0) return CannotWatch(scan, errno, sink);
+  // What is below it is known, or is just being listed.
+  if (watch == tree_.Watch(directory)) return;
   if (!TakeNumber(directory, watch, id)) return;
   jobs_[scan.job].any_watched = true;
   List(directory, std::move(fd), scan.job);
@@ -136,9 +146,27 @@ void InotifyWatches::Watch(const Scan& scan, UniqueFd fd, ChangeSink& sink) {
 
 // A directory that may not be read cannot be watched either, and nothing in it be indexed.
 void InotifyWatches::CannotOpen(const Scan& scan, int error, ChangeSink& sink) {
-  const Id directory = scan.directory.id;
   if (IsShortage(error)) return Starve(scan, error, sink);
-  if (IsGone(error) && tree_.Parent(directory) != WatchTree::kNone) Remove(directory);
+  if (IsGone(error)) Miss(scan);
+}
+
+// It was there when the one above it, which is watched, was listed, or told of. So there are events
+// still to come that tell of its end, or of another path.
+void InotifyWatches::Miss(const Scan& scan) {
+  missing_.push_back(scan.directory);
+  Job& job = jobs_[scan.job];
+  if (job.top.id == scan.directory.id && job.outcome == Outcome::kCreated) {
+    job.outcome = Outcome::kCreatedIfWatched;
+  }
+}
+
+void InotifyWatches::LookForMissing() {
+  for (const WatchTree::Ref& directory : std::exchange(missing_, {})) {
+    // Of a root its owner finds it.
+    if (tree_.IsAlive(directory) && tree_.Parent(directory.id) != WatchTree::kNone) {
+      CheckLater(directory.id);
+    }
+  }
 }
 
 void InotifyWatches::CannotWatch(const Scan& scan, int error, ChangeSink& sink) {
@@ -169,28 +197,35 @@ bool InotifyWatches::MayEnter(Id directory, const DirectoryId& id) const {
 // directory's alone.
 bool InotifyWatches::TakeNumber(Id directory, int watch, const DirectoryId& id) {
   const Id other = tree_.FindWatch(watch);
-  if (other != WatchTree::kNone && other != directory) {
-    const UniqueFd there = OpenDirectory(tree_.Path(other), false);
-    DirectoryId other_id;
+  if (other != WatchTree::kNone) {
     // Mounted at two places: the first one will do.
-    if (there.valid() && Identify(there.get(), &other_id) && other_id.device == id.device &&
-        other_id.inode == id.inode) {
-      return false;
-    }
+    if (IsStillAt(other, id)) return false;
     const WatchTree::Ref self = tree_.RefTo(directory);
-    std::vector<int> watches;
-    tree_.RemoveChildren(other, &watches);
-    tree_.SetWatch(other, -1);
-    Doom(watches);
-    if (tree_.Parent(other) != WatchTree::kNone) AddAgain(other);
+    Strip(other);
+    if (tree_.Parent(other) != WatchTree::kNone) CheckLater(other);
     // It was below the other one: then it will be found again with that.
     if (!tree_.IsAlive(self)) return false;
   }
+  Strip(directory);
   doomed_.erase(watch);
-  const int before = tree_.Watch(directory);
-  if (before >= 0 && before != watch) doomed_.insert(before);
   tree_.SetWatch(directory, watch);
   return true;
+}
+
+bool InotifyWatches::IsStillAt(Id directory, const DirectoryId& id) const {
+  const UniqueFd fd = OpenDirectory(tree_.Path(directory), false);
+  DirectoryId there;
+  return fd.valid() && Identify(fd.get(), &there) && there.device == id.device &&
+         there.inode == id.inode;
+}
+
+// What has the directory's path is another one than it was thought to be.
+void InotifyWatches::Strip(Id directory) {
+  std::vector<int> watches;
+  tree_.RemoveChildren(directory, &watches);
+  if (tree_.Watch(directory) >= 0) watches.push_back(tree_.Watch(directory));
+  tree_.SetWatch(directory, -1);
+  Doom(watches);
 }
 
 void InotifyWatches::List(Id directory, UniqueFd fd, std::uint32_t job) {
@@ -207,11 +242,9 @@ void InotifyWatches::EndScan(std::uint32_t job, ChangeSink& sink) {
   jobs_.erase(found);
   if (!tree_.IsAlive(done.top)) return;
   const std::string path = tree_.Path(done.top.id);
-  if (!done.is_doubt) {
-    sink.OnChange({fileindex::EVENT_CREATE, true, false, path, ""});
-  } else if (done.any_watched) {
-    sink.OnDoubt(path);
-  }
+  if (done.outcome != Outcome::kCreated && !done.any_watched) return;
+  if (done.outcome == Outcome::kDoubtIfWatched) return sink.OnDoubt(path);
+  sink.OnChange({fileindex::EVENT_CREATE, true, false, path, ""});
 }
 
 bool InotifyWatches::IsWaiting(Id directory) const {
@@ -253,7 +286,7 @@ void InotifyWatches::Retry(Clock::time_point now, ChangeSink& sink) {
     if (!tree_.IsAlive(directory)) continue;
     const Id root = tree_.RootOf(directory.id);
     const auto [job, is_new] = job_of_root.try_emplace(root, 0);
-    if (is_new) job->second = NewJob(root, true);
+    if (is_new) job->second = NewJob(root, Outcome::kDoubtIfWatched);
     AddScan(directory.id, job->second);
   }
 }

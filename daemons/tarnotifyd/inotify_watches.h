@@ -46,14 +46,19 @@ class InotifyWatches {
   // could be watched.
   Id AddRoot(const std::string& path);
   // The same for a directory that has appeared below another one; it is told as created when that
-  // is done, also when it cannot be watched. One that is known already has been told, or will be.
+  // is done, also when it cannot be watched. One that is known already is checked.
   void AddNew(Id parent, const std::string& name, ChangeSink& sink);
-  // Looks anew at a directory that is known, and tells it as created.
-  void AddAgain(Id directory);
+  // Looks whether the known directory is the one that now has its path, as it is unless the disk
+  // was listed before an event was read. Another one, or one that was not watched, is told as
+  // created when it is watched.
+  void Check(Id directory, ChangeSink& sink);
   // Ends the watching of a directory and all below it.
   void Remove(Id directory);
   // The kernel has ended the watch by itself.
   void Lost(Id directory);
+
+  // All events that there were have been handled: what was not found at its path may be found now.
+  void LookForMissing();
 
   // Whether Work() has something to do.
   bool HasWork() const { return !scans_.empty() || !doomed_.empty(); }
@@ -73,26 +78,34 @@ class InotifyWatches {
     WatchTree::Ref directory;
     std::uint32_t job = 0;
   };
-  // What is told when a number of scans is done: that the top directory is new, or that it was in
-  // doubt until now.
+  // What is told of the top directory when a number of scans is done.
+  enum class Outcome {
+    kCreated,
+    kCreatedIfWatched,  // if anything was watched that was not before
+    kDoubtIfWatched,
+  };
   struct Job {
     WatchTree::Ref top;
-    bool is_doubt = false;
+    Outcome outcome = Outcome::kCreated;
     bool any_watched = false;
     std::size_t left = 0;
   };
 
-  std::uint32_t NewJob(Id top, bool is_doubt);
+  std::uint32_t NewJob(Id top, Outcome outcome);
+  void CheckLater(Id directory);
   void AddScan(Id directory, std::uint32_t job);
   void DoLastScan(ChangeSink& sink);
   void DoScan(const Scan& scan, ChangeSink& sink);
   void Watch(const Scan& scan, UniqueFd fd, ChangeSink& sink);
   void EndScan(std::uint32_t job, ChangeSink& sink);
   void CannotOpen(const Scan& scan, int error, ChangeSink& sink);
+  void Miss(const Scan& scan);
   void CannotWatch(const Scan& scan, int error, ChangeSink& sink);
   void Starve(const Scan& scan, int error, ChangeSink& sink);
   bool MayEnter(Id directory, const DirectoryId& id) const;
   bool TakeNumber(Id directory, int watch, const DirectoryId& id);
+  bool IsStillAt(Id directory, const DirectoryId& id) const;
+  void Strip(Id directory);
   void List(Id directory, UniqueFd fd, std::uint32_t job);
   void Doom(const std::vector<int>& watches);
   void RemoveDoomed();
@@ -107,6 +120,7 @@ class InotifyWatches {
   // Each removal is an event, of which the kernel keeps only so many.
   std::unordered_set<int> doomed_;
 
+  std::vector<WatchTree::Ref> missing_;  // there was nothing at the paths of these
   std::vector<WatchTree::Ref> starved_;  // the system has no watches for these
   bool is_short_ = false;                // of watches, since the last Retry()
   bool was_short_ = false;               // since it was last said
