@@ -85,23 +85,23 @@ std::string NameIn(int parent, int fd, const struct stat& status) {
   return status.st_nlink == 0 ? std::string() : SearchName(parent, status.st_ino);
 }
 
-bool IsOutOfResources(int error) {
-  return error == EMFILE || error == ENFILE || error == ENOMEM || error == EPERM ||
-         error == EACCES || error == EIO;
+// What errno says of a handle that could not be opened.
+Answer AnswerOfErrno() {
+  return errno == ESTALE || errno == ENOENT ? Answer::kGone : Answer::kFailed;
 }
 
 // kGone when nothing could be made of it, kFound with an empty parent when the mount ends here.
 Answer PlaceOf(int fd, DirectoryPlace* place) {
   const std::optional<DirectoryIdentity> own = IdentifyDirectory(fd);
   struct stat status {};
-  if (!own || fstat(fd, &status) != 0)
-    return IsOutOfResources(errno) ? Answer::kFailed : Answer::kGone;
+  if (!own || fstat(fd, &status) != 0) return Answer::kFailed;
   const UniqueFd parent(openat(fd, "..", kOpenFlags));
   *place = DirectoryPlace{};
   // A directory that a mount does not show has no parent there.
-  if (!parent.valid()) return IsOutOfResources(errno) ? Answer::kFailed : Answer::kFound;
+  if (!parent.valid()) return errno == ENOENT ? Answer::kFound : Answer::kFailed;
   std::optional<DirectoryIdentity> above = IdentifyDirectory(parent.get());
-  if (!above || above->mount != own->mount || above->handle == own->handle) return Answer::kFound;
+  if (!above) return Answer::kFailed;
+  if (above->mount != own->mount || above->handle == own->handle) return Answer::kFound;
   place->name = NameIn(parent.get(), fd, status);
   if (place->name.empty()) return Answer::kGone;
   place->parent = std::move(above->handle);
@@ -112,7 +112,7 @@ Answer FindThrough(int mount, std::string_view handle, DirectoryPlace* place) {
   Answer answer = Answer::kGone;
   for (int attempt = 0; attempt < kAttempts && answer == Answer::kGone; ++attempt) {
     const UniqueFd fd = OpenHandle(mount, handle, kOpenFlags);
-    if (!fd.valid()) return IsOutOfResources(errno) ? Answer::kFailed : Answer::kGone;
+    if (!fd.valid()) return AnswerOfErrno();
     answer = PlaceOf(fd.get(), place);
   }
   return answer;
@@ -161,7 +161,7 @@ void MountedDirectories::RemoveEntrance(const std::string& path) {
 int MountedDirectories::OpenEntrance(const std::string& path) {
   const auto known = open_.find(path);
   if (known != open_.end()) return known->second.get();
-  UniqueFd fd(open(path.c_str(), kOpenFlags));
+  UniqueFd fd(open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));  // O_PATH does not do
   struct stat status {};
   if (!fd.valid() || fstat(fd.get(), &status) != 0 || status.st_dev != device_) fd.Reset();
   return open_.emplace(path, std::move(fd)).first->second.get();
@@ -186,9 +186,9 @@ DirectoryLookup::Answer MountedDirectories::FindFile(std::string_view handle,
     const int mount = OpenEntrance(entrance);
     if (mount < 0) continue;
     const UniqueFd fd = OpenHandle(mount, handle, O_PATH | O_NOFOLLOW | O_CLOEXEC);
-    if (!fd.valid() && errno == ESTALE) continue;
-    answer = fd.valid() ? PlaceOfFile(fd.get(), place) : Answer::kFailed;
-    if (answer != Answer::kFailed) return answer;
+    const Answer found = fd.valid() ? PlaceOfFile(fd.get(), place) : AnswerOfErrno();
+    if (found == Answer::kFound) return found;
+    if (found != Answer::kGone) answer = found;
   }
   return answer;
 }

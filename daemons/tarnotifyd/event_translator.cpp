@@ -13,6 +13,7 @@ namespace {
 
 constexpr std::uint64_t kAppeared = FAN_CREATE | FAN_MOVED_TO;
 constexpr std::uint64_t kVanished = FAN_DELETE | FAN_MOVED_FROM;
+constexpr std::uint64_t kMoves = FAN_RENAME | FAN_MOVED_TO;
 constexpr std::uint64_t kWritten = FAN_MODIFY | FAN_CLOSE_WRITE;
 
 bool IsDirectory(const FanotifyEvent& event) {
@@ -75,9 +76,20 @@ void EventTranslator::Translate(const FanotifyEvent& event, ChangeSink& sink) {
     // A rename may be among what was lost.
     tree_.Forget();
     DoubtAll(sink);
+  } else if (IsOfReplaced(event)) {
+    // Nobody finds it under the name that it has lost.
   } else if (!TakeMove(event, sink)) {
     TellEntry(event, sink);
   }
+  previous_mask_ = event.mask;
+  previous_process_ = event.process;
+}
+
+// Whether the event says no more than that the file in whose place another one was moved by the
+// event before has a name less.
+bool EventTranslator::IsOfReplaced(const FanotifyEvent& event) const {
+  return event.entry.directory.empty() && IsOnly(event, FAN_ATTRIB) &&
+         event.process == previous_process_ && (previous_mask_ & kMoves) != 0;
 }
 
 // Whether the event is a move, or half of one that may still become whole.

@@ -56,6 +56,7 @@ class EventTranslator {
   };
 
   void Translate(const FanotifyEvent& event, ChangeSink& sink);
+  bool IsOfReplaced(const FanotifyEvent& event) const;
   bool TakeMove(const FanotifyEvent& event, ChangeSink& sink);
   void TellMove(const Move& move, ChangeSink& sink);
   void TellDeparture(ChangeSink& sink);
@@ -69,6 +70,8 @@ class EventTranslator {
 
   DirectoryTree& tree_;
   std::optional<Departure> departure_;
+  std::uint64_t previous_mask_ = 0;
+  std::int32_t previous_process_ = 0;
   std::map<std::string, std::uint64_t> unplaced_;  // handles of files, and what happened to them
   bool is_doubtful_ = false;                       // there are files that have no place
   int pause_ = 0;

@@ -64,7 +64,7 @@ void RequireRights(int group, MoveReports reports) {
   directories.AddEntrance("/");
   const std::optional<DirectoryIdentity> identity = IdentifyDirectory(top.get());
   DirectoryPlace place;
-  if (identity && directories.Find(identity->handle, &place) == DirectoryLookup::Answer::kFailed) {
+  if (identity && directories.Find(identity->handle, &place) != DirectoryLookup::Answer::kFound) {
     errno = EPERM;
     daemon::ThrowSystemError("Cannot use fanotify");
   }

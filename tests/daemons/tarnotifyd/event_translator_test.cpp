@@ -231,6 +231,16 @@ TEST_F(EventTranslatorTest, NameLessThatADeletionExplains) {
   EXPECT_THAT(Finish(), ElementsAre("doubt /s"));
 }
 
+TEST_F(EventTranslatorTest, NameLessThatAMoveExplains) {
+  Tell(RenameEvent("d", "new", "d", "old", "t") + FileEvent(FAN_ATTRIB, "f") +
+       EntryEvent(FAN_MOVED_FROM, "d", "a") + EntryEvent(FAN_MOVED_TO, "d", "b") +
+       FileEvent(FAN_ATTRIB, "f"));
+  lookup_.fails = true;
+  EXPECT_THAT(Finish(), IsEmpty());
+  Tell(FileEvent(FAN_ATTRIB, "f"));
+  EXPECT_THAT(Finish(), ElementsAre("doubt /s"));
+}
+
 TEST_F(EventTranslatorTest, FilesWithoutPlaceAreBounded) {
   for (std::size_t i = 0; i <= EventTranslator::kMaxUnplaced; ++i) {
     Tell(FileEvent(FAN_MODIFY, std::to_string(i)));
