@@ -31,7 +31,8 @@ std::vector<ServiceSpec> Services() {
   const std::string directory = Dirname(OwnProgram()) + "/";
   return {{"tarnelasticd", directory + "tarnelasticd", EngineSocket(), true},
           {"tarncontentextractd", directory + "tarncontentextractd", ExtractorSocket(), false},
-          {"fileindexd", directory + "fileindexd", IndexDaemonSocket(), false}};
+          {"fileindexd", directory + "fileindexd", IndexDaemonSocket(), false},
+          {"tarnotifyd", directory + "tarnotifyd", "", true}};
 }
 
 std::string Answer(Supervisor& supervisor, const std::string& text) {

@@ -1,10 +1,11 @@
 #include "daemons/tarnotifyd/make_change_source.h"
 
+#include <utility>
+
 #include "common/error.h"
 #include "daemons/common/log.h"
-#if __has_include("daemons/tarnotifyd/fanotify_source.h")
+#include "daemons/tarnotifyd/combined_source.h"
 #include "daemons/tarnotifyd/fanotify_source.h"
-#endif
 #include "daemons/tarnotifyd/inotify_source.h"
 
 namespace quarry::notify {
@@ -17,13 +18,11 @@ std::unique_ptr<ChangeSource> MakeInotify() {
 }
 
 std::unique_ptr<ChangeSource> MakeFanotify() {
-#if __has_include("daemons/tarnotifyd/fanotify_source.h")
-  auto source = std::make_unique<FanotifySource>();
-  daemon::LogInfo("Changes come from fanotify");
+  auto file_systems = std::make_unique<FanotifySource>();
+  auto source =
+      std::make_unique<CombinedSource>(std::move(file_systems), std::make_unique<InotifySource>());
+  daemon::LogInfo("Changes come from fanotify, and from inotify where a file system lacks it");
   return source;
-#else
-  throw Error(kErrorSystem, "Not built");
-#endif
 }
 
 }  // namespace
@@ -34,7 +33,7 @@ std::unique_ptr<ChangeSource> MakeChangeSource(SourceKind kind) {
   try {
     return MakeFanotify();
   } catch (const Error& error) {
-    daemon::LogInfo("fanotify is not to be had: " + error.reason());
+    daemon::LogInfo(error.reason());
     return MakeInotify();
   }
 }
