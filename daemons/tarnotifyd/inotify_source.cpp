@@ -147,7 +147,7 @@ void InotifySource::Vanish(Id directory, const InotifyEvent& event, ChangeSink& 
   const Id child = watches_->tree().Child(directory, event.name);
   if (child != WatchTree::kNone) watches_->Remove(child);
   // Of two directories that change places the one that comes is told first.
-  if ((event.mask & IN_MOVED_FROM) != 0) watches_->AddNew(directory, event.name, sink);
+  if ((event.mask & IN_MOVED_FROM) != 0) AddIfThere(directory, event.name, sink);
 }
 
 // A directory may have become one that can be read.
@@ -196,7 +196,13 @@ void InotifySource::MoveDirectory(Id from, const std::string& old_name, Id to,
   }
   if (tree.IsAlive(target)) watches_->AddNew(to, new_name, sink);
   if (moved != WatchTree::kNone && replaced != WatchTree::kNone && tree.IsAlive(source)) {
-    watches_->AddNew(from, old_name, sink);
+    AddIfThere(from, old_name, sink);
+  }
+}
+
+void InotifySource::AddIfThere(Id directory, const std::string& name, ChangeSink& sink) {
+  if (OpenDirectory(PathOf(directory, name), false).valid()) {
+    watches_->AddNew(directory, name, sink);
   }
 }
 
