@@ -2,6 +2,7 @@
 
 #include <sys/epoll.h>
 
+#include <algorithm>
 #include <utility>
 
 #include "daemons/common/log.h"
@@ -18,44 +19,47 @@ bool Watch(int poll_fd, int fd) {
 
 }  // namespace
 
-CombinedSource::CombinedSource(std::unique_ptr<FanotifySource> file_systems,
-                               std::unique_ptr<ChangeSource> directories)
-    : file_systems_(std::move(file_systems)),
-      directories_(std::move(directories)),
+CombinedSource::CombinedSource(std::unique_ptr<ChangeSource> first,
+                               std::unique_ptr<ChangeSource> second, std::function<Paths()> left)
+    : first_(std::move(first)),
+      second_(std::move(second)),
+      left_(std::move(left)),
       poll_fd_(epoll_create1(EPOLL_CLOEXEC)) {
-  if (!poll_fd_.valid() || !Watch(poll_fd_.get(), file_systems_->Descriptor()) ||
-      !Watch(poll_fd_.get(), directories_->Descriptor())) {
+  if (!poll_fd_.valid() || !Watch(poll_fd_.get(), first_->Descriptor()) ||
+      !Watch(poll_fd_.get(), second_->Descriptor())) {
     daemon::ThrowSystemError("Cannot wait for changes");
   }
 }
 
-void CombinedSource::SetDirectories(const std::vector<std::string>& directories,
-                                    const std::vector<std::string>& ignore, ChangeSink& sink) {
-  file_systems_->SetDirectories(directories, ignore, sink);
-  const bool same = std::exchange(ignore_, ignore) == ignore;
-  if (same || unwatchable_.empty()) return FollowUnwatchable(sink);
-  unwatchable_ = file_systems_->Unwatchable();
-  directories_->SetDirectories(unwatchable_, ignore_, sink);
+void CombinedSource::SetDirectories(const Paths& directories, const Paths& ignore,
+                                    ChangeSink& sink) {
+  ignore_ = ignore;
+  first_->SetDirectories(directories, ignore, sink);
+  Share(sink);
 }
 
 void CombinedSource::Read(ChangeSink& sink) {
-  file_systems_->Read(sink);
-  directories_->Read(sink);
+  first_->Read(sink);
+  second_->Read(sink);
 }
 
 void CombinedSource::Refresh(ChangeSink& sink) {
-  file_systems_->Refresh(sink);
-  FollowUnwatchable(sink);
-  directories_->Refresh(sink);
+  first_->Refresh(sink);
+  Share(sink);
+  second_->Refresh(sink);
 }
 
-void CombinedSource::FollowUnwatchable(ChangeSink& sink) {
-  if (file_systems_->Unwatchable() == unwatchable_) return;
-  unwatchable_ = file_systems_->Unwatchable();
-  for (const std::string& path : unwatchable_) {
-    daemon::LogInfo("The file system of " + path + " does not tell its changes to fanotify");
+void CombinedSource::Share(ChangeSink& sink) {
+  Paths left = left_();
+  if (left == told_ && ignore_ == told_ignore_) return;
+  for (const std::string& path : left) {
+    if (!std::binary_search(told_.begin(), told_.end(), path)) {
+      daemon::LogInfo("Each directory below " + path + " is watched by itself");
+    }
   }
-  directories_->SetDirectories(unwatchable_, ignore_, sink);
+  told_ = std::move(left);
+  told_ignore_ = ignore_;
+  second_->SetDirectories(told_, told_ignore_, sink);
 }
 
 }  // namespace quarry::notify

@@ -18,9 +18,11 @@ std::unique_ptr<ChangeSource> MakeInotify() {
 }
 
 std::unique_ptr<ChangeSource> MakeFanotify() {
-  auto file_systems = std::make_unique<FanotifySource>();
+  auto fanotify = std::make_unique<FanotifySource>();
+  const FanotifySource& file_systems = *fanotify;
   auto source =
-      std::make_unique<CombinedSource>(std::move(file_systems), std::make_unique<InotifySource>());
+      std::make_unique<CombinedSource>(std::move(fanotify), std::make_unique<InotifySource>(),
+                                       [&file_systems] { return file_systems.Unwatchable(); });
   daemon::LogInfo("Changes come from fanotify, and from inotify where a file system lacks it");
   return source;
 }

@@ -2,15 +2,14 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <sys/eventfd.h>
 
 #include <functional>
 #include <stdexcept>
 
 #include "common/json.h"
-#include "common/unique_fd.h"
 #include "fileindex/queue/event.h"
 #include "platform/include/monitor.h"
+#include "tests/daemons/tarnotifyd/support/fake_source.h"
 #include "tests/support/files.h"
 #include "tests/support/root.h"
 
@@ -20,45 +19,9 @@ namespace {
 using namespace fileindex;
 using TARN::TARNOTIFYD::MONITOR_QUEUE_TYPE_APPLICATION;
 using TARN::TARNOTIFYD::MonitorQueue;
+using test::FakeSource;
 using ::testing::ElementsAre;
 using Names = std::vector<std::string>;
-
-// Tells what the test gives it.
-class FakeSource : public ChangeSource {
- public:
-  FakeSource() : event_(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {}
-
-  int Descriptor() const override { return event_.get(); }
-  void SetDirectories(const Names& directories, const Names& ignore, ChangeSink& sink) override {
-    for (const std::string& directory : directories) {
-      if (std::find(directories_.begin(), directories_.end(), directory) == directories_.end()) {
-        sink.OnDoubt(directory);
-      }
-    }
-    directories_ = directories;
-    ignore_ = ignore;
-  }
-  void Read(ChangeSink& sink) override {
-    eventfd_t count = 0;
-    eventfd_read(event_.get(), &count);
-    const auto tell = std::exchange(tell_, {});
-    if (tell) tell(sink);
-  }
-  void Refresh(ChangeSink&) override { ++refreshed_; }
-
-  void Tell(const std::function<void(ChangeSink&)>& tell) {
-    tell_ = tell;
-    eventfd_write(event_.get(), 1);
-  }
-
-  Names directories_;
-  Names ignore_;
-  int refreshed_ = 0;
-
- private:
-  UniqueFd event_;
-  std::function<void(ChangeSink&)> tell_;
-};
 
 class MonitorTest : public ::testing::Test {
  protected:
