@@ -53,6 +53,28 @@ TEST_F(LiveTest, ChangesAreFoundByThemselves) {
   system_.Stop();
 }
 
+TEST_F(LiveTest, ARenamedShareIsFollowedToItsNewPlace) {
+  ASSERT_EQ(system_.Quarry({"share", "rename", "docs", "papers"}).end, "exit code 0");
+  docs_ = system_.Files() + "/papers";
+  WriteFile(docs_ + "/new/place.txt", "a pangolin");
+  EXPECT_TRUE(Comes([this] { return Finds("pangolin", 1); }));
+  WriteFile(docs_ + "/new/later.txt", "a tapir");
+  EXPECT_TRUE(Comes([this] { return Finds("tapir", 1); }));
+  EXPECT_TRUE(IndexIsLikeTheDisk());
+  system_.Stop();
+}
+
+TEST_F(LiveTest, AFolderThatIsAddedLaterIsFollowed) {
+  const std::string other = system_.Files() + "/other";
+  WriteFile(other + "/first.txt", "a dugong");
+  ASSERT_EQ(system_.Quarry({"share", "add", other}).end, "exit code 0");
+  ASSERT_EQ(system_.Quarry({"folder", "add", "/other"}).end, "exit code 0");
+  EXPECT_TRUE(Comes([this] { return Finds("dugong", 1); }));
+  WriteFile(other + "/second.txt", "a manatee");
+  EXPECT_TRUE(Comes([this] { return Finds("manatee", 1); }));
+  system_.Stop();
+}
+
 TEST_F(LiveTest, WhatAMonitorThatIsKilledMissesIsFound) {
   const pid_t before = system_.Pid("tarnotifyd");
   ASSERT_GT(before, 0);

@@ -9,6 +9,7 @@
 #include <filesystem>
 
 #include "cli/supervisor/child.h"
+#include "cli/system.h"
 #include "common/file_util.h"
 #include "platform/linux/share_move.h"
 #include "platform/linux/share_registry.h"
@@ -31,6 +32,10 @@ class ShareMovesTest : public testing::Test {
     Run({"folder", "add", "/docs"});
     ASSERT_TRUE(system_.WaitUntilIdle());
     ASSERT_EQ(Found("capybara"), kFiles);
+    // The monitor would tell of what follows, and have it read.
+    Json::Value monitor;
+    monitor["service"] = "tarnotifyd";
+    cli::AskSupervisor("stop", monitor);
     for (int i = 0; i < kFiles; ++i) Disguise(Path(i, docs_));
   }
   void TearDown() override { system_.Stop(); }
