@@ -9,7 +9,6 @@
 #include <filesystem>
 
 #include "cli/supervisor/child.h"
-#include "cli/system.h"
 #include "common/file_util.h"
 #include "platform/linux/share_move.h"
 #include "platform/linux/share_registry.h"
@@ -33,9 +32,7 @@ class ShareMovesTest : public testing::Test {
     ASSERT_TRUE(system_.WaitUntilIdle());
     ASSERT_EQ(Found("capybara"), kFiles);
     // The monitor would tell of what follows, and have it read.
-    Json::Value monitor;
-    monitor["service"] = "tarnotifyd";
-    cli::AskSupervisor("stop", monitor);
+    RunningSystem::StopMonitor();
     for (int i = 0; i < kFiles; ++i) Disguise(Path(i, docs_));
   }
   void TearDown() override { system_.Stop(); }
