@@ -60,7 +60,7 @@ class Vandal {
         return RemoveAll(path);
       default:
         if (Below(2) == 0) return Replace(path);
-        if (symlink("/", path.c_str()) != 0) chmod(path.c_str(), 0700);
+        if (symlink(outside_.c_str(), path.c_str()) != 0) chmod(path.c_str(), 0700);
     }
   }
 

@@ -75,7 +75,7 @@ void Vandal::Move(const std::string& path) {
 void Vandal::Create(const std::string& path) {
   switch (Below(6)) {
     case 0:
-      if (symlink("/", path.c_str()) != 0) chmod(path.c_str(), 0700);
+      if (symlink(outside_.c_str(), path.c_str()) != 0) chmod(path.c_str(), 0700);
       return;
     case 1:
       if (link(AnyPath().c_str(), path.c_str()) != 0) errno = 0;
