@@ -67,7 +67,8 @@ void QueueFeed::Write(Clock::time_point now) {
   }
   switch (AppendToQueue(queue_, doubtful_ ? OverflowLine(doubtful_directory_) : unwritten_)) {
     case WriteResult::kBusy:
-      return WaitForLock(now);
+      not_before_ = now + kLockPause;
+      return;
     case WriteResult::kFailed:
       return Fail(now);
     case WriteResult::kDone:
@@ -78,10 +79,6 @@ void QueueFeed::Write(Clock::time_point now) {
   doubtful_ = false;
   unwritten_.clear();
   waiting_ = 0;
-}
-
-void QueueFeed::WaitForLock(Clock::time_point now) {
-  not_before_ = now + kLockPause;
 }
 
 void QueueFeed::Fail(Clock::time_point now) {

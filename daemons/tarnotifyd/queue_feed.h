@@ -45,7 +45,6 @@ class QueueFeed {
   bool HasLines() const { return doubtful_ || !unwritten_.empty() || fold_.Ready() > 0; }
   bool MustGather(Clock::time_point now) const;
   void Write(Clock::time_point now);
-  void WaitForLock(Clock::time_point now);
   void Fail(Clock::time_point now);
 
   const std::string queue_;
