@@ -3,109 +3,25 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <poll.h>
-#include <stdlib.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <atomic>
-#include <cstdio>
 #include <filesystem>
 #include <random>
 #include <thread>
 
 #include "daemons/tarnotifyd/inotify_source.h"
 #include "tests/daemons/tarnotifyd/support/disk_model.h"
+#include "tests/daemons/tarnotifyd/support/vandal.h"
 #include "tests/support/temp_dir.h"
 
 namespace quarry::notify {
 namespace {
 
 using test::DiskModel;
+using test::Vandal;
 
 const std::set<std::string> kIgnored{"@eaDir"};
-
-// Does this and that to a tree, and to a place beside it with which it exchanges things.
-class Vandal {
- public:
-  Vandal(const std::string& inside, const std::string& outside, unsigned seed)
-      : inside_(inside), outside_(outside), random_(seed) {}
-
-  void DoOne() {
-    const std::string path = AnyPath();
-    const std::string other = AnyPath();
-    switch (Below(12)) {
-      case 0:
-      case 1:
-        return Write(path);
-      case 2:
-        mkdir(path.c_str(), 0700);
-        return;
-      case 3:
-        return MakeNest(path);
-      case 4:
-      case 5:
-      case 6:
-        std::rename(path.c_str(), other.c_str());
-        return;
-      case 7:
-        renameat2(AT_FDCWD, path.c_str(), AT_FDCWD, other.c_str(), RENAME_EXCHANGE);
-        return;
-      case 8:
-        std::rename(path.c_str(), Outside().c_str());
-        return;
-      case 9:
-        std::rename(Outside().c_str(), path.c_str());
-        return;
-      case 10:
-        return RemoveAll(path);
-      default:
-        if (Below(2) == 0) return Replace(path);
-        if (symlink(outside_.c_str(), path.c_str()) != 0) chmod(path.c_str(), 0700);
-    }
-  }
-
- private:
-  unsigned Below(unsigned end) { return static_cast<unsigned>(random_() % end); }
-
-  std::string AnyName() {
-    static const std::string names[] = {"a", "b", "c", "d", "\xff\xfe", "@eaDir"};
-    // The ignored name is rarer.
-    const unsigned which = Below(11);
-    return names[which < 10 ? which / 2 : 5];
-  }
-  std::string AnyPath() {
-    std::string path = inside_;
-    for (unsigned depth = 1 + Below(4); depth > 0; --depth) path += "/" + AnyName();
-    return path;
-  }
-  std::string Outside() { return outside_ + "/" + std::to_string(Below(4)); }
-
-  static void Write(const std::string& path) {
-    const int fd = open(path.c_str(), O_WRONLY | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600);
-    if (fd < 0) return;
-    if (write(fd, "text", 4) < 0) errno = 0;
-    close(fd);
-  }
-  void MakeNest(const std::string& path) {
-    std::string at = path;
-    for (unsigned depth = 0; depth < 5; ++depth) {
-      if (mkdir(at.c_str(), 0700) == 0) Write(at + "/file");
-      at += "/" + AnyName();
-    }
-  }
-  void Replace(const std::string& path) {
-    std::rename(path.c_str(), AnyPath().c_str());
-    MakeNest(path);
-  }
-  static void RemoveAll(const std::string& path) {
-    std::error_code error;
-    std::filesystem::remove_all(path, error);
-  }
-
-  const std::string inside_;
-  const std::string outside_;
-  std::mt19937 random_;
-};
 
 class InotifyModelTest : public ::testing::Test {
  protected:
