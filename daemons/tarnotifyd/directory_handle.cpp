@@ -20,7 +20,8 @@ using Answer = DirectoryLookup::Answer;
 
 constexpr int kOpenFlags = O_PATH | O_DIRECTORY | O_CLOEXEC;
 constexpr std::size_t kTypeSize = sizeof(std::int32_t);
-// Several renames in a row may each come between two looks. Their events are still to be read.
+// Renames may come between two looks (their events are still to be read), and the kernel has been
+// seen to fail with ENOMEM, for no such reason, on a directory that was just being removed.
 constexpr int kAttempts = 4;
 
 // A handle with room for the largest one.
@@ -90,30 +91,30 @@ Answer AnswerOfErrno() {
   return errno == ESTALE || errno == ENOENT ? Answer::kGone : Answer::kFailed;
 }
 
-// kGone when nothing could be made of it, kFound with an empty parent when the mount ends here.
-Answer PlaceOf(int fd, DirectoryPlace* place) {
-  const std::optional<DirectoryIdentity> own = IdentifyDirectory(fd);
+// Of the open directory with this handle. kGone when nothing could be made of it, kFound with an
+// empty parent when the mount ends here.
+Answer PlaceOf(int fd, int mount, std::string_view handle, DirectoryPlace* place) {
   struct stat status {};
-  if (!own || fstat(fd, &status) != 0) return Answer::kFailed;
+  if (fstat(fd, &status) != 0) return Answer::kFailed;
   const UniqueFd parent(openat(fd, "..", kOpenFlags));
   *place = DirectoryPlace{};
   // A directory that a mount does not show has no parent there.
   if (!parent.valid()) return errno == ENOENT ? Answer::kFound : Answer::kFailed;
   std::optional<DirectoryIdentity> above = IdentifyDirectory(parent.get());
   if (!above) return Answer::kFailed;
-  if (above->mount != own->mount || above->handle == own->handle) return Answer::kFound;
+  if (above->mount != mount || above->handle == handle) return Answer::kFound;
   place->name = NameIn(parent.get(), fd, status);
   if (place->name.empty()) return Answer::kGone;
   place->parent = std::move(above->handle);
   return Answer::kFound;
 }
 
-Answer FindThrough(int mount, std::string_view handle, DirectoryPlace* place) {
+Answer FindThrough(int entrance, int mount, std::string_view handle, DirectoryPlace* place) {
   Answer answer = Answer::kGone;
-  for (int attempt = 0; attempt < kAttempts && answer == Answer::kGone; ++attempt) {
-    const UniqueFd fd = OpenHandle(mount, handle, kOpenFlags);
-    if (!fd.valid()) return AnswerOfErrno();
-    answer = PlaceOf(fd.get(), place);
+  for (int attempt = 0; attempt < kAttempts; ++attempt) {
+    const UniqueFd fd = OpenHandle(entrance, handle, kOpenFlags);
+    answer = fd.valid() ? PlaceOf(fd.get(), mount, handle, place) : AnswerOfErrno();
+    if (answer == Answer::kFound || (!fd.valid() && answer == Answer::kGone)) return answer;
   }
   return answer;
 }
@@ -150,31 +151,37 @@ std::optional<DirectoryIdentity> IdentifyDirectory(int fd) {
 
 void MountedDirectories::AddEntrance(const std::string& path) {
   entrances_.push_back(path);
+  Release();
 }
 
 void MountedDirectories::RemoveEntrance(const std::string& path) {
   const auto found = std::find(entrances_.begin(), entrances_.end(), path);
   if (found != entrances_.end()) entrances_.erase(found);
-  open_.erase(path);
+  Release();
 }
 
-int MountedDirectories::OpenEntrance(const std::string& path) {
-  const auto known = open_.find(path);
-  if (known != open_.end()) return known->second.get();
-  UniqueFd fd(open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));  // O_PATH does not do
-  struct stat status {};
-  if (!fd.valid() || fstat(fd.get(), &status) != 0 || status.st_dev != device_) fd.Reset();
-  return open_.emplace(path, std::move(fd)).first->second.get();
+const std::vector<MountedDirectories::Entrance>& MountedDirectories::OpenEntrances() {
+  if (!open_.empty()) return open_;
+  for (const std::string& path : entrances_) {
+    UniqueFd fd(open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));  // O_PATH does not do
+    struct stat status {};
+    if (!fd.valid() || fstat(fd.get(), &status) != 0 || status.st_dev != device_) continue;
+    const std::optional<DirectoryIdentity> identity = IdentifyDirectory(fd.get());
+    const auto is_same = [&](const Entrance& other) { return other.mount == identity->mount; };
+    if (identity && std::none_of(open_.begin(), open_.end(), is_same)) {
+      open_.push_back({std::move(fd), identity->mount});
+    }
+  }
+  return open_;
 }
 
 DirectoryLookup::Answer MountedDirectories::Find(std::string_view handle, DirectoryPlace* place) {
   Answer best = Answer::kGone;
-  for (const std::string& entrance : entrances_) {
-    const int mount = OpenEntrance(entrance);
-    if (mount < 0) continue;
-    const Answer answer = FindThrough(mount, handle, place);
+  for (const Entrance& entrance : OpenEntrances()) {
+    const Answer answer = FindThrough(entrance.fd.get(), entrance.mount, handle, place);
+    if (answer == Answer::kGone) return answer;  // for all mounts
     if (answer == Answer::kFound && !place->parent.empty()) return answer;
-    if (answer != Answer::kGone) best = answer;
+    best = answer;
   }
   return best;
 }
@@ -182,13 +189,10 @@ DirectoryLookup::Answer MountedDirectories::Find(std::string_view handle, Direct
 DirectoryLookup::Answer MountedDirectories::FindFile(std::string_view handle,
                                                      DirectoryPlace* place) {
   Answer answer = Answer::kGone;
-  for (const std::string& entrance : entrances_) {
-    const int mount = OpenEntrance(entrance);
-    if (mount < 0) continue;
-    const UniqueFd fd = OpenHandle(mount, handle, O_PATH | O_NOFOLLOW | O_CLOEXEC);
-    const Answer found = fd.valid() ? PlaceOfFile(fd.get(), place) : AnswerOfErrno();
-    if (found == Answer::kFound) return found;
-    if (found != Answer::kGone) answer = found;
+  for (const Entrance& entrance : OpenEntrances()) {
+    const UniqueFd fd = OpenHandle(entrance.fd.get(), handle, O_PATH | O_NOFOLLOW | O_CLOEXEC);
+    answer = fd.valid() ? PlaceOfFile(fd.get(), place) : AnswerOfErrno();
+    if (answer != Answer::kFailed) return answer;
   }
   return answer;
 }

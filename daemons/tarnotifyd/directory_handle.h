@@ -5,7 +5,6 @@
 
 #include <sys/types.h>
 
-#include <map>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -45,11 +44,18 @@ class MountedDirectories : public DirectoryLookup {
   void Release() { open_.clear(); }
 
  private:
-  int OpenEntrance(const std::string& path);
+  // A directory that is open for looking things up, and its mount; what is found through it is on
+  // the same one.
+  struct Entrance {
+    UniqueFd fd;
+    int mount = 0;
+  };
+
+  const std::vector<Entrance>& OpenEntrances();
 
   const dev_t device_;
   std::vector<std::string> entrances_;
-  std::map<std::string, UniqueFd> open_;
+  std::vector<Entrance> open_;  // one of each mount
 };
 
 }  // namespace quarry::notify

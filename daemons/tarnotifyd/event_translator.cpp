@@ -81,15 +81,14 @@ void EventTranslator::Translate(const FanotifyEvent& event, ChangeSink& sink) {
   } else if (!TakeMove(event, sink)) {
     TellEntry(event, sink);
   }
-  previous_mask_ = event.mask;
-  previous_process_ = event.process;
 }
 
-// Whether the event says no more than that the file in whose place another one was moved by the
-// event before has a name less.
-bool EventTranslator::IsOfReplaced(const FanotifyEvent& event) const {
-  return event.entry.directory.empty() && IsOnly(event, FAN_ATTRIB) &&
-         event.process == previous_process_ && (previous_mask_ & kMoves) != 0;
+// Whether the event says no more than that the file in whose place the same process has just moved
+// another one has a name less.
+bool EventTranslator::IsOfReplaced(const FanotifyEvent& event) {
+  const bool has_moved = movers_.erase(event.process) > 0;
+  if ((event.mask & kMoves) != 0 && movers_.size() < kMaxMovers) movers_.insert(event.process);
+  return has_moved && event.entry.directory.empty() && IsOnly(event, FAN_ATTRIB);
 }
 
 // Whether the event is a move, or half of one that may still become whole.
@@ -175,14 +174,27 @@ void EventTranslator::ForgetLostName(const FanotifyEvent& event) {
   if (file != unplaced_.end() && (file->second & kWritten) == 0) unplaced_.erase(file);
 }
 
+// Of what is not explained yet: the deletion may still be on its way.
+bool EventTranslator::HasToWait(const std::string& file, std::uint64_t mask) {
+  return (mask & kWritten) == 0 && waiting_.erase(file) == 0;
+}
+
 void EventTranslator::PlaceFiles(ChangeSink& sink) {
+  std::map<std::string, std::uint64_t> kept;
   std::vector<std::string> paths;
-  for (const auto& [file, mask] : std::exchange(unplaced_, {})) {
+  for (const auto& [file, mask] : unplaced_) {
+    if (HasToWait(file, mask)) {
+      kept[file] = mask;
+      continue;
+    }
     if (!tree_.PathsOfFile(file, &paths)) is_doubtful_ = true;
     for (const std::string& path : paths) {
       for (const Change& change : ChangesOf(mask, path)) sink.OnChange(change);
     }
   }
+  waiting_.clear();
+  for (const auto& [file, mask] : kept) waiting_.insert(file);
+  unplaced_ = std::move(kept);
   if (pause_ > 0) --pause_;
   if (!is_doubtful_ || pause_ > 0) return;
   is_doubtful_ = false;

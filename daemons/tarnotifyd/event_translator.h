@@ -7,6 +7,7 @@
 #include <cstdint>
 #include <map>
 #include <optional>
+#include <set>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -39,6 +40,8 @@ class EventTranslator {
   static constexpr int kDoubtPause = 30;
   // Files without a place that are kept apart.
   static constexpr std::size_t kMaxUnplaced = 1024;
+  // Processes that are known to have moved something.
+  static constexpr std::size_t kMaxMovers = 64;
 
  private:
   // The first half of a move, until the second is seen.
@@ -56,13 +59,14 @@ class EventTranslator {
   };
 
   void Translate(const FanotifyEvent& event, ChangeSink& sink);
-  bool IsOfReplaced(const FanotifyEvent& event) const;
+  bool IsOfReplaced(const FanotifyEvent& event);
   bool TakeMove(const FanotifyEvent& event, ChangeSink& sink);
   void TellMove(const Move& move, ChangeSink& sink);
   void TellDeparture(ChangeSink& sink);
   void TellEntry(const FanotifyEvent& event, ChangeSink& sink);
   void KeepUnplaced(const FanotifyEvent& event);
   void ForgetLostName(const FanotifyEvent& event);
+  bool HasToWait(const std::string& file, std::uint64_t mask);
   void PlaceFiles(ChangeSink& sink);
   void NoteDirectory(const FanotifyEvent& event);
   std::vector<std::string> PathsOf(const FanotifyEntry& entry, ChangeSink& sink);
@@ -70,10 +74,10 @@ class EventTranslator {
 
   DirectoryTree& tree_;
   std::optional<Departure> departure_;
-  std::uint64_t previous_mask_ = 0;
-  std::int32_t previous_process_ = 0;
+  std::set<std::int32_t> movers_;                  // processes whose latest event was a move
   std::map<std::string, std::uint64_t> unplaced_;  // handles of files, and what happened to them
-  bool is_doubtful_ = false;                       // there are files that have no place
+  std::set<std::string> waiting_;  // those of them that have waited for an explanation
+  bool is_doubtful_ = false;       // there are files that have no place
   int pause_ = 0;
 };
 

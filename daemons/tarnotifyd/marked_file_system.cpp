@@ -4,6 +4,7 @@
 #include <sys/fanotify.h>
 #include <sys/stat.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <fstream>
 #include <optional>
@@ -17,8 +18,9 @@ constexpr unsigned int kGroup = FAN_CLASS_NOTIF | FAN_CLOEXEC | FAN_NONBLOCK;
 constexpr std::uint64_t kChanges =
     FAN_CREATE | FAN_DELETE | FAN_ATTRIB | FAN_MODIFY | FAN_CLOSE_WRITE | FAN_ONDIR;
 
-// Some thousand events, read at once.
-constexpr std::size_t kBufferSize = std::size_t{256} << 10;
+// Some hundred events, delivered at once, and some ten thousand, taken in hand at a time.
+constexpr std::size_t kBufferSize = std::size_t{64} << 10;
+constexpr std::size_t kAtATime = std::size_t{4} << 20;
 
 UniqueFd MakeGroup(MoveReports reports) {
   const unsigned int names =
@@ -123,13 +125,29 @@ void MarkedFileSystem::Finish(ChangeSink& sink) {
 }
 
 void MarkedFileSystem::Read(ChangeSink& sink) {
-  const ssize_t got = read(fd_.get(), buffer_.data(), buffer_.size());
-  if (got > 0) {
-    translator_.Translate({buffer_.data(), static_cast<std::size_t>(got)}, sink);
-  } else if (got < 0 && errno != EAGAIN && errno != EINTR) {
-    for (const std::string& root : tree_.Roots()) sink.OnDoubt(root);
+  std::deque<Delivery> deliveries;
+  std::size_t allowance = kAtATime;
+  for (Fetch(&deliveries, &allowance, sink); !deliveries.empty(); deliveries.pop_front()) {
+    translator_.Translate({deliveries.front().data(), deliveries.front().size()}, sink);
+    Fetch(&deliveries, &allowance, sink);
   }
   directories_.Release();
+}
+
+// Takes what the kernel has, up to `allowance`, which is what is left of it afterwards.
+void MarkedFileSystem::Fetch(std::deque<Delivery>* deliveries, std::size_t* allowance,
+                             ChangeSink& sink) {
+  while (*allowance > 0) {
+    const ssize_t got = read(fd_.get(), buffer_.data(), buffer_.size());
+    if (got < 0 && errno != EAGAIN && errno != EINTR) {
+      tree_.Forget();
+      for (const std::string& root : tree_.Roots()) sink.OnDoubt(root);
+    }
+    if (got <= 0) return;
+    const auto size = static_cast<std::size_t>(got);
+    deliveries->emplace_back(buffer_.begin(), buffer_.begin() + got);
+    *allowance -= std::min(*allowance, size);
+  }
 }
 
 }  // namespace quarry::notify

@@ -7,6 +7,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <deque>
 #include <string>
 #include <vector>
 
@@ -51,20 +52,25 @@ class MarkedFileSystem {
   void RemoveRoot(const std::string& path);
   bool IsUnused() const { return tree_.Roots().empty(); }
 
-  // Tells what a bounded number of events mean.
+  // Tells what a bounded number of events mean. They are fetched faster than they are told, so that
+  // the kernel's queue is filled only by those who make more than this holds.
   void Read(ChangeSink& sink);
   // See EventTranslator::Finish().
   void Finish(ChangeSink& sink);
 
  private:
+  // Whole events, as many as were delivered at once.
+  using Delivery = std::vector<char>;
+
   bool ShowsMark() const;
+  void Fetch(std::deque<Delivery>* deliveries, std::size_t* allowance, ChangeSink& sink);
 
   const dev_t device_;
   UniqueFd fd_;
   MountedDirectories directories_;
   DirectoryTree tree_;
   EventTranslator translator_;
-  std::vector<char> buffer_;
+  Delivery buffer_;
   const bool shows_marks_;
 };
 

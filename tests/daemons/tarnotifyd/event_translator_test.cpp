@@ -223,6 +223,13 @@ TEST_F(EventTranslatorTest, NameLessThatADeletionExplains) {
   EXPECT_THAT(Tell(EntryEvent(FAN_DELETE, "d", "link", "f")), ElementsAre("delete /s/d/link"));
   lookup_.fails = true;
   EXPECT_THAT(Finish(), IsEmpty());
+  lookup_.fails = false;
+  // It may be later than the next look.
+  Tell(FileEvent(FAN_ATTRIB, "f"));
+  EXPECT_THAT(Finish(), IsEmpty());
+  Tell(EntryEvent(FAN_DELETE, "d", "link", "f"));
+  lookup_.fails = true;
+  EXPECT_THAT(Finish(), IsEmpty());
   // What was written meanwhile is not explained by it.
   Tell(FileEvent(FAN_ATTRIB | FAN_MODIFY, "f"));
   lookup_.fails = false;
@@ -237,7 +244,20 @@ TEST_F(EventTranslatorTest, NameLessThatAMoveExplains) {
        FileEvent(FAN_ATTRIB, "f"));
   lookup_.fails = true;
   EXPECT_THAT(Finish(), IsEmpty());
+  EXPECT_THAT(Finish(), IsEmpty());
   Tell(FileEvent(FAN_ATTRIB, "f"));
+  EXPECT_THAT(Finish(), IsEmpty());
+  EXPECT_THAT(Finish(), ElementsAre("doubt /s"));
+}
+
+TEST_F(EventTranslatorTest, MoveOfAnotherProcessExplainsNothing) {
+  lookup_.fails = true;
+  Tell(RawEvent(FAN_RENAME, "", 1) + RawEvent(FAN_ATTRIB, "", 2) +
+       RawEvent(FAN_ATTRIB, Record(FAN_EVENT_INFO_TYPE_FID, "f"), 1));
+  Finish();
+  EXPECT_THAT(Finish(), IsEmpty());
+  Tell(RawEvent(FAN_RENAME, "", 1) + RawEvent(FAN_ATTRIB, Record(FAN_EVENT_INFO_TYPE_FID, "f"), 2));
+  Finish();
   EXPECT_THAT(Finish(), ElementsAre("doubt /s"));
 }
 
