@@ -3,12 +3,17 @@
 #include <dirent.h>
 #include <fcntl.h>
 #include <linux/limits.h>
+#include <linux/openat2.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <sys/sysmacros.h>
+#include <unistd.h>
 
 #include <cerrno>
+#include <cstdint>
 #include <cstring>
 #include <memory>
+#include <utility>
 
 namespace quarry::notify {
 namespace {
@@ -27,29 +32,45 @@ bool IsSelfOrParent(const char* name) {
   return std::strcmp(name, ".") == 0 || std::strcmp(name, "..") == 0;
 }
 
-}  // namespace
+int Open(int dir, const char* path, int flags, std::uint64_t resolve) {
+  open_how how{};
+  how.flags = static_cast<std::uint64_t>(flags | O_DIRECTORY | O_CLOEXEC);
+  how.resolve = resolve;
+  return static_cast<int>(syscall(SYS_openat2, dir, path, &how, sizeof(how)));
+}
 
-UniqueFd OpenDirectory(const std::string& path, bool to_read) {
+// The system's calls take only so much of a path at a time.
+UniqueFd OpenInPieces(int start, const std::string& path, int flags, std::uint64_t resolve) {
   constexpr std::size_t kPiece = PATH_MAX - 1;
-  constexpr int kWay = O_PATH | O_DIRECTORY | O_CLOEXEC;
-  const int last = (to_read ? O_RDONLY : O_PATH) | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC;
   UniqueFd dir;
+  const auto at = [&] { return dir.valid() ? dir.get() : start; };
   std::size_t from = 0;
-  // The system's calls take only so much of a path at a time.
   while (path.size() - from > kPiece) {
     const std::size_t end = path.rfind('/', from + kPiece);
     if (end == std::string::npos || end <= from) {
       errno = ENAMETOOLONG;
       return UniqueFd();
     }
-    const std::string piece = path.substr(from, end - from);
-    UniqueFd next(openat(dir.valid() ? dir.get() : AT_FDCWD, piece.c_str(), kWay));
+    UniqueFd next(Open(at(), path.substr(from, end - from).c_str(), O_PATH, resolve));
     if (!next.valid()) return next;
     dir = std::move(next);
     from = end + 1;
   }
-  return UniqueFd(
-      openat(dir.valid() ? dir.get() : AT_FDCWD, path.c_str() + from, last | O_NONBLOCK));
+  return UniqueFd(Open(at(), path.c_str() + from, flags, resolve));
+}
+
+}  // namespace
+
+UniqueFd OpenDirectory(const std::string& path) {
+  return OpenInPieces(AT_FDCWD, path, O_PATH | O_NOFOLLOW, 0);
+}
+
+UniqueFd OpenBelow(const std::string& top, const std::string& path, bool to_read) {
+  const int flags = (to_read ? O_RDONLY : O_PATH) | O_NOFOLLOW;
+  UniqueFd dir = OpenDirectory(top);
+  if (!dir.valid()) return dir;
+  const std::string below = path.size() > top.size() ? path.substr(top.size() + 1) : ".";
+  return OpenInPieces(dir.get(), below, flags, RESOLVE_NO_SYMLINKS);
 }
 
 bool Identify(int fd, DirectoryId* id) {

@@ -21,9 +21,13 @@ struct DirectoryId {
   bool operator==(const DirectoryId&) const = default;
 };
 
-// Opens a directory, no matter how long its path is; its last component is no symbolic link. With
-// `to_read` it can be listed. Without a descriptor errno says why.
-UniqueFd OpenDirectory(const std::string& path, bool to_read);
+// Opens a directory, no matter how long its path is; its last component is no symbolic link.
+// Without a descriptor errno says why.
+UniqueFd OpenDirectory(const std::string& path);
+
+// The same for a directory at or below `top`, by its full path: nothing below `top` is a symbolic
+// link. With `to_read` it can be listed.
+UniqueFd OpenBelow(const std::string& top, const std::string& path, bool to_read);
 
 // False with errno set when it cannot be told.
 bool Identify(int fd, DirectoryId* id);

@@ -33,7 +33,7 @@ bool Watch(int poll_fd, int fd) {
 
 // Nothing when there is no directory that could be opened.
 bool IdentifyPath(const std::string& path, DirectoryId* id) {
-  const UniqueFd fd = OpenDirectory(path, false);
+  const UniqueFd fd = OpenDirectory(path);
   return fd.valid() && Identify(fd.get(), id);
 }
 
@@ -180,30 +180,33 @@ void InotifySource::MoveDirectory(Id from, const std::string& old_name, Id to,
   WatchTree& tree = watches_->tree();
   const Id moved = tree.Child(from, old_name);
   const Id replaced = tree.Child(to, new_name);
+  const WatchTree::Ref source = tree.RefTo(from);
   const bool is_known = moved != WatchTree::kNone && tree.Watch(moved) >= 0;
   if (is_known && replaced == WatchTree::kNone && !tree.IsAtOrBelow(to, moved)) {
     tree.Move(moved, to, new_name);
-    return watches_->Check(moved, sink);
+    watches_->Check(moved, sink);
+  } else {
+    // An empty directory was replaced, or two have changed places, or the disk was listed after the
+    // move.
+    ReplaceDirectory(moved, to, new_name, sink);
   }
-  // An empty directory was replaced, or two have changed places, or the disk was listed after the
-  // move. Looking anew at both places settles it.
-  const WatchTree::Ref source = tree.RefTo(from);
+  // Of two that change places the other one has come already.
+  if (tree.IsAlive(source)) AddIfThere(from, old_name, sink);
+}
+
+// Forgets what was known of both and looks at the place anew.
+void InotifySource::ReplaceDirectory(Id moved, Id to, const std::string& name, ChangeSink& sink) {
+  WatchTree& tree = watches_->tree();
   const WatchTree::Ref target = tree.RefTo(to);
   if (moved != WatchTree::kNone) watches_->Remove(moved);
-  if (tree.IsAlive(target) && replaced != WatchTree::kNone) {
-    const Id left = tree.Child(to, new_name);
-    if (left != WatchTree::kNone) watches_->Remove(left);
-  }
-  if (tree.IsAlive(target)) watches_->AddNew(to, new_name, sink);
-  if (moved != WatchTree::kNone && replaced != WatchTree::kNone && tree.IsAlive(source)) {
-    AddIfThere(from, old_name, sink);
-  }
+  if (!tree.IsAlive(target)) return;
+  const Id replaced = tree.Child(to, name);
+  if (replaced != WatchTree::kNone) watches_->Remove(replaced);
+  watches_->AddNew(to, name, sink);
 }
 
 void InotifySource::AddIfThere(Id directory, const std::string& name, ChangeSink& sink) {
-  if (OpenDirectory(PathOf(directory, name), false).valid()) {
-    watches_->AddNew(directory, name, sink);
-  }
+  if (watches_->IsThere(directory, name)) watches_->AddNew(directory, name, sink);
 }
 
 std::string InotifySource::PathOf(Id directory, const std::string& name) const {

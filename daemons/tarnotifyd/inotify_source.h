@@ -58,6 +58,7 @@ class InotifySource : public ChangeSource {
             ChangeSink& sink);
   void MoveDirectory(Id from, const std::string& old_name, Id to, const std::string& new_name,
                      ChangeSink& sink);
+  void ReplaceDirectory(Id moved, Id to, const std::string& name, ChangeSink& sink);
   void AddIfThere(Id directory, const std::string& name, ChangeSink& sink);
   std::string PathOf(Id directory, const std::string& name) const;
 

@@ -122,7 +122,7 @@ void InotifyWatches::DoScan(const Scan& scan, ChangeSink& sink) {
   if (!tree_.IsAlive(scan.directory)) return;
   // One refusal is enough: a try costs as much as a success.
   if (is_short_) return Starve(scan, ENOSPC, sink);
-  UniqueFd fd = OpenDirectory(tree_.Path(scan.directory.id), true);
+  UniqueFd fd = Open(scan.directory.id, true);
   if (!fd.valid()) return CannotOpen(scan, errno, sink);
   Watch(scan, std::move(fd), sink);
 }
@@ -139,7 +139,7 @@ void InotifyWatches::Watch(const Scan& scan, UniqueFd fd, ChangeSink& sink) {
   if (watch < 0) return CannotWatch(scan, errno, sink);
   // What is below it is known, or is just being listed.
   if (watch == tree_.Watch(directory)) return;
-  if (!TakeNumber(directory, watch, id)) return;
+  if (!TakeNumber(directory, watch, id)) return Miss(scan);
   jobs_[scan.job].any_watched = true;
   List(directory, std::move(fd), scan.job);
 }
@@ -151,7 +151,7 @@ void InotifyWatches::CannotOpen(const Scan& scan, int error, ChangeSink& sink) {
 }
 
 // It was there when the one above it, which is watched, was listed, or told of. So there are events
-// still to come that tell of its end, or of another path.
+// still to come that tell of its end, or of another path of it or of one above it.
 void InotifyWatches::Miss(const Scan& scan) {
   missing_.push_back(scan.directory);
   Job& job = jobs_[scan.job];
@@ -193,12 +193,12 @@ bool InotifyWatches::MayEnter(Id directory, const DirectoryId& id) const {
          !IsMountPoint(tree_.Path(directory));
 }
 
-// Notes the number that the kernel has given to the directory. False when it cannot be the
-// directory's alone.
+// Notes the number that the kernel has given to the directory. False when it is another
+// directory's that has not moved: mounted at two places, or found where it is only by a path that
+// is out of date.
 bool InotifyWatches::TakeNumber(Id directory, int watch, const DirectoryId& id) {
   const Id other = tree_.FindWatch(watch);
   if (other != WatchTree::kNone) {
-    // Mounted at two places: the first one will do.
     if (IsStillAt(other, id)) return false;
     const WatchTree::Ref self = tree_.RefTo(directory);
     Strip(other);
@@ -212,8 +212,18 @@ bool InotifyWatches::TakeNumber(Id directory, int watch, const DirectoryId& id) 
   return true;
 }
 
+// What is a link on the way there was no link when it was listed.
+UniqueFd InotifyWatches::Open(Id directory, bool to_read) const {
+  return OpenBelow(tree_.Path(tree_.RootOf(directory)), tree_.Path(directory), to_read);
+}
+
+bool InotifyWatches::IsThere(Id parent, const std::string& name) const {
+  const std::string path = tree_.Path(parent) + "/" + name;
+  return OpenBelow(tree_.Path(tree_.RootOf(parent)), path, false).valid();
+}
+
 bool InotifyWatches::IsStillAt(Id directory, const DirectoryId& id) const {
-  const UniqueFd fd = OpenDirectory(tree_.Path(directory), false);
+  const UniqueFd fd = Open(directory, false);
   DirectoryId there;
   return fd.valid() && Identify(fd.get(), &there) && there.device == id.device &&
          there.inode == id.inode;

@@ -52,6 +52,8 @@ class InotifyWatches {
   // was listed before an event was read. Another one, or one that was not watched, is told as
   // created when it is watched.
   void Check(Id directory, ChangeSink& sink);
+  // Whether there is a directory of that name on the disk.
+  bool IsThere(Id parent, const std::string& name) const;
   // Ends the watching of a directory and all below it.
   void Remove(Id directory);
   // The kernel has ended the watch by itself.
@@ -104,6 +106,7 @@ class InotifyWatches {
   void Starve(const Scan& scan, int error, ChangeSink& sink);
   bool MayEnter(Id directory, const DirectoryId& id) const;
   bool TakeNumber(Id directory, int watch, const DirectoryId& id);
+  UniqueFd Open(Id directory, bool to_read) const;
   bool IsStillAt(Id directory, const DirectoryId& id) const;
   void Strip(Id directory);
   void List(Id directory, UniqueFd fd, std::uint32_t job);

@@ -135,6 +135,24 @@ TEST_F(InotifySourceTest, ARenamedDirectoryKeepsItsWatches) {
   EXPECT_THAT(Told(), ElementsAre("create file " + top_ + "/z/b/c/f"));
 }
 
+TEST_F(InotifySourceTest, DirectoriesThatChangePlacesAreBothWatched) {
+  for (const std::string& other : {top_ + "/b", top_ + "/@eaDir", out_}) {
+    test::MakeDirs(top_ + "/a/of_a");
+    test::MakeDirs(other + "/of_other");
+    Start();
+    ASSERT_EQ(renameat2(AT_FDCWD, (top_ + "/a").c_str(), AT_FDCWD, other.c_str(), RENAME_EXCHANGE),
+              0);
+    Told();
+    WriteFile(top_ + "/a/of_other/f", "x");
+    EXPECT_THAT(Told(), ElementsAre("create file " + top_ + "/a/of_other/f"));
+    EXPECT_TRUE(IsLikeDisk());
+    fs::remove_all(top_ + "/a");
+    Told();
+  }
+  WriteFile(top_ + "/b/of_a/f", "x");
+  EXPECT_THAT(Told(), ElementsAre("create file " + top_ + "/b/of_a/f"));
+}
+
 TEST_F(InotifySourceTest, WhatMovesOutIsWatchedNoMore) {
   test::MakeDirs(top_ + "/a/b");
   Start();
