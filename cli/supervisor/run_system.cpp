@@ -34,7 +34,8 @@ std::vector<ServiceSpec> Services(bool full_speed) {
   if (full_speed) speed.emplace_back("--full-speed");
   return {{"tarnelasticd", directory + "tarnelasticd", EngineSocket(), true},
           {"tarncontentextractd", directory + "tarncontentextractd", ExtractorSocket(), false},
-          {"fileindexd", directory + "fileindexd", IndexDaemonSocket(), false, speed}};
+          {"fileindexd", directory + "fileindexd", IndexDaemonSocket(), false, speed},
+          {"tarnotifyd", directory + "tarnotifyd", "", true}};
 }
 
 std::string Answer(Supervisor& supervisor, const std::string& text) {

@@ -117,6 +117,7 @@ void Supervisor::Reap(Service& service) {
 }
 
 void Supervisor::WaitUntilListening(Service& service) {
+  if (service.spec.socket_path.empty()) return;
   const auto deadline = Clock::now() + kReadyTime;
   while (!daemon::IsListening(service.spec.socket_path)) {
     if (service.child && service.child->WaitEnded(20)) {
@@ -140,7 +141,8 @@ void Supervisor::End(Service& service, bool force) {
 // A socket file without a listener would make callers fail at once instead of waiting for the
 // service to come back.
 void Supervisor::RemoveSocket(const Service& service) {
-  if (!daemon::IsListening(service.spec.socket_path)) unlink(service.spec.socket_path.c_str());
+  const std::string& path = service.spec.socket_path;
+  if (!path.empty() && !daemon::IsListening(path)) unlink(path.c_str());
 }
 
 Json::Value Supervisor::Status() const {

@@ -19,7 +19,7 @@ namespace quarry::cli {
 struct ServiceSpec {
   std::string name;
   std::string program;      // full path
-  std::string socket_path;  // at which it listens once it is ready
+  std::string socket_path;  // at which it listens once it is ready; "" when it is not spoken to
   bool wanted = false;      // started without being asked
   std::vector<std::string> arguments{};
 };

@@ -1,8 +1,6 @@
 #include "fileindex/util/custom_event.h"
 
 #include <fcntl.h>
-#include <sys/stat.h>
-#include <unistd.h>
 
 #include <cerrno>
 #include <cstring>
@@ -15,6 +13,7 @@
 #include "common/sdk/share.h"
 #include "common/unique_fd.h"
 #include "fileindex/config/status_mgr.h"
+#include "fileindex/queue/queue_append.h"
 #include "fileindex/queue/queue_mgr.h"
 #include "fileindex/util/util.h"
 #include "platform/include/service.h"
@@ -37,32 +36,16 @@ std::string EventText(int event, const std::string& full_path, const std::string
   return toString(line);
 }
 
-// Whether the file's last line lacks its end, as a writer that was killed leaves it.
-bool IsLastLineTorn(int fd, off_t size) {
-  char last = '\n';
-  return size > 0 && pread(fd, &last, 1, size - 1) == 1 && last != '\n';
-}
-
-bool WriteAll(int fd, const std::string& text) {
-  size_t done = 0;
-  while (done < text.size()) {
-    const ssize_t count = write(fd, text.data() + done, text.size() - done);
-    if (count == 0 || (count < 0 && errno != EINTR)) return false;
-    if (count > 0) done += static_cast<size_t>(count);
-  }
-  return true;
-}
-
 // Appends `text` as a line of its own, all of it or nothing. The caller holds the queue's lock.
 void AppendLine(const std::string& queue_path, const std::string& text) {
   // A queue that cannot be opened loses the event without a word: callers count on that.
   const UniqueFd fd(open(queue_path.c_str(), O_RDWR | O_APPEND | O_CREAT | O_CLOEXEC, 0644));
-  struct stat before {};
-  if (!fd.valid() || fstat(fd.get(), &before) < 0) return;
-  const std::string lead = IsLastLineTorn(fd.get(), before.st_size) ? "\n" : "";
-  if (WriteAll(fd.get(), lead + text + "\n")) return;
+  if (!fd.valid()) return;
+  int cut_error = 0;
+  if (AppendLines(fd.get(), text + "\n", &cut_error)) return;
   const std::string reason = strerror(errno);
-  if (ftruncate(fd.get(), before.st_size) < 0) {
+  if (cut_error != 0) {
+    errno = cut_error;
     LogFailure(QUARRY_SITE("util"), "0 > ftruncate(fd, size)", queue_path);
   }
   throw Error(kErrorSystem, "write failed, reason=" + reason);

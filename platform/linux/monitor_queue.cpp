@@ -1,29 +1,19 @@
-// The registrations of the file-change monitor: one file for each application and queue in
-// RootedPath("/var/lib/quarry/monitor/"), named after both:
-//
-//   {"application": "fileindex", "type": 1, "queue": file,
-//    "config": [{"path": directory, "mask": bits, "ignore": [name, ...]}, ...]}
+// Registering with the file-change monitor; monitor_registry.h describes the files.
 
 #include <unistd.h>
 
-#include <algorithm>
 #include <cerrno>
 #include <filesystem>
 #include <string>
 
 #include "common/json.h"
-#include "common/paths.h"
 #include "platform/include/monitor.h"
 #include "platform/linux/durable_file.h"
+#include "platform/linux/monitor_registry.h"
 #include "platform/linux/path_name.h"
 
 namespace quarry::platform {
 namespace {
-
-const std::string& MonitorDirectory() {
-  static const std::string directory = RootedPath("/var/lib/quarry/monitor");
-  return directory;
-}
 
 bool IsApplicationName(const std::string& name) {
   return !name.empty() && name.size() <= 64 && name.front() != '.' &&
@@ -52,23 +42,6 @@ std::string FileFor(const std::string& queue_path, const std::string& applicatio
   return MonitorDirectory() + "/" + name + ".json";
 }
 
-// Whether it is a list of names; none is an empty one.
-bool IsNameList(const Json::Value& names) {
-  return names.isNull() ||
-         (names.isArray() && std::all_of(names.begin(), names.end(),
-                                         [](const Json::Value& name) { return name.isString(); }));
-}
-
-// Whether the entries are what the monitor can follow.
-bool IsConfig(const Json::Value& config) {
-  if (!config.isArray()) return false;
-  for (const Json::Value& entry : config) {
-    if (!entry.isObject() || !entry["path"].isString() || !entry["mask"].isIntegral()) return false;
-    if (!IsNameList(entry["ignore"])) return false;
-  }
-  return true;
-}
-
 bool RemoveDurably(const std::string& file) {
   const int before = errno;
   if (unlink(file.c_str()) == 0) return SyncDirectory(MonitorDirectory());
@@ -87,17 +60,20 @@ using namespace quarry::platform;
 bool MonitorQueue::Upsert(const MonitorQueue& queue, const std::string& application,
                           MonitorQueueType type) {
   const Json::Value& config = queue.Config();
-  if (!config.isObject() || !config["queue"].isString() || !IsConfig(config["config"])) {
-    errno = EINVAL;
-    return false;
-  }
-  const std::string file = FileFor(config["queue"].asString(), application);
-  if (file.empty()) return false;
   Json::Value document;
   document["application"] = application;
   document["type"] = static_cast<int>(type);
-  document["queue"] = config["queue"];
-  document["config"] = config["config"];
+  if (config.isObject()) {
+    document["queue"] = config["queue"];
+    document["config"] = config["config"];
+  }
+  MonitorRegistration registration;
+  if (!ParseRegistration(document, &registration)) {
+    errno = EINVAL;
+    return false;
+  }
+  const std::string file = FileFor(registration.queue, application);
+  if (file.empty()) return false;
   return MakeDirectories(MonitorDirectory(), 0750) &&
          WriteFileDurably(file, quarry::toString(document) + "\n");
 }

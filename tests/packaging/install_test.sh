@@ -76,7 +76,7 @@ check_documents() {
 # The installed supervisor brings up the installed engine, in a private system.
 run_system() {
   local programs=$1 name
-  for name in quarry tarnelasticd tarncontentextractd fileindexd; do
+  for name in quarry tarnelasticd tarncontentextractd fileindexd tarnotifyd; do
     [ -x "$programs/$name" ] || fail "$name is not installed beside quarry"
   done
   grep -qx "ExecStart=$programs/fileindexd" "$(place_of "$prefix" fileindexd.service)/fileindexd.service" ||

@@ -56,7 +56,7 @@ has_options "$pages/quarry.1" "$programs/quarry"
 while read -ra command; do
   has_options "$pages/quarry.1" "$programs/quarry" "${command[@]}"
 done <<<"$all"
-for daemon in tarnelasticd tarncontentextractd fileindexd; do
+for daemon in tarnelasticd tarncontentextractd fileindexd tarnotifyd; do
   has_options "$pages/$daemon.8" "$programs/$daemon"
 done
 

@@ -52,6 +52,12 @@ void RunningSystem::Kill() {
   supervisor_.reset();
 }
 
+void RunningSystem::StopMonitor() {
+  Json::Value monitor;
+  monitor["service"] = "tarnotifyd";
+  cli::AskSupervisor("stop", monitor);
+}
+
 Ran RunningSystem::Quarry(const std::vector<std::string>& arguments) const {
   const std::string output = scratch_ / "output";
   Unlink(output);

@@ -37,6 +37,9 @@ class RunningSystem {
   // The program that is tested.
   static std::string Program();
 
+  // Ends the change monitor, for tests of what is found without it.
+  static void StopMonitor();
+
   // Runs quarry to its end, at most a minute.
   Ran Quarry(const std::vector<std::string>& arguments) const;
   // Runs it and kills it after so many milliseconds, unless it has ended before.

@@ -31,6 +31,8 @@ class ShareMovesTest : public testing::Test {
     Run({"folder", "add", "/docs"});
     ASSERT_TRUE(system_.WaitUntilIdle());
     ASSERT_EQ(Found("capybara"), kFiles);
+    // The monitor would tell of what follows, and have it read.
+    RunningSystem::StopMonitor();
     for (int i = 0; i < kFiles; ++i) Disguise(Path(i, docs_));
   }
   void TearDown() override { system_.Stop(); }

@@ -315,14 +315,15 @@ TEST_F(CustomEventTest, AQueueThatCannotBeOpenedLosesTheEventSilently) {
   EXPECT_EQ(Status(), 0);
 }
 
-TEST_F(CustomEventTest, AQueueThatCannotBeAskedForItsSizeLosesTheEventSilently) {
+TEST_F(CustomEventTest, AQueueThatCannotBeAskedForItsSizeIsAFailureToAppend) {
   SetQueue("");
   // The lock asks first.
   fake::FailSystemCall("fstat", 2, EIO);
-  AddModest();
+  EXPECT_EQ(Thrown(AddModest).code(), 502);
   EXPECT_EQ(Queue(), "");
-  EXPECT_THAT(fake::Logs(), IsEmpty());
-  EXPECT_EQ(Status(), 0);
+  const std::string reason = std::string("write failed, reason=") + strerror(EIO);
+  EXPECT_EQ(fake::AnyLine(fake::Logs().at(0)),
+            FailureLine(502, reason) + " [err: " + strerror(EIO) + "]");
 }
 
 TEST_F(CustomEventTest, AnEndThatCannotBeReadCountsAsTheEndOfALine) {
