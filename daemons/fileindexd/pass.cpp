@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <memory>
 
+#include "daemons/common/log.h"
 #include "daemons/fileindexd/rename_chain.h"
 #include "fileindex/queue/queue_mgr.h"
 
@@ -28,6 +29,15 @@ bool IsWalk(const std::shared_ptr<OP>& op) {
   return op->op == fileindex::OP_REINDEX || op->op == fileindex::OP_UPDATE_CFG || IsFullReindex(op);
 }
 
+// Nobody knows what a line told of that cannot be read: only the whole share is sure to hold it.
+bool HasLostLines(const QueueMgr& queue, const std::string& queue_path) {
+  const std::size_t lines = queue.SkippedLines();
+  if (lines == 0) return false;
+  daemon::LogWarning("The queue " + queue_path + " has lines that cannot be read: " +
+                     std::to_string(lines) + "; comparing the whole share");
+  return true;
+}
+
 class Pass {
  public:
   explicit Pass(const PassSetup& setup)
@@ -48,11 +58,16 @@ class Pass {
     setup_.aside.BeginPass(setup_.index.CanRead());
     QueueMgr queue(setup_.queue_path);
     Operations operations = TakeOperations(queue);
-    full = full || std::any_of(operations.begin(), operations.end(), IsFullReindex);
+    full = full || HasLostLines(queue, setup_.queue_path) ||
+           std::any_of(operations.begin(), operations.end(), IsFullReindex);
     // Comparing the whole share includes all smaller walks.
     if (full) std::erase_if(operations, IsWalk);
     Do(operations);
-    if (full) handler_.HandleFullReindex();
+    if (full) {
+      handler_.HandleFullReindex();
+    } else {
+      handler_.RefreshParents();
+    }
     lane_.Drain();
     setup_.index.Commit();
     if (full && handler_.RemoveOrphans()) {

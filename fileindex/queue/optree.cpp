@@ -142,6 +142,7 @@ void OPTree::InsertLine(const std::string& line) {
   try {
     InsertEvent(std::make_shared<Event>(line));
   } catch (const Error& error) {
+    ++skipped_lines_;
     LogError(LogSite{"optree.cpp", __LINE__, "BuildTree"},
              "InsertEvent failed, event_raw=" + line +
                  ", code=" + std::to_string(static_cast<std::int32_t>(error.code())) +

@@ -119,6 +119,9 @@ class QUARRY_EXPORT OPTree {
   // constructor.
   void BuildTree();
 
+  // How many lines were skipped: what they told of, the tree does not.
+  std::size_t SkippedLines() const { return skipped_lines_; }
+
   // Folds one event into the tree. Throws Error 120 when one of its paths holds a NUL byte, and
   // when a configuration change cannot be merged because one of the two is neither an object nor
   // null. A rename that appends many records to a few costs time in proportion to both; BuildTree
@@ -172,6 +175,7 @@ class QUARRY_EXPORT OPTree {
 
   std::vector<OPNode*> unsettled_;  // nodes whose lists are not in order yet
   bool building_ = false;           // nobody looks at the lists yet
+  std::size_t skipped_lines_ = 0;
 };
 
 }  // namespace fileindex

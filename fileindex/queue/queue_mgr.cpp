@@ -133,11 +133,19 @@ std::int32_t QueueMgr::ProcessOP(std::function<void(std::shared_ptr<OP>)> fn, bo
   return tree->ProcessOP(std::move(fn));
 }
 
+std::size_t QueueMgr::SkippedLines() const {
+  return op_tree_tmp_ ? op_tree_tmp_->SkippedLines() : 0;
+}
+
 bool QueueMgr::FindQueue(TornLine torn, const std::string& path, const Predicate& predicate) {
   if (!IsFileExist(path)) return false;
+  const int saved_errno = errno;
   QueueReader input(path);
   // The live queue may be renamed at any moment; then it is the snapshot that has its events.
-  if (input.failed() && errno == ENOENT) return false;
+  if (input.failed() && errno == ENOENT) {
+    errno = saved_errno;
+    return false;
+  }
   std::string line;
   while (input.Next(line)) {
     if (torn == TornLine::kIsNone && !input.line_ended() && !IsJson(line)) break;

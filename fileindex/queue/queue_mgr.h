@@ -4,6 +4,7 @@
 #ifndef QUARRY_FILEINDEX_QUEUE_QUEUE_MGR_H_
 #define QUARRY_FILEINDEX_QUEUE_QUEUE_MGR_H_
 
+#include <cstddef>
 #include <cstdint>
 #include <functional>
 #include <memory>
@@ -50,6 +51,10 @@ class QUARRY_EXPORT QueueMgr {
   // cancelled ones included; 0 when there is no queue. Deletes nothing. Throws what building the
   // tree and what `fn` throws.
   std::int32_t ProcessOP(std::function<void(std::shared_ptr<OP>)> fn, bool use_tmp);
+
+  // How many lines of the snapshot whose operations were handed out were skipped, because they are
+  // no events or could not be folded; 0 while none was. Nobody knows what they told of.
+  std::size_t SkippedLines() const;
 
   // The three questions below read the live queue and then the snapshot, and throw Error 502 when
   // one cannot be read and what Event throws for a malformed line that is met before the answer.

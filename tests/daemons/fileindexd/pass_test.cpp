@@ -143,7 +143,39 @@ TEST_F(PassTest, GarbageInTheQueueStopsNothing) {
   disk_.WriteFile("/v/s/a.txt");
   test::WriteFile(QueuePath(), "\xff\xfe{]\n\n{\"event\":2}\nnull\n[1]\n");
   Queue(EVENT_CREATE, "/v/s/a.txt");
-  EXPECT_THAT(CommandsOf(), ElementsAre("upsert /v/s/a.txt content"));
+  EXPECT_EQ(PassResult::kDone, Run());
+  EXPECT_EQ(1U, index_.All().count("/v/s/a.txt"));
+  EXPECT_FALSE(HasSnapshot());
+}
+
+// What a lost line told of is found by comparing, which is done once.
+TEST_F(PassTest, WhatGarbageInTheQueueMeantIsFound) {
+  for (const std::string& torn :
+       {std::string("garbage\n"), std::string(R"({"event":64,"path":"/v)"),
+        std::string("{\"event\":64,\"path\":\"/v/s/\\u0000\"}\n")}) {
+    disk_.Remove("/v/s");
+    disk_.WriteFile("/v/s/told.txt");
+    disk_.WriteFile("/v/s/d/untold.txt");
+    Queue(EVENT_CREATE, "/v/s/told.txt");
+    test::WriteFile(QueuePath(), test::ReadFile(QueuePath()) + torn);
+    EXPECT_EQ(PassResult::kDone, Run());
+    ExpectInLine();
+    disk_.WriteFile("/v/s/told.txt");
+    Queue(EVENT_MODIFY, "/v/s/told.txt");
+    EXPECT_THAT(CommandsOf(), ElementsAre("upsert /v/s/told.txt content"));
+  }
+}
+
+TEST_F(PassTest, GarbageIsKeptUntilWhatItMeantIsCommitted) {
+  disk_.WriteFile("/v/s/untold.txt");
+  test::WriteFile(QueuePath(), "garbage\n");
+  FailCall(3, Error(kErrorNoSpace, "full"));
+  EXPECT_THROW(Run(), Error);
+  index_.SetHook(nullptr);
+  index_.Restart();
+  EXPECT_TRUE(HasSnapshot());
+  Run();
+  ExpectInLine();
   EXPECT_FALSE(HasSnapshot());
 }
 

@@ -196,6 +196,14 @@ TEST_F(QueueMgrTest, OverflowIsOneFullReindex) {
   EXPECT_EQ(count, 1);
 }
 
+TEST_F(QueueMgrTest, LinesThatWereSkippedAreCounted) {
+  QueueMgr queue(live_);
+  EXPECT_EQ(0U, queue.SkippedLines());
+  WriteLive("rubbish\n" + Line(EVENT_MODIFY, "/s/a") + "\n{\"event\":2");
+  EXPECT_EQ(1, queue.ProcessOP([](const std::shared_ptr<OP>&) {}, true));
+  EXPECT_EQ(3U, queue.SkippedLines());
+}
+
 TEST_F(QueueMgrTest, FailureWhileProcessingKeepsTheSnapshot) {
   WriteLive(Line(EVENT_MODIFY, "/a"));
   EXPECT_EQ(Refusal([this] {
@@ -413,8 +421,11 @@ TEST_F(QuestionTest, QueueThatIsRenamedMeanwhileIsAskedAsTheSnapshot) {
   fake::OnSystemCall("open", [this, &renamed] {
     if (!std::exchange(renamed, true)) rename(live_.c_str(), tmp_.c_str());
   });
+  errno = EBADF;
   EXPECT_TRUE(HasReindex("/s/a"));
   EXPECT_TRUE(renamed);
+  // Else a line that is logged next would end in what is no failure.
+  EXPECT_EQ(EBADF, errno);
 }
 
 TEST_F(QuestionTest, QuestionsLeaveTheFilesAlone) {
