@@ -41,6 +41,13 @@ void OperationHandler::Handle(const Operation& operation) {
     daemon::LogWarning("Ignoring an operation on a place that cannot be: " + operation.path);
     return;
   }
+  HandlePlace(operation, path);
+  if (operation.kind == OP_ATTR) return;
+  parents_.insert(Dirname(path));
+  if (!operation.old_path.empty()) parents_.insert(Dirname(Canonical(operation.old_path)));
+}
+
+void OperationHandler::HandlePlace(const Operation& operation, const std::string& path) {
   switch (operation.kind) {
     case OP_DELETE:
     case OP_INDEX:
@@ -56,6 +63,26 @@ void OperationHandler::Handle(const Operation& operation) {
     case OP_NONE:
       return;
   }
+}
+
+void OperationHandler::RefreshParents() {
+  for (const std::string& path : parents_) {
+    tools_.gate.Pass();
+    RefreshDirectory(path);
+  }
+  parents_.clear();
+}
+
+void OperationHandler::RefreshDirectory(const std::string& path) {
+  const Finding finding = tools_.survey.Examine(path);
+  if (finding.verdict != Verdict::kWanted || finding.place.kind != PlaceKind::kDirectory) return;
+  tools_.lane.Settle(path);
+  tools_.aside.Try(path, [&] {
+    const std::optional<Document> document = tools_.index.Find(path);
+    // One that is not there yet comes with an event of its own.
+    if (!IsOfKind(document, PlaceKind::kDirectory)) return;
+    reconciler_.Bring(path, finding.place, document);
+  });
 }
 
 // Whether the line spoke of a deletion or of a change: what is there now is indexed, what is not

@@ -3,6 +3,7 @@
 #ifndef QUARRY_DAEMONS_FILEINDEXD_OPERATION_HANDLER_H_
 #define QUARRY_DAEMONS_FILEINDEXD_OPERATION_HANDLER_H_
 
+#include <set>
 #include <string>
 #include <utility>
 #include <vector>
@@ -33,6 +34,11 @@ class OperationHandler {
   // what only has to be moved.
   void MoveRenamed(const Operation& rename);
 
+  // After the last operation: brings the attributes of the directories that the handled ones have
+  // changed, of which no event tells, in line with the disk. A walk over the whole share does so
+  // too.
+  void RefreshParents();
+
   // Brings the whole share in line with the disk, documents of no folder included.
   void HandleFullReindex();
 
@@ -41,6 +47,8 @@ class OperationHandler {
   bool RemoveOrphans();
 
  private:
+  void HandlePlace(const Operation& operation, const std::string& path);
+  void RefreshDirectory(const std::string& path);
   void HandleIndex(const std::string& path);
   void HandleAttributes(const std::string& path);
   void MoveRenamed(const std::string& new_path, const std::string& old_path);
@@ -52,6 +60,7 @@ class OperationHandler {
   PassTools tools_;
   Reconciler reconciler_;
   const std::string share_root_;
+  std::set<std::string> parents_;  // of what was created, deleted or renamed
 };
 
 }  // namespace quarry::fileindexd

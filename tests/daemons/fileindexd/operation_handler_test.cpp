@@ -99,6 +99,45 @@ TEST_F(OperationHandlerTest, AFileThatCannotBeReadAtAllStopsNothing) {
   EXPECT_FALSE(HasSnapshot());
 }
 
+// The directory of what is created, deleted or renamed.
+
+TEST_F(OperationHandlerTest, WhatChangesInADirectoryChangesItsAttributesOnce) {
+  disk_.WriteFile("/v/s/d/a.txt");
+  disk_.WriteFile("/v/s/d/b.txt");
+  Run(true);
+  disk_.Remove("/v/s/d/a.txt");
+  disk_.WriteFile("/v/s/d/c.txt");
+  Queue(EVENT_DELETE, "/v/s/d/a.txt");
+  Queue(EVENT_CREATE, "/v/s/d/c.txt");
+  EXPECT_THAT(CommandsOf(), ElementsAre("delete below /v/s/d/a.txt", "delete /v/s/d/a.txt",
+                                        "upsert /v/s/d/c.txt content", "attributes /v/s/d"));
+  ExpectInLine();
+}
+
+TEST_F(OperationHandlerTest, AMoveChangesBothDirectories) {
+  disk_.WriteFile("/v/s/from/a.txt");
+  disk_.AddDir("/v/s/to");
+  Run(true);
+  disk_.Rename("/v/s/from/a.txt", "/v/s/to/a.txt");
+  Queue(EVENT_RENAME, "/v/s/to/a.txt", false, "/v/s/from/a.txt");
+  Run();
+  ExpectInLine();
+}
+
+TEST_F(OperationHandlerTest, ADirectoryThatDidNotChangeStaysAsItIs) {
+  disk_.WriteFile("/v/s/a.txt");
+  Run(true);
+  disk_.WriteFile("/v/s/a.txt");
+  Queue(EVENT_MODIFY, "/v/s/a.txt");
+  EXPECT_THAT(CommandsOf(), ElementsAre("upsert /v/s/a.txt content"));
+}
+
+TEST_F(OperationHandlerTest, ADirectoryThatTheIndexDoesNotHaveComesWithItsOwnEvent) {
+  disk_.WriteFile("/v/s/d/a.txt");
+  Queue(EVENT_CREATE, "/v/s/d/a.txt");
+  EXPECT_THAT(CommandsOf(), ElementsAre("upsert /v/s/d/a.txt content"));
+}
+
 // What is not indexed.
 
 TEST_F(OperationHandlerTest, PlacesThatAreNotWantedAreRemoved) {
@@ -223,9 +262,10 @@ TEST_F(OperationHandlerTest, RenameMovesTheDocument) {
   Run(true);
   disk_.Rename("/v/s/a.txt", "/v/s/b.txt");
   Queue(EVENT_RENAME, "/v/s/b.txt", false, "/v/s/a.txt");
-  EXPECT_THAT(CommandsOf(), ElementsAre("delete below /v/s/b.txt", "delete /v/s/b.txt",
-                                        "rename /v/s/a.txt /v/s/b.txt", "delete below /v/s/a.txt",
-                                        "delete /v/s/a.txt", "attributes /v/s/b.txt"));
+  EXPECT_THAT(CommandsOf(),
+              ElementsAre("delete below /v/s/b.txt", "delete /v/s/b.txt",
+                          "rename /v/s/a.txt /v/s/b.txt", "delete below /v/s/a.txt",
+                          "delete /v/s/a.txt", "attributes /v/s/b.txt", "attributes /v/s"));
 }
 
 TEST_F(OperationHandlerTest, RenameToAnotherExtensionReadsTheFileAgain) {
@@ -241,9 +281,9 @@ TEST_F(OperationHandlerTest, RenameOfADirectoryMovesDocumentsWithoutReadingOne) 
   Run(true);
   disk_.Rename("/v/s/d", "/v/s/f");
   Queue(EVENT_RENAME, "/v/s/f", true, "/v/s/d");
-  EXPECT_THAT(CommandsOf(),
-              ElementsAre("delete below /v/s/f", "delete /v/s/f", "rename /v/s/d /v/s/f",
-                          "delete below /v/s/d", "delete /v/s/d", "attributes /v/s/f"));
+  EXPECT_THAT(CommandsOf(), ElementsAre("delete below /v/s/f", "delete /v/s/f",
+                                        "rename /v/s/d /v/s/f", "delete below /v/s/d",
+                                        "delete /v/s/d", "attributes /v/s/f", "attributes /v/s"));
   EXPECT_EQ(103U, index_.All().size());
 }
 

@@ -44,7 +44,8 @@ TEST_F(WorkerTest, TakesTheQueueOnlyWhenItHasLines) {
   EXPECT_TRUE(IsAtRest());
   disk_.WriteFile("/v/s/a.txt");
   Queue(EVENT_CREATE, "/v/s/a.txt");
-  EXPECT_THAT(CommandsOfStep(), ::testing::ElementsAre("upsert /v/s/a.txt content"));
+  EXPECT_THAT(CommandsOfStep(),
+              ::testing::ElementsAre("upsert /v/s/a.txt content", "attributes /v/s"));
 }
 
 TEST_F(WorkerTest, FindsTheSnapshotOfAnEarlierLife) {
@@ -486,8 +487,9 @@ TEST_F(WorkerTest, AFileThatChangesAllTheTimeKeepsNoOtherWaiting) {
     const std::string path = "/v/s/" + std::to_string(i) + ".txt";
     disk_.WriteFile(path);
     Queue(EVENT_CREATE, path);
-    EXPECT_THAT(CommandsOfStep(), ::testing::ElementsAre("upsert /v/s/hot.log content",
-                                                         "upsert " + path + " content"));
+    EXPECT_THAT(CommandsOfStep(),
+                ::testing::ElementsAre("upsert /v/s/hot.log content", "upsert " + path + " content",
+                                       "attributes /v/s"));
   }
 }
 
