@@ -3,7 +3,9 @@
 #ifndef QUARRY_DAEMONS_TARNOTIFYD_CHANGE_SOURCE_H_
 #define QUARRY_DAEMONS_TARNOTIFYD_CHANGE_SOURCE_H_
 
+#include <cstddef>
 #include <cstdint>
+#include <map>
 #include <string>
 #include <vector>
 
@@ -32,6 +34,14 @@ class ChangeSink {
   virtual void OnDoubt(const std::string& directory) = 0;
 };
 
+// How a source does at the moment.
+struct SourceReport {
+  std::size_t file_systems = 0;  // that are watched whole
+  std::size_t directories = 0;   // that are watched one by one
+  // Directories that SetDirectories() gave, in or at which something cannot be watched, and why.
+  std::map<std::string, std::string> unwatched;
+};
+
 // Single-threaded: all calls come from one thread.
 class ChangeSource {
  public:
@@ -53,6 +63,9 @@ class ChangeSource {
   // Looks again at directories that could not be watched, or whose file system came back. To be
   // called every second or so.
   virtual void Refresh(ChangeSink& sink) = 0;
+
+  // Adds to the report what is this source's.
+  virtual void Report(SourceReport* report) const = 0;
 };
 
 }  // namespace quarry::notify

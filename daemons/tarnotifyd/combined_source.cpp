@@ -49,6 +49,11 @@ void CombinedSource::Refresh(ChangeSink& sink) {
   second_->Refresh(sink);
 }
 
+void CombinedSource::Report(SourceReport* report) const {
+  first_->Report(report);
+  second_->Report(report);
+}
+
 void CombinedSource::Share(ChangeSink& sink) {
   Paths left = left_();
   if (left == told_ && ignore_ == told_ignore_) return;
@@ -57,9 +62,9 @@ void CombinedSource::Share(ChangeSink& sink) {
       daemon::LogInfo("Each directory below " + path + " is watched by itself");
     }
   }
+  second_->SetDirectories(left, ignore_, sink);
   told_ = std::move(left);
   told_ignore_ = ignore_;
-  second_->SetDirectories(told_, told_ignore_, sink);
 }
 
 }  // namespace quarry::notify

@@ -28,6 +28,7 @@ class CombinedSource : public ChangeSource {
                       const std::vector<std::string>& ignore, ChangeSink& sink) override;
   void Read(ChangeSink& sink) override;
   void Refresh(ChangeSink& sink) override;
+  void Report(SourceReport* report) const override;
 
  private:
   void Share(ChangeSink& sink);

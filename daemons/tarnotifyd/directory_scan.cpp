@@ -61,6 +61,10 @@ UniqueFd OpenInPieces(int start, const std::string& path, int flags, std::uint64
 
 }  // namespace
 
+bool IsGone(int error) {
+  return error == ENOENT || error == ENOTDIR || error == ELOOP;
+}
+
 UniqueFd OpenDirectory(const std::string& path) {
   return OpenInPieces(AT_FDCWD, path, O_PATH | O_NOFOLLOW, 0);
 }
@@ -75,18 +79,23 @@ UniqueFd OpenBelow(const std::string& top, const std::string& path, bool to_read
 
 bool Identify(int fd, DirectoryId* id) {
   struct statx status {};
-  if (statx(fd, "", AT_EMPTY_PATH, STATX_BASIC_STATS, &status) != 0) return false;
+  constexpr unsigned kWanted = STATX_BASIC_STATS | STATX_MNT_ID;
+  if (statx(fd, "", AT_EMPTY_PATH, kWanted, &status) != 0) return false;
   id->device = makedev(status.stx_dev_major, status.stx_dev_minor);
   id->inode = status.stx_ino;
   id->is_mount = (status.stx_attributes & STATX_ATTR_MOUNT_ROOT) != 0;
+  id->mount = (status.stx_mask & STATX_MNT_ID) != 0 ? status.stx_mnt_id : 0;
   return true;
 }
 
-void ForEachSubdirectory(UniqueFd fd, const std::function<void(const char* name)>& action) {
+bool ForEachSubdirectory(UniqueFd fd, const std::function<void(const char* name)>& action) {
   const std::unique_ptr<DIR, CloseDir> stream(fdopendir(fd.get()));
-  if (!stream) return;
+  if (!stream) return false;
   fd.Release();
-  while (const dirent* entry = readdir(stream.get())) {
+  while (true) {
+    errno = 0;
+    const dirent* entry = readdir(stream.get());
+    if (entry == nullptr) return errno == 0;
     if (!IsSelfOrParent(entry->d_name) && IsDirectory(dirfd(stream.get()), *entry)) {
       action(entry->d_name);
     }

@@ -5,6 +5,7 @@
 
 #include <sys/types.h>
 
+#include <cstdint>
 #include <functional>
 #include <string>
 
@@ -17,9 +18,14 @@ struct DirectoryId {
   dev_t device = 0;
   ino_t inode = 0;
   bool is_mount = false;  // something is mounted at the path
+  // Of the mount by which it was reached; 0 where the kernel does not tell.
+  std::uint64_t mount = 0;
 
   bool operator==(const DirectoryId&) const = default;
 };
+
+// Whether an error of opening says that there is no directory at the path.
+bool IsGone(int error);
 
 // Opens a directory, no matter how long its path is; its last component is no symbolic link.
 // Without a descriptor errno says why.
@@ -33,8 +39,9 @@ UniqueFd OpenBelow(const std::string& top, const std::string& path, bool to_read
 bool Identify(int fd, DirectoryId* id);
 
 // Calls with the name of each directory in the one that `fd`, which must not be used otherwise
-// afterwards, is open on. Symbolic links are not followed.
-void ForEachSubdirectory(UniqueFd fd, const std::function<void(const char* name)>& action);
+// afterwards, is open on. Symbolic links are not followed. False with errno set when there may be
+// more of them than could be read.
+bool ForEachSubdirectory(UniqueFd fd, const std::function<void(const char* name)>& action);
 
 }  // namespace quarry::notify
 

@@ -55,6 +55,10 @@ void FanotifySource::Refresh(ChangeSink& sink) {
   Check(sink);
 }
 
+void FanotifySource::Report(SourceReport* report) const {
+  report->file_systems += file_systems_.size();
+}
+
 // Brings the watches in line with what is to be watched.
 void FanotifySource::Arrange(ChangeSink& sink) {
   const std::vector<std::string> wanted = WantedPaths();

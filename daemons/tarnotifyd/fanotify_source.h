@@ -37,6 +37,7 @@ class FanotifySource : public ChangeSource {
                       const std::vector<std::string>& ignore, ChangeSink& sink) override;
   void Read(ChangeSink& sink) override;
   void Refresh(ChangeSink& sink) override;
+  void Report(SourceReport* report) const override;
 
   // Directories, or mount points within them, whose file system does not tell its changes in this
   // way, sorted: another source has to watch them, and has to tell the doubt with which that

@@ -5,10 +5,13 @@
 #include <sys/timerfd.h>
 
 #include <algorithm>
+#include <cerrno>
+#include <set>
 #include <string_view>
 #include <utility>
 
 #include "common/error.h"
+#include "common/file_util.h"
 #include "daemons/common/log.h"
 #include "daemons/common/system_error.h"
 #include "fileindex/queue/event.h"
@@ -19,6 +22,7 @@ namespace {
 using namespace fileindex;
 
 constexpr int kEventsAtATime = 4096;
+constexpr std::chrono::minutes kRestartPause{1};
 
 Change MakeChange(std::uint32_t kind, const InotifyEvent& event, std::string path) {
   const bool in_progress = (event.mask & (IN_MODIFY | IN_CLOSE_WRITE)) == IN_MODIFY;
@@ -45,6 +49,7 @@ InotifySource::InotifySource()
   if (!timer_.valid() || !poll_fd_.valid() || !notify::Watch(poll_fd_.get(), timer_.get())) {
     daemon::ThrowSystemError("Cannot wait for inotify");
   }
+  mounted_ = mounts_.Read();
   Restart();
 }
 
@@ -58,6 +63,16 @@ void InotifySource::Restart() {
     daemon::ThrowSystemError("Cannot wait for inotify");
   }
   watches_ = std::move(watches);
+}
+
+// What is watched is doubtful once it is watched again, and what is not there any more at once.
+void InotifySource::BeginAnew(ChangeSink& sink) {
+  const std::map<std::string, Root> before = roots_;
+  Restart();
+  FollowRoots(sink);
+  for (const auto& [path, root] : before) {
+    if (roots_.count(path) == 0) sink.OnDoubt(path);
+  }
 }
 
 void InotifySource::ArmTimer() {
@@ -79,8 +94,7 @@ void InotifySource::Read(ChangeSink& sink) {
   events_.Fill(watches_->Descriptor(), Clock::now());
   if (!HandleEvents(sink)) {
     daemon::LogWarning("The kernel has lost events; looking at everything anew");
-    Restart();
-    FollowRoots(sink);
+    BeginAnew(sink);
   }
   watches_->Work(sink);
   ArmTimer();
@@ -222,9 +236,12 @@ void InotifySource::SetDirectories(const std::vector<std::string>& directories,
   std::unordered_set<std::string> ignored(ignore.begin(), ignore.end());
   const bool same_ignored = ignored == ignore_;
   ignore_ = std::move(ignored);
-  if (!same_ignored || !watches_) Restart();
   DoubtCovered(before, sink);
-  FollowRoots(sink);
+  if (same_ignored && watches_) {
+    FollowRoots(sink);
+  } else {
+    BeginAnew(sink);
+  }
   ArmTimer();
 }
 
@@ -251,10 +268,28 @@ bool InotifySource::IsWanted(const std::string& path) const {
 }
 
 void InotifySource::Refresh(ChangeSink& sink) {
-  if (!watches_) Restart();
+  if (!watches_ && !TakeInstance()) return;
   FollowRoots(sink);
+  FollowMounts();
   watches_->Retry(Clock::now(), sink);
   ArmTimer();
+}
+
+// A failure puts everything in doubt, so there is not one every second.
+bool InotifySource::TakeInstance() {
+  const auto now = Clock::now();
+  if (now < next_restart_) return false;
+  next_restart_ = now + kRestartPause;
+  Restart();
+  return true;
+}
+
+void InotifySource::Report(SourceReport* report) const {
+  report->directories += Directories();
+  if (watches_) return watches_->ReportUnwatched(&report->unwatched);
+  for (const std::string& path : directories_) {
+    report->unwatched.emplace(path, "the system gives no instance of inotify");
+  }
 }
 
 void InotifySource::FollowRoots(ChangeSink& sink) {
@@ -270,21 +305,46 @@ void InotifySource::FollowRoots(ChangeSink& sink) {
 void InotifySource::FollowRoot(const std::string& path, ChangeSink& sink) {
   DirectoryId now;
   const bool exists = IdentifyPath(path, &now);
-  const bool is_wanted = exists && (IsWanted(path) || now.is_mount);
+  if (!exists && !IsGone(errno)) return;  // for want of descriptors, for instance
+  const bool is_wanted = exists && (IsWanted(path) || (now.is_mount && IsMountPoint(path)));
   const auto root = roots_.find(path);
-  if (root != roots_.end()) {
+  const bool is_known = root != roots_.end();
+  if (is_known) {
     if (is_wanted && IsAsWatched(root->second, now)) return;
     DropRoot(path);
     if (!exists) sink.OnChange({EVENT_DELETE, true, false, path, ""});
   }
-  if (!is_wanted) return;
-  roots_[path] = {watches_->tree().RefTo(watches_->AddRoot(path)), now};
+  if (is_wanted) roots_[path] = {watches_->tree().RefTo(watches_->AddRoot(path)), now};
+  // A part of another one, from now on or until now.
+  if (is_known != is_wanted) FollowMount(path);
 }
 
 bool InotifySource::IsAsWatched(const Root& root, const DirectoryId& now) const {
   const Id directory = root.directory.id;
   return root.id == now &&
          (watches_->tree().Watch(directory) >= 0 || watches_->IsWaiting(directory));
+}
+
+// Of what was there and what is there now, since the same path may have another mount by now.
+void InotifySource::FollowMounts() {
+  if (mounts_.HasChanged()) mounts_changed_ = true;  // which it says only once
+  if (!mounts_changed_) return;
+  std::set<std::string> paths;
+  for (const Mount& mount : mounted_) paths.insert(mount.path);
+  mounted_ = mounts_.Read();
+  for (const Mount& mount : mounted_) paths.insert(mount.path);
+  mounts_changed_ = false;
+  for (const std::string& path : paths) FollowMount(path);
+}
+
+// Roots are looked at all the time; this is about what is below them.
+void InotifySource::FollowMount(const std::string& path) {
+  for (const auto& [top, root] : roots_) {
+    const Id directory = watches_->tree().Descendant(root.directory.id, path);
+    if (directory != root.directory.id && directory != WatchTree::kNone) {
+      watches_->CheckMount(directory);
+    }
+  }
 }
 
 void InotifySource::DropRoot(const std::string& path) {

@@ -15,12 +15,14 @@
 #include "daemons/tarnotifyd/directory_scan.h"
 #include "daemons/tarnotifyd/inotify_events.h"
 #include "daemons/tarnotifyd/inotify_watches.h"
+#include "daemons/tarnotifyd/mount_table.h"
 
 namespace quarry::notify {
 
 // A directory that appears is told as created once all that was in it is watched, and stands for
 // everything in it; what appears there later is told itself. Nothing is told of ignored names. When
-// the kernel has lost events everything is watched anew, and told as doubtful.
+// the kernel has lost events everything is watched anew, and told as doubtful; so is a directory on
+// which something is mounted or unmounted.
 class InotifySource : public ChangeSource {
  public:
   // Throws Error 502 when the system gives no instance of inotify.
@@ -31,6 +33,7 @@ class InotifySource : public ChangeSource {
                       const std::vector<std::string>& ignore, ChangeSink& sink) override;
   void Read(ChangeSink& sink) override;
   void Refresh(ChangeSink& sink) override;
+  void Report(SourceReport* report) const override;
 
   // How many directories are known.
   std::size_t Directories() const { return watches_ ? watches_->tree().size() : 0; }
@@ -44,6 +47,8 @@ class InotifySource : public ChangeSource {
   };
 
   void Restart();
+  void BeginAnew(ChangeSink& sink);
+  bool TakeInstance();
   void ArmTimer();
 
   bool HandleEvents(ChangeSink& sink);
@@ -67,6 +72,8 @@ class InotifySource : public ChangeSource {
   void FollowRoot(const std::string& path, ChangeSink& sink);
   bool IsAsWatched(const Root& root, const DirectoryId& now) const;
   void DropRoot(const std::string& path);
+  void FollowMounts();
+  void FollowMount(const std::string& path);
   void DoubtCovered(const std::vector<std::string>& before, ChangeSink& sink) const;
 
   UniqueFd timer_;    // readable when something is left to do without an event
@@ -76,6 +83,10 @@ class InotifySource : public ChangeSource {
   std::unique_ptr<InotifyWatches> watches_;  // none while the system gives no instance
   std::vector<std::string> directories_;     // that are to be watched, sorted
   std::map<std::string, Root> roots_;        // that are watched by themselves, by path
+  MountTable mounts_;
+  std::vector<Mount> mounted_;   // when it was looked last
+  bool mounts_changed_ = false;  // since then
+  Clock::time_point next_restart_{};
 };
 
 }  // namespace quarry::notify

@@ -5,7 +5,6 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
-#include <set>
 #include <utility>
 
 #include "common/file_util.h"
@@ -19,7 +18,8 @@ namespace {
 using std::chrono::milliseconds;
 
 constexpr std::uint32_t kEvents = IN_CREATE | IN_DELETE | IN_MOVED_FROM | IN_MOVED_TO | IN_MODIFY |
-                                  IN_CLOSE_WRITE | IN_ATTRIB | IN_ONLYDIR | IN_EXCL_UNLINK;
+                                  IN_CLOSE_WRITE | IN_ATTRIB | IN_ONLYDIR | IN_EXCL_UNLINK |
+                                  IN_MASK_ADD;
 // What happens to other directories themselves is told by the one above.
 constexpr std::uint32_t kRootEvents = IN_DELETE_SELF | IN_MOVE_SELF;
 
@@ -29,9 +29,7 @@ constexpr milliseconds kFirstRetry{1'000};
 constexpr milliseconds kLongestRetry{60'000};
 constexpr std::chrono::minutes kDoubtEvery{10};
 
-bool IsGone(int error) {
-  return error == ENOENT || error == ENOTDIR || error == ELOOP;
-}
+constexpr char kLimitReached[] = "the limit fs.inotify.max_user_watches is reached";
 
 bool IsShortage(int error) {
   return error == ENOSPC || error == ENOMEM || error == EMFILE || error == ENFILE;
@@ -46,7 +44,7 @@ InotifyWatches::InotifyWatches(const std::unordered_set<std::string>& ignored)
 
 InotifyWatches::Id InotifyWatches::AddRoot(const std::string& path) {
   const Id root = tree_.AddRoot(path);
-  AddScan(root, NewJob(root, Outcome::kDoubtIfWatched));
+  AddScan(root, NewJob(root, Outcome::kDoubtIfNews));
   return root;
 }
 
@@ -66,19 +64,26 @@ void InotifyWatches::Check(Id directory, ChangeSink& sink) {
 }
 
 void InotifyWatches::CheckLater(Id directory) {
-  AddScan(directory, NewJob(directory, Outcome::kCreatedIfWatched));
+  AddScan(directory, NewJob(directory, Outcome::kCreatedIfNews));
+}
+
+void InotifyWatches::CheckMount(Id directory) {
+  AddScan(directory, NewJob(directory, Outcome::kDoubtIfNews));
 }
 
 void InotifyWatches::Remove(Id directory) {
   std::vector<int> watches;
+  if (tree_.Parent(directory) == WatchTree::kNone) unwatched_.erase(tree_.Path(directory));
   tree_.Remove(directory, &watches);
   Doom(watches);
 }
 
 void InotifyWatches::Lost(Id directory) {
   tree_.SetWatch(directory, -1);
-  // Of a root its owner finds it.
-  if (tree_.Parent(directory) != WatchTree::kNone) CheckLater(directory);
+  // Of a root its owner finds it. That of another one is news whatever is at its path now.
+  if (tree_.Parent(directory) != WatchTree::kNone) {
+    AddScan(directory, NewJob(directory, Outcome::kCreated));
+  }
 }
 
 void InotifyWatches::Doom(const std::vector<int>& watches) {
@@ -121,7 +126,7 @@ void InotifyWatches::DoLastScan(ChangeSink& sink) {
 void InotifyWatches::DoScan(const Scan& scan, ChangeSink& sink) {
   if (!tree_.IsAlive(scan.directory)) return;
   // One refusal is enough: a try costs as much as a success.
-  if (is_short_) return Starve(scan, ENOSPC, sink);
+  if (is_short_) return CannotWatch(scan, ENOSPC, sink);
   UniqueFd fd = Open(scan.directory.id, true);
   if (!fd.valid()) return CannotOpen(scan, errno, sink);
   Watch(scan, std::move(fd), sink);
@@ -131,7 +136,8 @@ void InotifyWatches::DoScan(const Scan& scan, ChangeSink& sink) {
 void InotifyWatches::Watch(const Scan& scan, UniqueFd fd, ChangeSink& sink) {
   const Id directory = scan.directory.id;
   DirectoryId id;
-  if (!Identify(fd.get(), &id) || !MayEnter(directory, id)) return;
+  if (!Identify(fd.get(), &id)) return CannotWatch(scan, errno, sink);
+  if (!MayEnter(directory, id)) return Cover(scan);
   const std::string self = "/proc/self/fd/" + std::to_string(fd.get());
   const bool is_root = tree_.Parent(directory) == WatchTree::kNone;
   const int watch =
@@ -139,15 +145,24 @@ void InotifyWatches::Watch(const Scan& scan, UniqueFd fd, ChangeSink& sink) {
   if (watch < 0) return CannotWatch(scan, errno, sink);
   // What is below it is known, or is just being listed.
   if (watch == tree_.Watch(directory)) return;
-  if (!TakeNumber(directory, watch, id)) return Miss(scan);
-  jobs_[scan.job].any_watched = true;
-  List(directory, std::move(fd), scan.job);
+  const Id twin = OtherWith(directory, watch, id);
+  if (twin != WatchTree::kNone) return MeetTwin(scan, twin, id, sink);
+  if (!TakeNumber(directory, watch)) return Miss(scan);
+  jobs_[scan.job].any_news = true;
+  List(scan, std::move(fd), sink);
 }
 
 // A directory that may not be read cannot be watched either, and nothing in it be indexed.
 void InotifyWatches::CannotOpen(const Scan& scan, int error, ChangeSink& sink) {
-  if (IsShortage(error)) return Starve(scan, error, sink);
-  if (IsGone(error)) Miss(scan);
+  if (IsGone(error)) return Miss(scan);
+  if (error != EACCES) CannotWatch(scan, error, sink);
+}
+
+// Something is mounted over it that is not part of the tree.
+void InotifyWatches::Cover(const Scan& scan) {
+  if (tree_.Watch(scan.directory.id) < 0 && !tree_.HasChildren(scan.directory.id)) return;
+  Strip(scan.directory.id);
+  jobs_[scan.job].any_news = true;
 }
 
 // It was there when the one above it, which is watched, was listed, or told of. So there are events
@@ -156,7 +171,7 @@ void InotifyWatches::Miss(const Scan& scan) {
   missing_.push_back(scan.directory);
   Job& job = jobs_[scan.job];
   if (job.top.id == scan.directory.id && job.outcome == Outcome::kCreated) {
-    job.outcome = Outcome::kCreatedIfWatched;
+    job.outcome = Outcome::kCreatedIfNews;
   }
 }
 
@@ -170,21 +185,20 @@ void InotifyWatches::LookForMissing() {
 }
 
 void InotifyWatches::CannotWatch(const Scan& scan, int error, ChangeSink& sink) {
-  if (IsShortage(error)) return Starve(scan, error, sink);
-  daemon::LogWarning("Cannot watch " + tree_.Path(scan.directory.id) + ": " + std::strerror(error));
+  if (IsShortage(error)) is_short_ = true;
+  if (error == ENOSPC) return Starve(scan, kLimitReached, sink);
+  Starve(scan, tree_.Path(scan.directory.id) + ": " + std::strerror(error), sink);
 }
 
-void InotifyWatches::Starve(const Scan& scan, int error, ChangeSink& sink) {
-  is_short_ = true;
+void InotifyWatches::Starve(const Scan& scan, const std::string& reason, ChangeSink& sink) {
   starved_.push_back(scan.directory);
-  if (was_short_) return;
-  was_short_ = true;
   const std::string root = tree_.Path(tree_.RootOf(scan.directory.id));
-  daemon::LogError("Not all directories below " + root + " can be watched: " +
-                   (error == ENOSPC ? "the limit fs.inotify.max_user_watches is reached"
-                                    : std::strerror(error)) +
+  if (unwatched_.empty()) next_doubt_ = Clock::now() + kDoubtEvery;
+  const auto [shortage, is_new] = unwatched_.try_emplace(root);
+  shortage->second = {reason, round_};
+  if (!is_new) return;
+  daemon::LogError("Not all directories below " + root + " can be watched: " + reason +
                    ". What changes in the others is found later");
-  next_doubt_ = Clock::now() + kDoubtEvery;
   sink.OnDoubt(root);
 }
 
@@ -193,13 +207,29 @@ bool InotifyWatches::MayEnter(Id directory, const DirectoryId& id) const {
          !IsMountPoint(tree_.Path(directory));
 }
 
-// Notes the number that the kernel has given to the directory. False when it is another
-// directory's that has not moved: mounted at two places, or found where it is only by a path that
-// is out of date.
-bool InotifyWatches::TakeNumber(Id directory, int watch, const DirectoryId& id) {
+// Which other directory has the number, and has not moved; kNone when there is none.
+InotifyWatches::Id InotifyWatches::OtherWith(Id directory, int watch, const DirectoryId& id) const {
+  const Id other = tree_.FindWatch(watch);
+  if (other == WatchTree::kNone || other == directory) return WatchTree::kNone;
+  const DirectoryId there = Identity(other);
+  return there.device == id.device && there.inode == id.inode ? other : WatchTree::kNone;
+}
+
+// It is mounted at two places, or was found where it is only by a path that is out of date. Events
+// will tell of the latter, but not of what a root is below.
+void InotifyWatches::MeetTwin(const Scan& scan, Id twin, const DirectoryId& id, ChangeSink& sink) {
+  const Id directory = scan.directory.id;
+  const bool is_root = tree_.Parent(directory) == WatchTree::kNone;
+  if (!is_root && Identity(twin).mount == id.mount) return Miss(scan);
+  Cover(scan);
+  Starve(scan, tree_.Path(directory) + " is the same directory as " + tree_.Path(twin), sink);
+}
+
+// Notes the number that the kernel has given to the directory, and takes it from the one that had
+// it. False when the directory is not known any more.
+bool InotifyWatches::TakeNumber(Id directory, int watch) {
   const Id other = tree_.FindWatch(watch);
   if (other != WatchTree::kNone) {
-    if (IsStillAt(other, id)) return false;
     const WatchTree::Ref self = tree_.RefTo(directory);
     Strip(other);
     if (tree_.Parent(other) != WatchTree::kNone) CheckLater(other);
@@ -222,11 +252,11 @@ bool InotifyWatches::IsThere(Id parent, const std::string& name) const {
   return OpenBelow(tree_.Path(tree_.RootOf(parent)), path, false).valid();
 }
 
-bool InotifyWatches::IsStillAt(Id directory, const DirectoryId& id) const {
+// Of what has its path now; of nothing the empty one.
+DirectoryId InotifyWatches::Identity(Id directory) const {
   const UniqueFd fd = Open(directory, false);
   DirectoryId there;
-  return fd.valid() && Identify(fd.get(), &there) && there.device == id.device &&
-         there.inode == id.inode;
+  return fd.valid() && Identify(fd.get(), &there) ? there : DirectoryId();
 }
 
 // What has the directory's path is another one than it was thought to be.
@@ -238,11 +268,16 @@ void InotifyWatches::Strip(Id directory) {
   Doom(watches);
 }
 
-void InotifyWatches::List(Id directory, UniqueFd fd, std::uint32_t job) {
-  ForEachSubdirectory(std::move(fd), [&](const char* name) {
+void InotifyWatches::List(const Scan& scan, UniqueFd fd, ChangeSink& sink) {
+  const Id directory = scan.directory.id;
+  const bool is_whole = ForEachSubdirectory(std::move(fd), [&](const char* name) {
     if (ignored_.count(name) > 0 || tree_.Child(directory, name) != WatchTree::kNone) return;
-    AddScan(tree_.AddChild(directory, name), job);
+    AddScan(tree_.AddChild(directory, name), scan.job);
   });
+  if (is_whole) return;
+  const int error = errno;
+  Strip(directory);
+  CannotWatch(scan, error, sink);
 }
 
 void InotifyWatches::EndScan(std::uint32_t job, ChangeSink& sink) {
@@ -252,8 +287,8 @@ void InotifyWatches::EndScan(std::uint32_t job, ChangeSink& sink) {
   jobs_.erase(found);
   if (!tree_.IsAlive(done.top)) return;
   const std::string path = tree_.Path(done.top.id);
-  if (done.outcome != Outcome::kCreated && !done.any_watched) return;
-  if (done.outcome == Outcome::kDoubtIfWatched) return sink.OnDoubt(path);
+  if (done.outcome != Outcome::kCreated && !done.any_news) return;
+  if (done.outcome == Outcome::kDoubtIfNews) return sink.OnDoubt(path);
   sink.OnChange({fileindex::EVENT_CREATE, true, false, path, ""});
 }
 
@@ -266,37 +301,37 @@ bool InotifyWatches::IsWaiting(Id directory) const {
                      [&](const Scan& scan) { return is_it(scan.directory); });
 }
 
-void InotifyWatches::DoubtStarved(ChangeSink& sink) const {
-  std::set<std::string> roots;
-  for (const WatchTree::Ref& directory : starved_) {
-    if (tree_.IsAlive(directory)) roots.insert(tree_.Path(tree_.RootOf(directory.id)));
-  }
-  for (const std::string& root : roots) sink.OnDoubt(root);
+void InotifyWatches::ReportUnwatched(std::map<std::string, std::string>* unwatched) const {
+  for (const auto& [root, shortage] : unwatched_) unwatched->emplace(root, shortage.reason);
+}
+
+// Nothing is being tried: what lacks something was seen to lack it in this round.
+void InotifyWatches::ForgetMended() {
+  const auto mended =
+      std::erase_if(unwatched_, [this](const auto& entry) { return entry.second.round != round_; });
+  if (!unwatched_.empty()) return;
+  pause_ = milliseconds(0);
+  if (mended > 0) daemon::LogInfo("All directories are watched");
 }
 
 void InotifyWatches::Retry(Clock::time_point now, ChangeSink& sink) {
-  if (starved_.empty()) {
-    if (was_short_ && scans_.empty()) {
-      daemon::LogInfo("All directories are watched");
-      was_short_ = is_short_ = false;
-      pause_ = milliseconds(0);
-    }
-    return;
-  }
+  if (scans_.empty()) ForgetMended();
+  if (starved_.empty()) return;
   if (now >= next_doubt_) {
     next_doubt_ = now + kDoubtEvery;
-    DoubtStarved(sink);
+    for (const auto& [root, shortage] : unwatched_) sink.OnDoubt(root);
   }
   if (now < next_retry_) return;
   pause_ = std::clamp(2 * pause_, kFirstRetry, kLongestRetry);
   next_retry_ = now + pause_;
   is_short_ = false;
+  ++round_;
   std::unordered_map<Id, std::uint32_t> job_of_root;
   for (const WatchTree::Ref& directory : std::exchange(starved_, {})) {
     if (!tree_.IsAlive(directory)) continue;
     const Id root = tree_.RootOf(directory.id);
     const auto [job, is_new] = job_of_root.try_emplace(root, 0);
-    if (is_new) job->second = NewJob(root, Outcome::kDoubtIfWatched);
+    if (is_new) job->second = NewJob(root, Outcome::kDoubtIfNews);
     AddScan(directory.id, job->second);
   }
 }

@@ -6,6 +6,7 @@
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
+#include <map>
 #include <string>
 #include <string_view>
 #include <unordered_map>
@@ -29,7 +30,8 @@ namespace quarry::notify {
 // out of date; that one is then looked at again.
 //
 // Symbolic links are not followed, and other file systems not entered unless the platform says that
-// they are part of the tree. One thread.
+// they are part of the tree. A directory that is seen at two places, because it is mounted at both,
+// is watched at one of them only. One thread.
 class InotifyWatches {
  public:
   using Id = WatchTree::Id;
@@ -56,6 +58,9 @@ class InotifyWatches {
   bool IsThere(Id parent, const std::string& name) const;
   // Ends the watching of a directory and all below it.
   void Remove(Id directory);
+  // Something was mounted or unmounted at the known directory, perhaps. If so it is told as
+  // doubtful once what is there now is watched.
+  void CheckMount(Id directory);
   // The kernel has ended the watch by itself.
   void Lost(Id directory);
 
@@ -70,9 +75,12 @@ class InotifyWatches {
   // Whether the directory itself is still to be watched.
   bool IsWaiting(Id directory) const;
 
-  // Tries again what the system had no watches for; places that stay unwatched are told as doubtful
-  // now and then. To be called every second or so.
+  // Tries again what could not be watched; places that stay unwatched are told as doubtful now and
+  // then. To be called every second or so.
   void Retry(Clock::time_point now, ChangeSink& sink);
+
+  // Adds the roots below which something cannot be watched, and why.
+  void ReportUnwatched(std::map<std::string, std::string>* unwatched) const;
 
  private:
   // A directory to watch, whose children are found by listing it.
@@ -83,13 +91,13 @@ class InotifyWatches {
   // What is told of the top directory when a number of scans is done.
   enum class Outcome {
     kCreated,
-    kCreatedIfWatched,  // if anything was watched that was not before
-    kDoubtIfWatched,
+    kCreatedIfNews,
+    kDoubtIfNews,
   };
   struct Job {
     WatchTree::Ref top;
     Outcome outcome = Outcome::kCreated;
-    bool any_watched = false;
+    bool any_news = false;  // something was watched that was not before, or is no more
     std::size_t left = 0;
   };
 
@@ -102,17 +110,20 @@ class InotifyWatches {
   void EndScan(std::uint32_t job, ChangeSink& sink);
   void CannotOpen(const Scan& scan, int error, ChangeSink& sink);
   void Miss(const Scan& scan);
+  void Cover(const Scan& scan);
+  void MeetTwin(const Scan& scan, Id twin, const DirectoryId& id, ChangeSink& sink);
   void CannotWatch(const Scan& scan, int error, ChangeSink& sink);
-  void Starve(const Scan& scan, int error, ChangeSink& sink);
+  void Starve(const Scan& scan, const std::string& reason, ChangeSink& sink);
   bool MayEnter(Id directory, const DirectoryId& id) const;
-  bool TakeNumber(Id directory, int watch, const DirectoryId& id);
+  Id OtherWith(Id directory, int watch, const DirectoryId& id) const;
+  bool TakeNumber(Id directory, int watch);
   UniqueFd Open(Id directory, bool to_read) const;
-  bool IsStillAt(Id directory, const DirectoryId& id) const;
+  DirectoryId Identity(Id directory) const;
   void Strip(Id directory);
-  void List(Id directory, UniqueFd fd, std::uint32_t job);
+  void List(const Scan& scan, UniqueFd fd, ChangeSink& sink);
   void Doom(const std::vector<int>& watches);
   void RemoveDoomed();
-  void DoubtStarved(ChangeSink& sink) const;
+  void ForgetMended();
 
   const std::unordered_set<std::string>& ignored_;
   UniqueFd inotify_;
@@ -124,9 +135,15 @@ class InotifyWatches {
   std::unordered_set<int> doomed_;
 
   std::vector<WatchTree::Ref> missing_;  // there was nothing at the paths of these
-  std::vector<WatchTree::Ref> starved_;  // the system has no watches for these
-  bool is_short_ = false;                // of watches, since the last Retry()
-  bool was_short_ = false;               // since it was last said
+  std::vector<WatchTree::Ref> starved_;  // these cannot be watched for now
+  // Roots below which there is such a one, why, and in which round of trying that was seen.
+  struct Shortage {
+    std::string reason;
+    std::uint64_t round = 0;
+  };
+  std::map<std::string, Shortage> unwatched_;
+  std::uint64_t round_ = 0;
+  bool is_short_ = false;  // of watches, since the last Retry()
   std::chrono::milliseconds pause_{0};
   Clock::time_point next_retry_{};
   Clock::time_point next_doubt_{};

@@ -110,6 +110,21 @@ WatchTree::Id WatchTree::Child(Id parent, std::string_view name) const {
   });
 }
 
+WatchTree::Id WatchTree::Descendant(Id root, std::string_view path) const {
+  const std::string& top = nodes_[root].name;
+  if (path.substr(0, top.size()) != top) return kNone;
+  path.remove_prefix(top.size());
+  Id id = root;
+  while (id != kNone && !path.empty()) {
+    if (path[0] != '/') return kNone;
+    path.remove_prefix(1);
+    const std::string_view name = path.substr(0, path.find('/'));
+    id = Child(id, name);
+    path.remove_prefix(name.size());
+  }
+  return id;
+}
+
 WatchTree::Id WatchTree::RootOf(Id id) const {
   while (nodes_[id].parent != kNone) id = nodes_[id].parent;
   return id;

@@ -69,10 +69,13 @@ class WatchTree {
   // There is no child of that name yet.
   Id AddChild(Id parent, std::string_view name);
   Id Child(Id parent, std::string_view name) const;
+  // The directory at the full path `path`, if it is known at or below `root`; else kNone.
+  Id Descendant(Id root, std::string_view path) const;
   // Of a root kNone.
   Id Parent(Id id) const { return nodes_[id].parent; }
   Id RootOf(Id id) const;
   bool IsAtOrBelow(Id id, Id above) const;
+  bool HasChildren(Id id) const { return nodes_[id].first_child != kNone; }
   std::string Path(Id id) const;
 
   // Gives the directory another place: not below itself, and one where no other is.

@@ -7,6 +7,7 @@
 
 #include <algorithm>
 #include <functional>
+#include <map>
 #include <string>
 #include <utility>
 #include <vector>
@@ -41,6 +42,10 @@ class FakeSource : public notify::ChangeSource {
     if (tell) tell(sink);
   }
   void Refresh(notify::ChangeSink&) override { ++refreshed_; }
+  void Report(notify::SourceReport* report) const override {
+    report->directories += directories_.size();
+    report->unwatched.insert(unwatched_.begin(), unwatched_.end());
+  }
 
   void Tell(const std::function<void(notify::ChangeSink&)>& tell) {
     tell_ = tell;
@@ -49,6 +54,7 @@ class FakeSource : public notify::ChangeSource {
 
   Names directories_;
   Names ignore_;
+  std::map<std::string, std::string> unwatched_;
   int refreshed_ = 0;
 
  private:
