@@ -116,8 +116,13 @@ class PrivateSystem:
         return self
 
     def __exit__(self, *_):
-        self.stop()
-        shutil.rmtree(self._top)
+        # Somebody who is in a hurry must not leave a system behind.
+        impatience = signal.signal(signal.SIGINT, signal.SIG_IGN)
+        try:
+            self.stop()
+        finally:
+            shutil.rmtree(self._top)
+            signal.signal(signal.SIGINT, impatience)
 
     def start(self):
         log = open(self._log, "ab")

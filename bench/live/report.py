@@ -2,6 +2,7 @@
 
 import argparse
 import os
+import signal
 import sys
 import time
 from pathlib import Path
@@ -51,10 +52,13 @@ def percentile(values, share):
 def run(check, options):
     """Runs the check; the exit code says whether all holds."""
     begun = time.monotonic()
+    signal.signal(signal.SIGTERM, signal.default_int_handler)
     try:
         failures = check(options)
     except CheckFailed as failure:
         failures = [str(failure)]
+    except KeyboardInterrupt:
+        failures = ["it was told to end early"]
     for failure in failures:
         print("FAILED:", failure)
     print(f"{'failed' if failures else 'all well'}, after {time.monotonic() - begun:.0f} s")
