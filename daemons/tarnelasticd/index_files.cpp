@@ -8,11 +8,13 @@
 #include <climits>
 #include <cstdio>
 #include <cstring>
+#include <ctime>
 #include <filesystem>
 #include <vector>
 
 #include "common/json.h"
 #include "common/unique_fd.h"
+#include "daemons/common/log.h"
 #include "daemons/tarnelasticd/database.h"
 #include "daemons/tarnelasticd/engine_error.h"
 #include "daemons/tarnelasticd/request.h"
@@ -22,6 +24,8 @@ namespace {
 
 constexpr const char* kDatabaseName = "/quarry.db";
 constexpr const char* kSpareSuffix = ".new";
+// What SQLite keeps beside a database.
+constexpr const char* kOtherFiles[] = {"-wal", "-shm", "-journal"};
 constexpr std::size_t kCopyBytes = std::size_t{1} << 20;
 
 std::string SparePath(const std::string& directory) {
@@ -39,28 +43,45 @@ void SyncDirectory(const std::string& directory) {
   if (!fd.valid() || fsync(fd.get()) != 0) FailSystem("Cannot sync " + directory);
 }
 
+bool IsDirectory(const std::string& path) {
+  struct stat info {};
+  return stat(path.c_str(), &info) == 0 && S_ISDIR(info.st_mode);
+}
+
+void RenameFile(const std::string& from, const std::string& to) {
+  if (rename(from.c_str(), to.c_str()) != 0) FailSystem("Cannot rename " + from);
+}
+
+// What cannot be the engine's must not be in its way, nor is it the engine's to remove.
+void SetAside(const std::string& path) {
+  const std::string aside = path + ".damaged-" + std::to_string(std::time(nullptr));
+  RenameFile(path, aside);
+  daemon::LogWarning(path + " was in the way of an index; it is kept as " + aside);
+}
+
 // Only the engine's own account may look into what it has read out of everybody's files.
 void MakeDirectory(const std::string& directory) {
   std::error_code failure;
   const std::filesystem::path parent = std::filesystem::path(directory).parent_path();
   std::filesystem::create_directories(parent, failure);
-  if (mkdir(directory.c_str(), 0700) != 0 && errno != EEXIST) {
-    FailSystem("Cannot make " + directory);
-  }
+  if (mkdir(directory.c_str(), 0700) == 0 || (errno == EEXIST && IsDirectory(directory))) return;
+  if (errno == EEXIST) SetAside(directory);
+  if (mkdir(directory.c_str(), 0700) != 0) FailSystem("Cannot make " + directory);
 }
 
 void RemoveFile(const std::string& path) {
-  if (unlink(path.c_str()) != 0 && errno != ENOENT && errno != ENOTDIR) {
-    FailSystem("Cannot remove " + path);
-  }
+  if (unlink(path.c_str()) == 0 || errno == ENOENT || errno == ENOTDIR) return;
+  if (errno != EISDIR) FailSystem("Cannot remove " + path);
+  SetAside(path);
+}
+
+void RemoveOtherFiles(const std::string& database) {
+  for (const char* suffix : kOtherFiles) RemoveFile(database + suffix);
 }
 
 void RemoveFiles(const std::string& database) {
-  for (const char* suffix : {"", "-wal", "-shm", "-journal"}) RemoveFile(database + suffix);
-}
-
-void RenameFile(const std::string& from, const std::string& to) {
-  if (rename(from.c_str(), to.c_str()) != 0) FailSystem("Cannot rename " + from);
+  RemoveFile(database);
+  RemoveOtherFiles(database);
 }
 
 // The database's other files get the same mode from SQLite.
@@ -202,9 +223,8 @@ std::string CreateSpareDatabase(const std::string& directory, const Schema& sche
 void PlaceSpareDatabase(const std::string& directory) {
   FoldLog(SparePath(directory));
   // A log left behind would be taken for the new database's own.
-  for (const char* suffix : {"-wal", "-shm", "-journal"}) {
-    RemoveFile(DatabasePath(directory) + suffix);
-  }
+  RemoveOtherFiles(DatabasePath(directory));
+  if (!HasDatabase(directory)) RemoveFile(DatabasePath(directory));
   RenameFile(SparePath(directory), DatabasePath(directory));
   SyncDirectory(directory);
 }
@@ -217,6 +237,10 @@ void CreateDatabase(const std::string& directory, const Schema& schema) {
 std::shared_ptr<const Schema> LoadSchema(const std::string& directory) {
   if (!HasDatabase(directory)) {
     throw Error(kDamagedIndex, "The index's database is missing: " + DatabasePath(directory));
+  }
+  for (const char* suffix : kOtherFiles) {
+    if (!IsDirectory(DatabasePath(directory) + suffix)) continue;
+    throw Error(kDamagedIndex, DatabasePath(directory) + suffix + " is a directory");
   }
   Database db(DatabasePath(directory));
   if (!HasMeta(&db)) throw Error(kDamagedIndex, "The database is not one of this engine");

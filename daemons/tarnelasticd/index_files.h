@@ -21,8 +21,9 @@ void CheckDirectory(const std::string& directory);
 bool HasDatabase(const std::string& directory);
 
 // Makes an empty database, and the directory where it is missing, so that after a crash there is
-// either a whole one or none; what was there is replaced. No connection may be open on it. Throws
-// Error kDiskFull or kStorageFailed.
+// either a whole one or none; what was there is replaced, but for directories in the place of
+// files, which get another name. No connection may be open on it. Throws Error kDiskFull or
+// kStorageFailed.
 void CreateDatabase(const std::string& directory, const Schema& schema);
 
 // The same under a name of its own, to be put in place with PlaceDatabase when it has been filled.

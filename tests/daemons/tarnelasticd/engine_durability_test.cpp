@@ -317,6 +317,38 @@ TEST_F(CorruptionTest, DamageFoundAtWorkIsRememberedAndHidesNoOtherIndex) {
   ExpectRepairable();
 }
 
+// Nothing is removed that the engine cannot have made.
+TEST_F(CorruptionTest, ADirectoryInTheWayOfAFileIsKeptAside) {
+  for (const char* suffix : {"", "-wal", "-shm", "-journal", ".new"}) {
+    SCOPED_TRACE(suffix);
+    const std::string place = database_ + suffix;
+    std::remove(place.c_str());
+    test::WriteFile(place + "/kept", "x");
+    Start();
+    const bool is_in_use = std::string(suffix) != ".new";
+    EXPECT_EQ(AskError("commit", Parse(R"({"id":"a"})")), is_in_use ? 1405 : 0);
+    if (!is_in_use) std::remove(database_.c_str());
+    ExpectRepairable();
+    engine_.reset();
+    int kept = 0;
+    for (const std::string& name : test::ListDir(DirectoryOf("a"))) {
+      const std::string aside = DirectoryOf("a") + '/' + name;
+      if (name.find(".damaged-") == std::string::npos) continue;
+      kept += test::ReadFile(aside + "/kept") == "x" ? 1 : 0;
+      test::RemoveTree(aside);
+    }
+    EXPECT_EQ(kept, 1);
+  }
+}
+
+TEST_F(CorruptionTest, AFileInTheWayOfTheDirectoryIsKeptAside) {
+  test::RemoveTree(DirectoryOf("a"));
+  test::WriteFile(DirectoryOf("a"), "x");
+  Start();
+  EXPECT_EQ(AskError("commit", Parse(R"({"id":"a"})")), 1405);
+  ExpectRepairable();
+}
+
 // Damage to any page ends in answers or in clear errors, and index_create always helps.
 TEST_F(CorruptionTest, NoDamagedPageDoesHarm) {
   const std::string content = test::ReadFile(database_);
