@@ -10,6 +10,7 @@
 
 #include "common/json.h"
 #include "daemons/common/log.h"
+#include "daemons/common/reply.h"
 #include "daemons/tarnelasticd/engine_error.h"
 #include "daemons/tarnelasticd/index_files.h"
 #include "daemons/tarnelasticd/request.h"
@@ -20,6 +21,9 @@
 
 namespace quarry::engine {
 namespace {
+
+using daemon::FailureReply;
+using daemon::SuccessReply;
 
 // A number that no other life of this process has had.
 std::string RandomId() {
@@ -34,21 +38,6 @@ std::string RandomId() {
     id += hex.data();
   }
   return id;
-}
-
-Json::Value Success(Json::Value data) {
-  Json::Value response;
-  response["success"] = true;
-  if (!data.isNull()) response["data"] = std::move(data);
-  return response;
-}
-
-Json::Value Failure(int code, const std::string& message) {
-  Json::Value response;
-  response["success"] = false;
-  response["error"]["code"] = code;
-  response["error"]["msg"] = message;
-  return response;
 }
 
 // What the administrator must know of; mistakes of peers are theirs.
@@ -122,10 +111,10 @@ std::string Engine::HandleText(const std::string& text) {
   try {
     Json::Value request;
     if (fromString(request, text)) return toString(Handle(request));
-    return toString(Failure(kMalformedRequest, "The request is no JSON"));
+    return toString(FailureReply(kMalformedRequest, "The request is no JSON"));
   } catch (const std::bad_alloc&) {
     // Which command it was is not known, and some must never be answered as busy.
-    return toString(Failure(kOutOfMemory, "Out of memory"));
+    return toString(FailureReply(kOutOfMemory, "Out of memory"));
   }
 }
 
@@ -135,8 +124,8 @@ Json::Value Engine::Handle(const Json::Value& request) {
 }
 
 Json::Value Engine::HandleBatch(const Json::Value& elements) {
-  if (!elements.isArray()) return Failure(kMalformedRequest, "Not an array: compound");
-  Json::Value response = Success(Json::Value(Json::arrayValue));
+  if (!elements.isArray()) return FailureReply(kMalformedRequest, "Not an array: compound");
+  Json::Value response = SuccessReply(Json::Value(Json::arrayValue));
   response["has_fail"] = false;
   for (const Json::Value& element : elements) {
     Json::Value answer = HandleOne(element);
@@ -150,15 +139,15 @@ Json::Value Engine::HandleOne(const Json::Value& request) {
   std::string name = "A request";
   try {
     name = StringProperty(request, "command");
-    return Success(RunCommand(name, request));
+    return SuccessReply(RunCommand(name, request));
   } catch (const Error& error) {
     LogFailure(name, error);
-    return Failure(error.code(), error.reason());
+    return FailureReply(error.code(), error.reason());
   } catch (const Json::Exception& failure) {
-    return Failure(kMalformedRequest, failure.what());
+    return FailureReply(kMalformedRequest, failure.what());
   } catch (const std::exception& failure) {
     LogFailure(name, Error(kInternalFailure, failure.what()));
-    return Failure(kInternalFailure, failure.what());
+    return FailureReply(kInternalFailure, failure.what());
   }
 }
 
