@@ -4,6 +4,7 @@
 #include "cli/commands/commands.h"
 #include "cli/folder_status.h"
 #include "cli/folders.h"
+#include "cli/monitor_status.h"
 #include "cli/output.h"
 #include "cli/problem.h"
 #include "cli/system.h"
@@ -33,6 +34,7 @@ Json::Value Collect() {
   status["resume_time"] = Json::Int64{fileindex::StatusMgr().GetPauseInfo()};
   status["running"] = ServicesAreManaged();
   status["services"] = Services();
+  status["monitor"] = MonitorStatus();
   const Json::Value report = IndexDaemonReport();
   status["folders"] = Folders(report);
   status["set_aside"] = WorkSetAside(report);
@@ -85,6 +87,9 @@ void PrintUnusable(const Json::Value& list) {
 
 void Print(const Json::Value& status) {
   PrintServices(status);
+  if (status["running"].asBool() || status["monitor"]["running"].asBool()) {
+    PrintMonitor(std::cout, status["monitor"]);
+  }
   PrintPause(status["resume_time"].asInt64());
   if (status["folders"].empty()) {
     std::cout << "No folder is indexed.\n";

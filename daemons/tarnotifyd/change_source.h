@@ -36,6 +36,7 @@ class ChangeSink {
 
 // How a source does at the moment.
 struct SourceReport {
+  std::string kind;              // "fanotify" or "inotify", the better one where both are at work
   std::size_t file_systems = 0;  // that are watched whole
   std::size_t directories = 0;   // that are watched one by one
   // Directories that SetDirectories() gave, in or at which something cannot be watched, and why.

@@ -56,6 +56,7 @@ void FanotifySource::Refresh(ChangeSink& sink) {
 }
 
 void FanotifySource::Report(SourceReport* report) const {
+  report->kind = "fanotify";
   report->file_systems += file_systems_.size();
 }
 

@@ -285,8 +285,11 @@ bool InotifySource::TakeInstance() {
 }
 
 void InotifySource::Report(SourceReport* report) const {
-  report->directories += Directories();
-  if (watches_) return watches_->ReportUnwatched(&report->unwatched);
+  if (report->kind.empty()) report->kind = "inotify";
+  if (watches_) {
+    report->directories += watches_->tree().Watches();
+    return watches_->ReportUnwatched(&report->unwatched);
+  }
   for (const std::string& path : directories_) {
     report->unwatched.emplace(path, "the system gives no instance of inotify");
   }

@@ -8,6 +8,7 @@
 #include "daemons/common/command_line.h"
 #include "daemons/common/log.h"
 #include "daemons/common/single_instance.h"
+#include "daemons/common/status_file.h"
 #include "daemons/common/stop_signal.h"
 #include "daemons/tarnotifyd/make_change_source.h"
 #include "daemons/tarnotifyd/monitor.h"
@@ -34,7 +35,9 @@ void Serve(notify::SourceKind kind) {
   daemon::StopSignal stop;
   const daemon::SingleInstance single(kName);
   notify::Monitor monitor(notify::MakeChangeSource(kind));
+  daemon::StatusFile status(kName);
   monitor.WakeOn(stop.Fd());
+  monitor.ReportTo([&](const Json::Value& report) { status.Write(report); });
   daemon::LogInfo("Started");
   while (!stop.Requested()) monitor.Step(-1);
   monitor.Finish();

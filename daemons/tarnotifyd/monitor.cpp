@@ -71,6 +71,32 @@ void Monitor::Step(int timeout_ms) {
   if (refresh) Guarded([this] { source_->Refresh(*this); });
   if (ready.source) Guarded([this] { source_->Read(*this); });
   for (const auto& feed : feeds_) feed->Step(now_());
+  if (refresh) report_(Status());
+}
+
+Json::Value Monitor::Status() const {
+  SourceReport source;
+  source_->Report(&source);
+  Json::Value status(Json::objectValue);
+  status["source"] = source.kind;
+  status["file_systems"] = Json::UInt64{source.file_systems};
+  status["directories"] = Json::UInt64{source.directories};
+  Json::Value& unwatched = status["unwatched"] = Json::Value(Json::arrayValue);
+  for (const auto& [path, reason] : source.unwatched) {
+    Json::Value& entry = unwatched.append(Json::Value(Json::objectValue));
+    entry["path"] = path;
+    entry["reason"] = reason;
+  }
+  Json::Value& queues = status["queues"] = Json::Value(Json::arrayValue);
+  auto feed = feeds_.begin();
+  for (const auto& [queue, places] : queues_) {
+    Json::Value& entry = queues.append(Json::Value(Json::objectValue));
+    entry["queue"] = queue;
+    entry["places"] = Json::UInt64{places.size()};
+    entry["overflows"] = Json::UInt64{(*feed)->Overflows()};
+    entry["problem"] = (*feed++)->Problem();
+  }
+  return status;
 }
 
 void Monitor::Finish() {

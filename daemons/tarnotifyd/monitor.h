@@ -3,9 +3,12 @@
 #ifndef QUARRY_DAEMONS_TARNOTIFYD_MONITOR_H_
 #define QUARRY_DAEMONS_TARNOTIFYD_MONITOR_H_
 
+#include <json/json.h>
+
 #include <functional>
 #include <memory>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "daemons/tarnotifyd/change_source.h"
@@ -26,6 +29,12 @@ class Monitor : private ChangeSink {
 
   // Waits up to `timeout_ms` for something to do, and does it.
   void Step(int timeout_ms);
+
+  // Calls with what Status() says, every second.
+  void ReportTo(std::function<void(const Json::Value&)> report) { report_ = std::move(report); }
+  // How the monitor does: {"source", "file_systems", "directories", "unwatched": [{"path",
+  // "reason"}], "queues": [{"queue", "places", "overflows", "problem"}]}.
+  Json::Value Status() const;
 
   // Step() returns as soon as `fd` is readable.
   void WakeOn(int fd) { wake_fd_ = fd; }
@@ -62,6 +71,7 @@ class Monitor : private ChangeSink {
   PlaceIndex::Wanted wanted_, wanted_old_;  // kept for their memory
   Clock::time_point next_refresh_{};
   int wake_fd_ = -1;
+  std::function<void(const Json::Value&)> report_ = [](const Json::Value&) {};
 };
 
 }  // namespace quarry::notify

@@ -74,16 +74,20 @@ void QueueFeed::Write(Clock::time_point now) {
     case WriteResult::kDone:
       break;
   }
-  if (backoff_.count() > 0) daemon::LogInfo("The queue " + queue_ + " takes changes again");
+  if (!problem_.empty()) daemon::LogInfo("The queue " + queue_ + " takes changes again");
   backoff_ = milliseconds(0);
+  problem_.clear();
+  if (doubtful_) ++overflows_;
   doubtful_ = false;
   unwritten_.clear();
   waiting_ = 0;
 }
 
 void QueueFeed::Fail(Clock::time_point now) {
-  if (backoff_.count() == 0) {
-    daemon::LogError("Cannot write to the queue " + queue_ + ": " + std::strerror(errno) +
+  const bool is_new = problem_.empty();
+  problem_ = std::strerror(errno);
+  if (is_new) {
+    daemon::LogError("Cannot write to the queue " + queue_ + ": " + problem_ +
                      ". What it misses will be told as an overflow");
   }
   Doubt(last_path_);

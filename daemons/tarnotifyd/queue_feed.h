@@ -5,6 +5,7 @@
 
 #include <chrono>
 #include <cstddef>
+#include <cstdint>
 #include <optional>
 #include <string>
 
@@ -38,6 +39,11 @@ class QueueFeed {
   // When Step() has something to do.
   std::optional<Clock::time_point> Due() const;
 
+  // How many overflow lines the queue was given.
+  std::uint64_t Overflows() const { return overflows_; }
+  // Why the queue cannot be written at present; "" when it can.
+  const std::string& Problem() const { return problem_; }
+
   // Writes everything now, if it can: the last thing before the end.
   void Finish(Clock::time_point now);
 
@@ -57,6 +63,8 @@ class QueueFeed {
   std::string doubtful_directory_;
   Clock::time_point not_before_{};  // no attempt to write before
   std::chrono::milliseconds backoff_{0};
+  std::uint64_t overflows_ = 0;
+  std::string problem_;
 };
 
 }  // namespace quarry::notify

@@ -35,6 +35,7 @@ class IdTable {
   void Insert(Id id);
   // The id is in the table, with the hash that it was inserted with.
   void Erase(Id id);
+  std::size_t size() const { return used_; }
 
  private:
   std::size_t Home(std::size_t hash) const { return hash & (slots_.size() - 1); }
@@ -95,6 +96,8 @@ class WatchTree {
 
   // How many directories there are.
   std::size_t size() const { return nodes_.size() - free_.size(); }
+  // How many of them have a watch.
+  std::size_t Watches() const { return by_watch_.size(); }
 
  private:
   struct Node {

@@ -10,6 +10,7 @@
 #include "common/file_util.h"
 #include "common/json.h"
 #include "daemons/common/single_instance.h"
+#include "daemons/common/status_file.h"
 #include "platform/include/monitor.h"
 #include "tests/support/files.h"
 #include "tests/support/root.h"
@@ -57,12 +58,16 @@ TEST_P(DaemonTest, FollowsWhatIsRegisteredAndStops) {
   ASSERT_TRUE(test::WaitUntil(IsRunning)) << test::ReadFile(scratch_ / "log");
   Register();
   EXPECT_TRUE(QueueGets("\"event\":512"));
+  EXPECT_TRUE(test::WaitUntil(
+      [&] { return daemon::ReadStatusFile("tarnotifyd")["queues"][0]["queue"] == queue_; }));
+  EXPECT_EQ(daemon::ReadStatusFile("tarnotifyd")["pid"], daemon.Pid());
   std::filesystem::remove(queue_);
   test::WriteFile(top_ + "/file", "x");
   EXPECT_TRUE(QueueGets("{\"event\":64,\"is_dir\":false,\"path\":\"" + top_ + "/file\""));
   daemon.Signal(SIGTERM);
   EXPECT_TRUE(daemon.WaitEnded(10'000));
   EXPECT_EQ(*daemon.Ended(), "exit code 0");
+  EXPECT_TRUE(daemon::ReadStatusFile("tarnotifyd").isNull());
 }
 
 TEST_P(DaemonTest, RunsOnce) {

@@ -37,10 +37,12 @@ namespace {
 namespace fs = std::filesystem;
 using test::DiskModel;
 using test::WriteFile;
+using ::testing::AllOf;
 using ::testing::Contains;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 using ::testing::Not;
+using ::testing::Pair;
 
 class InotifySourceTest : public ::testing::Test {
  protected:
@@ -312,6 +314,54 @@ TEST_F(InotifySourceTest, WithoutWatchesItIsInDoubtUntilThereAreSome) {
   WriteFile(top_ + "/d/f", "x");
   EXPECT_EQ(Told().size(), 3U);
   EXPECT_TRUE(IsLikeDisk());
+}
+
+TEST_F(InotifySourceTest, WhatCannotBeWatchedIsDoubtAndIsReported) {
+  test::MakeDirs(top_ + "/a/b");
+  test::MakeDirs(out_);
+  watches_left = 1;
+  const auto report = [&] {
+    SourceReport now;
+    source_.Report(&now);
+    return now;
+  };
+  // Each of those concerned, but no other.
+  source_.SetDirectories({out_}, {}, model_);
+  EXPECT_THAT(Told(), ElementsAre("doubt " + out_));
+  source_.SetDirectories({out_, top_}, {}, model_);
+  EXPECT_THAT(Told(), ElementsAre("doubt " + top_));
+  EXPECT_EQ(report().kind, "inotify");
+  EXPECT_EQ(report().directories, 1U);
+  EXPECT_THAT(report().unwatched,
+              ElementsAre(Pair(top_, "the limit fs.inotify.max_user_watches is reached")));
+  watches_left = 1 << 30;
+  ASSERT_TRUE(test::WaitUntil([&] {
+    source_.Refresh(model_);
+    test::ReadAll(source_, model_);
+    return report().unwatched.empty();
+  }));
+  EXPECT_THAT(Told(), Contains("doubt " + top_));
+  EXPECT_EQ(report().directories, 4U);
+  // What is not to be watched is not missed either.
+  watches_left = 0;
+  fs::create_directory(top_ + "/c");
+  EXPECT_THAT(Told(), Contains("doubt " + top_));
+  EXPECT_EQ(report().unwatched.size(), 1U);
+  source_.SetDirectories({out_}, {}, model_);
+  EXPECT_THAT(report().unwatched, IsEmpty());
+}
+
+TEST_F(InotifySourceTest, ARootThatGoesUnseenIsDoubtfulAtOnce) {
+  test::MakeDirs(out_);
+  source_.SetDirectories({top_, out_}, {}, model_);
+  Told();
+  WriteFile(top_ + "/a", "x");
+  WriteFile(top_ + "/b", "x");
+  for (int i = 0; i < 40'000; ++i) {
+    chmod((top_ + (i % 2 == 0 ? "/a" : "/b")).c_str(), 0600);
+  }
+  fs::remove(out_);
+  EXPECT_THAT(Told(), AllOf(Contains("doubt " + out_), Contains("doubt " + top_)));
 }
 
 TEST_F(InotifySourceTest, EventsThatTheKernelLosesAreDoubt) {

@@ -3,6 +3,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <filesystem>
 #include <functional>
 #include <stdexcept>
 
@@ -232,6 +233,29 @@ TEST_F(MonitorTest, TheSourceLooksAgainEverySecond) {
   now_ += std::chrono::milliseconds(1000);
   monitor_.Step(0);
   EXPECT_EQ(source_->refreshed_, before + 1);
+}
+
+TEST_F(MonitorTest, SaysHowItDoesEverySecond) {
+  std::vector<std::string> reports;
+  monitor_.ReportTo([&](const Json::Value& report) { reports.push_back(toString(report)); });
+  Register("a", {Place("/v/a"), Place("/v/b")});
+  source_->unwatched_["/v/b"] = "too many";
+  Step();
+  const auto report = [](const char* overflows, const std::string& problem) {
+    return R"({"directories":2,"file_systems":0,"queues":[{"overflows":)" + std::string(overflows) +
+           R"(,"places":2,"problem":")" + problem + R"(","queue":")" + QueuePath("a") +
+           R"("}],"source":"fake","unwatched":[{"path":"/v/b","reason":"too many"}]})";
+  };
+  EXPECT_THAT(reports, ElementsAre(report("1", "")));
+  std::filesystem::remove(QueuePath("a"));
+  std::filesystem::create_directory(QueuePath("a"));
+  TellChange(EVENT_CREATE, false, "/v/a/f");
+  Step();
+  EXPECT_EQ(reports.back(), report("1", "Is a directory"));
+  std::filesystem::remove(QueuePath("a"));
+  Step();
+  Step();
+  EXPECT_EQ(reports.back(), report("2", ""));
 }
 
 TEST_F(MonitorTest, TheEndWritesWhatIsLeft) {

@@ -43,6 +43,7 @@ class FakeSource : public notify::ChangeSource {
   }
   void Refresh(notify::ChangeSink&) override { ++refreshed_; }
   void Report(notify::SourceReport* report) const override {
+    report->kind = "fake";
     report->directories += directories_.size();
     report->unwatched.insert(unwatched_.begin(), unwatched_.end());
   }
