@@ -1,0 +1,1 @@
+"""What the benchmarks of whole programs share: running, watching and describing them."""
