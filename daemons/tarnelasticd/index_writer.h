@@ -29,7 +29,7 @@ struct WriterLimits {
   std::size_t flush_bytes = std::size_t{8} << 20;
   // A transaction ends when it has taken so much text, or has been open so long.
   std::size_t commit_bytes = std::size_t{256} << 20;
-  std::chrono::steady_clock::duration commit_age = std::chrono::seconds(30);
+  std::chrono::steady_clock::duration commit_age = std::chrono::seconds(3);
 };
 
 // A document to be stored, with its full text compressed already: that takes time, and needs no

@@ -98,6 +98,11 @@ TEST_F(DurabilityTest, TickEndsAnOldTransactionThatNobodyTouches) {
   }));
 }
 
+// What is written while work flows without an end is found all the same.
+TEST(WriterLimitsTest, NoTransactionStaysOpenForLong) {
+  EXPECT_LE(WriterLimits().commit_age, std::chrono::seconds(5));
+}
+
 TEST_F(DurabilityTest, TickLeavesAYoungTransactionAlone) {
   WriterLimits limits;
   limits.commit_age = std::chrono::hours(1);
