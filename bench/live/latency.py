@@ -11,6 +11,8 @@ BOUND_MS = 1000
 WIDTHS = (18, 8, 8, 8, 8, 8)
 _POLL = 0.002
 _FILES_IN_DIRECTORY = 10
+# More of one file than one change in half a second are held back by intention.
+_FILES = 50
 
 
 class Changes:
@@ -22,7 +24,7 @@ class Changes:
         self._name = os.path.basename(share)
         self._random = random.Random(seed)
         self._count = 0
-        self._file = self._new_file()
+        self._files = [self._new_file() for _ in range(_FILES)]
         self._directory = f"{share}/directory0"
         os.mkdir(self._directory)
         for number in range(_FILES_IN_DIRECTORY):
@@ -41,6 +43,10 @@ class Changes:
         self._write(path)
         return path
 
+    def _next_file(self):
+        self._files.append(self._files.pop(0))
+        return self._files[-1]
+
     def _finds(self, query, total=1):
         return self._system.total(query, self._name) == total
 
@@ -53,14 +59,15 @@ class Changes:
         return time.monotonic(), self._is_named(path)
 
     def write(self):
-        word = self._write(self._file)
+        word = self._write(self._next_file())
         return time.monotonic(), lambda: self._finds(word)
 
     def rename_file(self):
-        old, self._file = self._file, f"{self._file[:-4]}r{self._count}.txt"
+        old = self._next_file()
         self._count += 1
-        os.rename(old, self._file)
-        return time.monotonic(), self._is_named(self._file)
+        self._files[-1] = f"{self._share}/r{self._count}x{self._random.randrange(1 << 40)}.txt"
+        os.rename(old, self._files[-1])
+        return time.monotonic(), self._is_named(self._files[-1])
 
     def rename_directory(self):
         self._count += 1
@@ -78,13 +85,14 @@ class Changes:
 
     def chmod(self):
         # No search tells a mode: it is searchable once the document has it and all is committed.
+        path = self._next_file()
         mode = self._random.choice([m for m in range(0o600, 0o700)
-                                    if m != os.stat(self._file).st_mode & 0o7777])
-        os.chmod(self._file, mode)
-        return time.monotonic(), lambda: self._has_mode(mode) and self._system.is_idle()
+                                    if m != os.stat(path).st_mode & 0o7777])
+        os.chmod(path, mode)
+        return time.monotonic(), lambda: self._has_mode(path, mode) and self._system.is_idle()
 
-    def _has_mode(self, mode):
-        query = {"qsl": {"term": {"TARNMDPath": self._file}}, "load_field": ["TARNMDPrivilege"]}
+    def _has_mode(self, path, mode):
+        query = {"qsl": {"term": {"TARNMDPath": path}}, "load_field": ["TARNMDPrivilege"]}
         documents = self._system.engine("document_get_by_query", id="fileindex_" + self._name,
                                         query=query)
         return [document["TARNMDPrivilege"] for document in documents] == [f"{mode:04o}"]

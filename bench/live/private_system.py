@@ -199,6 +199,10 @@ class PrivateSystem:
         except OSError:
             pass
 
+    def supervisor(self):
+        """The process of `quarry run`."""
+        return self._supervisor.pid
+
     def pids(self):
         """The process of each daemon that runs."""
         services = self._services.ask({"command": "status"})["services"]

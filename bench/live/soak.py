@@ -84,11 +84,12 @@ class Disturber:
 
 
 def usage(system):
-    """Descriptors and megabytes of each daemon, and the files that are kept."""
-    used = {}
+    """Descriptors of any process, and megabytes, of each daemon, and the files that are kept."""
+    used = {"quarry run descriptors": processes.descriptors(system.supervisor())}
     for daemon, pid in system.pids().items():
+        # Workers come and go as they are needed.
         members = processes.family(pid)
-        used[f"{daemon} descriptors"] = sum(map(processes.descriptors, members))
+        used[f"{daemon} descriptors"] = max(map(processes.descriptors, members))
         used[f"{daemon} MB"] = round(sum(processes.memory_mb(member)[1] for member in members))
     files = [os.path.join(place, name) for place, _, names in os.walk(system.root) for name in names]
     # What SQLite keeps beside a database comes and goes.
