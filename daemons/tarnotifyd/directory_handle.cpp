@@ -13,6 +13,8 @@
 #include <memory>
 #include <utility>
 
+#include "daemons/tarnotifyd/directory_scan.h"
+
 namespace quarry::notify {
 namespace {
 
@@ -64,26 +66,37 @@ bool IsEntry(int directory, const std::string& name, const struct stat& status) 
          IsSame(named, status);
 }
 
-// The entry of `parent` with this inode; empty when there is none. For a path that is too long for
-// the kernel to tell, and for what another mount covers.
-std::string SearchName(int parent, ino_t inode) {
-  UniqueFd fd(openat(parent, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-  if (!fd.valid()) return std::string();
-  const std::unique_ptr<DIR, int (*)(DIR*)> entries(fdopendir(fd.get()), closedir);
-  if (entries == nullptr) return std::string();
-  fd.Release();
-  while (const dirent* entry = readdir(entries.get())) {
-    const std::string name = entry->d_name;
-    if (entry->d_ino == inode && name != "." && name != "..") return name;
-  }
-  return std::string();
+bool IsMountPoint(int directory, const std::string& name) {
+  const UniqueFd entry(openat(directory, name.c_str(), kOpenFlags | O_NOFOLLOW));
+  DirectoryId id;
+  return entry.valid() && Identify(entry.get(), &id) && id.is_mount;
 }
 
-std::string NameIn(int parent, int fd, const struct stat& status) {
-  std::string name = PathOf(fd);
-  name.erase(0, name.rfind('/') + 1);
-  if (IsEntry(parent, name, status)) return name;
-  return status.st_nlink == 0 ? std::string() : SearchName(parent, status.st_ino);
+// The entry of `parent` with this inode. For a path that is too long for the kernel to tell, and
+// for what another mount covers.
+Answer SearchName(int parent, ino_t inode, std::string* name) {
+  UniqueFd fd(openat(parent, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (!fd.valid()) return Answer::kFailed;
+  const std::unique_ptr<DIR, int (*)(DIR*)> entries(fdopendir(fd.get()), closedir);
+  if (entries == nullptr) return Answer::kFailed;
+  fd.Release();
+  while (const dirent* entry = readdir(entries.get())) {
+    *name = entry->d_name;
+    if (entry->d_ino == inode && *name != "." && *name != "..") return Answer::kFound;
+  }
+  return Answer::kFailed;
+}
+
+// kFailed when it was just renamed, too.
+Answer NameIn(int parent, int fd, std::string* name) {
+  struct stat status {};
+  if (fstat(fd, &status) != 0) return Answer::kFailed;
+  if (status.st_nlink == 0) return Answer::kGone;
+  *name = PathOf(fd);
+  name->erase(0, name->rfind('/') + 1);
+  if (IsEntry(parent, *name, status)) return Answer::kFound;
+  if (!name->empty() && !IsMountPoint(parent, *name)) return Answer::kFailed;
+  return SearchName(parent, status.st_ino, name);
 }
 
 // What errno says of a handle that could not be opened.
@@ -91,30 +104,30 @@ Answer AnswerOfErrno() {
   return errno == ESTALE || errno == ENOENT ? Answer::kGone : Answer::kFailed;
 }
 
-// Of the open directory with this handle. kGone when nothing could be made of it, kFound with an
-// empty parent when the mount ends here.
+// Of the open directory with this handle. kFound with an empty parent when the mount ends here.
 Answer PlaceOf(int fd, int mount, std::string_view handle, DirectoryPlace* place) {
-  struct stat status {};
-  if (fstat(fd, &status) != 0) return Answer::kFailed;
-  const UniqueFd parent(openat(fd, "..", kOpenFlags));
   *place = DirectoryPlace{};
+  const UniqueFd parent(openat(fd, "..", kOpenFlags));
   // A directory that a mount does not show has no parent there.
   if (!parent.valid()) return errno == ENOENT ? Answer::kFound : Answer::kFailed;
   std::optional<DirectoryIdentity> above = IdentifyDirectory(parent.get());
   if (!above) return Answer::kFailed;
-  if (above->mount != mount || above->handle == handle) return Answer::kFound;
-  place->name = NameIn(parent.get(), fd, status);
-  if (place->name.empty()) return Answer::kGone;
+  if (above->handle == handle && above->mount == mount) return Answer::kFound;
+  if (above->mount != mount) {
+    DirectoryId id;
+    if (!Identify(fd, &id)) return Answer::kFailed;
+    // Else something is mounted upon the parent: no path leads here as long as it is.
+    return id.is_mount ? Answer::kFound : Answer::kGone;
+  }
   place->parent = std::move(above->handle);
-  return Answer::kFound;
+  return NameIn(parent.get(), fd, &place->name);
 }
 
 Answer FindThrough(int entrance, int mount, std::string_view handle, DirectoryPlace* place) {
-  Answer answer = Answer::kGone;
-  for (int attempt = 0; attempt < kAttempts; ++attempt) {
+  Answer answer = Answer::kFailed;
+  for (int attempt = 0; attempt < kAttempts && answer == Answer::kFailed; ++attempt) {
     const UniqueFd fd = OpenHandle(entrance, handle, kOpenFlags);
     answer = fd.valid() ? PlaceOf(fd.get(), mount, handle, place) : AnswerOfErrno();
-    if (answer == Answer::kFound || (!fd.valid() && answer == Answer::kGone)) return answer;
   }
   return answer;
 }
@@ -160,36 +173,51 @@ void MountedDirectories::RemoveEntrance(const std::string& path) {
   Release();
 }
 
-const std::vector<MountedDirectories::Entrance>& MountedDirectories::OpenEntrances() {
-  if (!open_.empty()) return open_;
+// False when there is no way in, or one of them could not be tried.
+bool MountedDirectories::OpenEntrances() {
+  if (!open_.empty()) return true;
   for (const std::string& path : entrances_) {
-    UniqueFd fd(open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));  // O_PATH does not do
-    struct stat status {};
-    if (!fd.valid() || fstat(fd.get(), &status) != 0 || status.st_dev != device_) continue;
-    const std::optional<DirectoryIdentity> identity = IdentifyDirectory(fd.get());
-    const auto is_same = [&](const Entrance& other) { return other.mount == identity->mount; };
-    if (identity && std::none_of(open_.begin(), open_.end(), is_same)) {
-      open_.push_back({std::move(fd), identity->mount});
+    if (!OpenEntrance(path)) {
+      Release();
+      return false;
     }
   }
-  return open_;
+  return !open_.empty();
+}
+
+// What is not there any more is passed over: whoever watches it will notice.
+bool MountedDirectories::OpenEntrance(const std::string& path) {
+  UniqueFd fd(open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));  // O_PATH does not do
+  if (!fd.valid()) return errno == ENOENT || errno == ENOTDIR;
+  struct stat status {};
+  if (fstat(fd.get(), &status) != 0) return false;
+  if (status.st_dev != device_) return true;
+  const std::optional<DirectoryIdentity> identity = IdentifyDirectory(fd.get());
+  if (!identity) return false;
+  const auto is_same = [&](const Entrance& other) { return other.mount == identity->mount; };
+  if (std::none_of(open_.begin(), open_.end(), is_same)) {
+    open_.push_back({std::move(fd), identity->mount});
+  }
+  return true;
 }
 
 DirectoryLookup::Answer MountedDirectories::Find(std::string_view handle, DirectoryPlace* place) {
-  Answer best = Answer::kGone;
-  for (const Entrance& entrance : OpenEntrances()) {
+  if (!OpenEntrances()) return Answer::kFailed;
+  Answer worst = Answer::kFound;
+  for (const Entrance& entrance : open_) {
     const Answer answer = FindThrough(entrance.fd.get(), entrance.mount, handle, place);
-    if (answer == Answer::kGone) return answer;  // for all mounts
     if (answer == Answer::kFound && !place->parent.empty()) return answer;
-    best = answer;
+    if (worst != Answer::kFailed && answer != Answer::kFound) worst = answer;
   }
-  return best;
+  *place = DirectoryPlace{};
+  return worst;
 }
 
 DirectoryLookup::Answer MountedDirectories::FindFile(std::string_view handle,
                                                      DirectoryPlace* place) {
+  if (!OpenEntrances()) return Answer::kFailed;
   Answer answer = Answer::kGone;
-  for (const Entrance& entrance : OpenEntrances()) {
+  for (const Entrance& entrance : open_) {
     const UniqueFd fd = OpenHandle(entrance.fd.get(), handle, O_PATH | O_NOFOLLOW | O_CLOEXEC);
     answer = fd.valid() ? PlaceOfFile(fd.get(), place) : AnswerOfErrno();
     if (answer != Answer::kFailed) return answer;

@@ -51,7 +51,8 @@ class MountedDirectories : public DirectoryLookup {
     int mount = 0;
   };
 
-  const std::vector<Entrance>& OpenEntrances();
+  bool OpenEntrances();
+  bool OpenEntrance(const std::string& path);
 
   const dev_t device_;
   std::vector<std::string> entrances_;

@@ -6,9 +6,23 @@
 namespace quarry::notify {
 namespace {
 
-// Deeper than anything that can be opened by a path. What was learnt at different times may also
-// lead in a circle.
-constexpr std::size_t kMaxDepth = 65536;
+// Notices when a walk comes to the same place again: each place is compared with an earlier one,
+// which moves up whenever the walk is twice as long.
+class CircleDetector {
+ public:
+  bool IsClosedBy(const std::string& at) {
+    if (at == mark_) return true;
+    if (++steps_ != renewal_) return false;
+    mark_ = at;
+    renewal_ *= 2;
+    return false;
+  }
+
+ private:
+  std::string mark_;
+  std::size_t steps_ = 0;
+  std::size_t renewal_ = 1;
+};
 
 std::string Joined(const std::string& root, const std::vector<std::string>& names) {
   std::string path = root == "/" ? std::string() : root;
@@ -22,8 +36,20 @@ void DirectoryTree::SetIgnored(const std::vector<std::string>& names) {
   ignored_ = {names.begin(), names.end()};
 }
 
-void DirectoryTree::AddRoot(const std::string& handle, const std::string& path) {
+bool DirectoryTree::AddRoot(const std::string& handle, const std::string& path) {
+  Forget();
+  std::vector<Entry> entries;
+  CircleDetector detector;
+  for (std::string at = handle; !at.empty();) {
+    bool failed = false;
+    const DirectoryPlace* place = Find(at, &failed);
+    if (place == nullptr || detector.IsClosedBy(at)) return false;
+    if (!place->parent.empty()) entries.emplace_back(place->parent, place->name);
+    at = place->parent;
+  }
+  for (Entry& entry : entries) above_.emplace(std::move(entry), path);
   roots_[handle].push_back(path);
+  return true;
 }
 
 void DirectoryTree::RemoveRoot(const std::string& path) {
@@ -32,6 +58,17 @@ void DirectoryTree::RemoveRoot(const std::string& path) {
     paths.erase(std::remove(paths.begin(), paths.end(), path), paths.end());
     root = paths.empty() ? roots_.erase(root) : std::next(root);
   }
+  for (auto entry = above_.begin(); entry != above_.end();) {
+    entry = entry->second == path ? above_.erase(entry) : std::next(entry);
+  }
+}
+
+std::vector<std::string> DirectoryTree::RootsAt(std::string_view directory,
+                                                std::string_view name) const {
+  const auto found = above_.equal_range(Entry(directory, name));
+  std::vector<std::string> paths;
+  for (auto entry = found.first; entry != found.second; ++entry) paths.push_back(entry->second);
+  return paths;
 }
 
 std::vector<std::string> DirectoryTree::Roots() const {
@@ -43,21 +80,32 @@ std::vector<std::string> DirectoryTree::Roots() const {
 
 bool DirectoryTree::PathsOf(std::string_view directory, std::string_view name,
                             std::vector<std::string>* paths) {
+  Climbing climbing = Climb(directory, name, paths);
+  if (climbing == Climbing::kCircle) {
+    // What was learnt at different times need not fit together.
+    Forget();
+    climbing = Climb(directory, name, paths);
+  }
+  return climbing == Climbing::kComplete;
+}
+
+DirectoryTree::Climbing DirectoryTree::Climb(std::string_view directory, std::string_view name,
+                                             std::vector<std::string>* paths) {
   paths->clear();
   std::vector<std::string> names;  // from the entry upwards
   if (name != ".") names.emplace_back(name);
-  std::string at(directory);
-  for (std::size_t depth = 0; depth < kMaxDepth; ++depth) {
-    if (!names.empty() && ignored_.count(names.back()) != 0) return true;
+  CircleDetector detector;
+  for (std::string at(directory); !detector.IsClosedBy(at);) {
+    if (!names.empty() && ignored_.count(names.back()) != 0) return Climbing::kComplete;
     AddPaths(at, names, paths);
     bool failed = false;
     const DirectoryPlace* place = Find(at, &failed);
-    if (place == nullptr || place->parent.empty()) return !failed;
+    if (failed) return Climbing::kIncomplete;
+    if (place == nullptr || place->parent.empty()) return Climbing::kComplete;
     names.push_back(place->name);
     at = place->parent;
   }
-  Forget();
-  return false;
+  return Climbing::kCircle;
 }
 
 bool DirectoryTree::PathsOfFile(std::string_view file, std::vector<std::string>* paths) {
@@ -117,6 +165,7 @@ void DirectoryTree::Placed(std::string_view directory, std::string_view parent,
 }
 
 void DirectoryTree::Removed(std::string_view directory) {
+  if (directory.empty()) return Forget();
   const std::string key(directory);
   recent_.erase(key);
   older_.erase(key);

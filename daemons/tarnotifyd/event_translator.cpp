@@ -128,10 +128,12 @@ void EventTranslator::TellDeparture(ChangeSink& sink) {
 
 void EventTranslator::TellMove(const Move& move, ChangeSink& sink) {
   const std::vector<std::string> from = PathsOf(move.from, sink);
-  if (move.is_dir) tree_.Placed(move.target, move.to.directory, move.to.name);
+  if (move.is_dir) tree_.Removed(move.target);
   const std::vector<std::string> to = PathsOf(move.to, sink);
   // What lies below was perhaps found to be out of reach as long as it was outside.
   if (move.is_dir && from.empty() && !to.empty()) tree_.Forget();
+  if (move.is_dir) DoubtMovedRoots(move.from, sink);
+  if (move.is_dir) DoubtMovedRoots(move.to, sink);
   // A place that is watched under several paths has as many before and after.
   const std::size_t both = std::min(from.size(), to.size());
   for (std::size_t i = 0; i < both; ++i) {
@@ -149,8 +151,8 @@ void EventTranslator::TellMove(const Move& move, ChangeSink& sink) {
 
 void EventTranslator::TellEntry(const FanotifyEvent& event, ChangeSink& sink) {
   if (event.entry.directory.empty()) return KeepUnplaced(event);
-  if ((event.mask & FAN_DELETE) != 0) ForgetLostName(event);
-  if (IsDirectory(event)) NoteDirectory(event);
+  if ((event.mask & (FAN_CREATE | FAN_DELETE)) != 0) ForgetLinkCount(event);
+  if (IsDirectory(event)) NoteDirectory(event, sink);
   for (const std::string& path : PathsOf(event.entry, sink)) {
     for (const Change& change : ChangesOf(event.mask, path)) sink.OnChange(change);
   }
@@ -167,14 +169,14 @@ void EventTranslator::KeepUnplaced(const FanotifyEvent& event) {
   }
 }
 
-// The first event of a deletion says, of the file as such, that it has a name less. This is what
-// was meant.
-void EventTranslator::ForgetLostName(const FanotifyEvent& event) {
+// Before a deletion, or another name, is told there is an event which says of the file as such that
+// it has a name less or more. This is what was meant.
+void EventTranslator::ForgetLinkCount(const FanotifyEvent& event) {
   const auto file = unplaced_.find(std::string(event.target));
   if (file != unplaced_.end() && (file->second & kWritten) == 0) unplaced_.erase(file);
 }
 
-// Of what is not explained yet: the deletion may still be on its way.
+// Of what is not explained yet: the event that does it may still be on its way.
 bool EventTranslator::HasToWait(const std::string& file, std::uint64_t mask) {
   return (mask & kWritten) == 0 && waiting_.erase(file) == 0;
 }
@@ -202,14 +204,21 @@ void EventTranslator::PlaceFiles(ChangeSink& sink) {
   DoubtAll(sink);
 }
 
-void EventTranslator::NoteDirectory(const FanotifyEvent& event) {
+void EventTranslator::NoteDirectory(const FanotifyEvent& event, ChangeSink& sink) {
   if ((event.mask & (FAN_MOVED_FROM | FAN_MOVED_TO)) != 0) {
     tree_.Forget();  // which directory it was is not said
+    DoubtMovedRoots(event.entry, sink);
   } else if ((event.mask & FAN_DELETE) != 0) {
     tree_.Removed(event.target);
   } else if ((event.mask & FAN_CREATE) != 0 && !event.target.empty()) {
     tree_.Placed(event.target, event.entry.directory, event.entry.name);
   }
+}
+
+// Whoever has looked at a watched directory while it was away has found nothing there, and it may
+// be back before anybody notices that it was away.
+void EventTranslator::DoubtMovedRoots(const FanotifyEntry& entry, ChangeSink& sink) {
+  for (const std::string& root : tree_.RootsAt(entry.directory, entry.name)) sink.OnDoubt(root);
 }
 
 std::vector<std::string> EventTranslator::PathsOf(const FanotifyEntry& entry, ChangeSink& sink) {

@@ -65,10 +65,11 @@ class EventTranslator {
   void TellDeparture(ChangeSink& sink);
   void TellEntry(const FanotifyEvent& event, ChangeSink& sink);
   void KeepUnplaced(const FanotifyEvent& event);
-  void ForgetLostName(const FanotifyEvent& event);
+  void ForgetLinkCount(const FanotifyEvent& event);
   bool HasToWait(const std::string& file, std::uint64_t mask);
   void PlaceFiles(ChangeSink& sink);
-  void NoteDirectory(const FanotifyEvent& event);
+  void NoteDirectory(const FanotifyEvent& event, ChangeSink& sink);
+  void DoubtMovedRoots(const FanotifyEntry& entry, ChangeSink& sink);
   std::vector<std::string> PathsOf(const FanotifyEntry& entry, ChangeSink& sink);
   void DoubtAll(ChangeSink& sink);
 

@@ -38,6 +38,7 @@ void FanotifySource::SetDirectories(const std::vector<std::string>& directories,
   directories_ = directories;
   ignore_ = ignore;
   for (MarkedFileSystem& file_system : file_systems_) file_system.tree().SetIgnored(ignore_);
+  is_arranged_ = false;
   Arrange(sink);
 }
 
@@ -51,7 +52,8 @@ void FanotifySource::Read(ChangeSink& sink) {
 
 void FanotifySource::Refresh(ChangeSink& sink) {
   for (MarkedFileSystem& file_system : file_systems_) file_system.Finish(sink);
-  if (mounts_.HasChanged()) return Arrange(sink);
+  if (mounts_.HasChanged()) is_arranged_ = false;  // which it says only once
+  if (!is_arranged_) return Arrange(sink);
   Check(sink);
 }
 
@@ -62,6 +64,8 @@ void FanotifySource::Report(SourceReport* report) const {
 
 // Brings the watches in line with what is to be watched.
 void FanotifySource::Arrange(ChangeSink& sink) {
+  // What a mount has covered, or shows now, has another place.
+  for (MarkedFileSystem& file_system : file_systems_) file_system.tree().Forget();
   const std::vector<std::string> wanted = WantedPaths();
   std::set<std::string> missing(wanted.begin(), wanted.end());
   for (auto watch = watches_.begin(); watch != watches_.end();) {
@@ -78,6 +82,7 @@ void FanotifySource::Arrange(ChangeSink& sink) {
     watches_.emplace_back();
     watches_.back().path = path;
   }
+  is_arranged_ = true;
   Check(sink);
 }
 

@@ -84,6 +84,7 @@ class FanotifySource : public ChangeSource {
   std::vector<std::string> directories_;
   std::vector<std::string> ignore_;
   std::list<Watch> watches_;
+  bool is_arranged_ = true;  // there is a watch for all that is to be watched
   std::list<MarkedFileSystem> file_systems_;
   std::vector<std::string> unwatchable_;
 };

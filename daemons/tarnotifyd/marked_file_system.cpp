@@ -9,6 +9,7 @@
 #include <fstream>
 #include <optional>
 
+#include "common/error.h"
 #include "daemons/common/system_error.h"
 
 namespace quarry::notify {
@@ -110,8 +111,11 @@ bool MarkedFileSystem::ShowsMark() const {
 
 void MarkedFileSystem::AddRoot(const std::string& handle, const std::string& path) {
   directories_.AddEntrance(path);
-  tree_.AddRoot(handle, path);
-  tree_.Forget();  // what was out of reach may no longer be
+  const bool is_added = tree_.AddRoot(handle, path);
+  directories_.Release();
+  if (is_added) return;
+  directories_.RemoveEntrance(path);
+  throw Error(kErrorSystem, "Its directories cannot be found by what the kernel calls them");
 }
 
 void MarkedFileSystem::RemoveRoot(const std::string& path) {
@@ -120,16 +124,30 @@ void MarkedFileSystem::RemoveRoot(const std::string& path) {
 }
 
 void MarkedFileSystem::Finish(ChangeSink& sink) {
-  translator_.Finish(sink);
-  directories_.Release();
+  Guarded([&] { translator_.Finish(sink); });
 }
 
 void MarkedFileSystem::Read(ChangeSink& sink) {
+  Guarded([&] { TellAll(sink); });
+}
+
+void MarkedFileSystem::TellAll(ChangeSink& sink) {
   std::deque<Delivery> deliveries;
   std::size_t allowance = kAtATime;
   for (Fetch(&deliveries, &allowance, sink); !deliveries.empty(); deliveries.pop_front()) {
     translator_.Translate({deliveries.front().data(), deliveries.front().size()}, sink);
     Fetch(&deliveries, &allowance, sink);
+  }
+}
+
+// What an exception has cut off may have been a rename.
+void MarkedFileSystem::Guarded(const std::function<void()>& action) {
+  try {
+    action();
+  } catch (...) {
+    directories_.Release();
+    tree_.Forget();
+    throw;
   }
   directories_.Release();
 }

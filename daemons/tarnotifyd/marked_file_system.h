@@ -8,6 +8,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <deque>
+#include <functional>
 #include <string>
 #include <vector>
 
@@ -48,6 +49,7 @@ class MarkedFileSystem {
   bool IsMarked() const;
 
   DirectoryTree& tree() { return tree_; }
+  // Throws Error 502, and has added nothing, when this process cannot find directories here.
   void AddRoot(const std::string& handle, const std::string& path);
   void RemoveRoot(const std::string& path);
   bool IsUnused() const { return tree_.Roots().empty(); }
@@ -63,6 +65,8 @@ class MarkedFileSystem {
   using Delivery = std::vector<char>;
 
   bool ShowsMark() const;
+  void TellAll(ChangeSink& sink);
+  void Guarded(const std::function<void()>& action);
   void Fetch(std::deque<Delivery>* deliveries, std::size_t* allowance, ChangeSink& sink);
 
   const dev_t device_;

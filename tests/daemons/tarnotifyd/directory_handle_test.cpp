@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <gmock/gmock.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -91,9 +92,27 @@ TEST_F(DirectoryHandleTest, EntranceOfAnotherFileSystemIsNotUsed) {
   const std::string handle = HandleOf(top_.path());
   MountedDirectories other(DeviceOf(top_.path()) + 1);
   other.AddEntrance(top_.path());
-  EXPECT_EQ(other.Find(handle, &place_), Answer::kGone);
+  EXPECT_EQ(other.Find(handle, &place_), Answer::kFailed);
   directories_.RemoveEntrance(top_.path());
-  EXPECT_EQ(directories_.Find(handle, &place_), Answer::kGone);
+  EXPECT_EQ(directories_.Find(handle, &place_), Answer::kFailed);
+  EXPECT_EQ(directories_.FindFile(handle, &place_), Answer::kFailed);
+}
+
+// Without descriptors nothing is found, but nothing is gone either.
+TEST_F(DirectoryHandleTest, WhatCannotBeOpenedIsNotGone) {
+  if (!Start()) return;
+  const std::string handle = HandleOf(top_.path());
+  directories_.Release();
+  rlimit limit{};
+  ASSERT_EQ(getrlimit(RLIMIT_NOFILE, &limit), 0);
+  const rlimit none{0, limit.rlim_max};
+  ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &none), 0);
+  const Answer answer = directories_.Find(handle, &place_);
+  const Answer of_file = directories_.FindFile(handle, &place_);
+  ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &limit), 0);
+  EXPECT_EQ(answer, Answer::kFailed);
+  EXPECT_EQ(of_file, Answer::kFailed);
+  EXPECT_EQ(directories_.Find(handle, &place_), Answer::kFound);
 }
 
 TEST_F(DirectoryHandleTest, PlaceOfAFile) {

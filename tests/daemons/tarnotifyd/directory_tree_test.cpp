@@ -67,6 +67,7 @@ TEST_F(DirectoryTreeTest, FailureIsToldAndNotRemembered) {
 }
 
 TEST_F(DirectoryTreeTest, WatchedDirectoryNeedsNoLookup) {
+  tree_.Forget();
   lookup_.fails = true;
   EXPECT_THAT(Paths("share", "f"), ElementsAre("/s/f"));
   EXPECT_FALSE(complete_);  // it may lie within another one
@@ -139,12 +140,41 @@ TEST_F(DirectoryTreeTest, NewDirectoryNeedsNoLookup) {
   EXPECT_EQ(lookup_.asked, asked + 1);
 }
 
-TEST_F(DirectoryTreeTest, CircleEndsAndIsAFailure) {
-  tree_.Placed(HandleOf("a"), HandleOf("b"), "a");
-  EXPECT_THAT(Paths("b", "f"), IsEmpty());
+// One was learnt before something moved, the other afterwards.
+TEST_F(DirectoryTreeTest, CircleMakesItAskAgain) {
+  for (const std::string parent : {"a", "b"}) {
+    tree_.Placed(HandleOf("a"), HandleOf(parent), "a");
+    EXPECT_THAT(Paths("b", "f"), ElementsAre("/s/a/b/f"));
+    EXPECT_TRUE(complete_);
+  }
+}
+
+TEST_F(DirectoryTreeTest, CircleThatStaysIsAFailure) {
+  tree_.Forget();
+  lookup_.Put("share", "b", "share");
+  Paths("b", "f");
   EXPECT_FALSE(complete_);
-  EXPECT_THAT(Paths("b", "f"), ElementsAre("/s/a/b/f"));
-  EXPECT_TRUE(complete_);
+  EXPECT_FALSE(tree_.AddRoot(HandleOf("a"), "/deep"));
+}
+
+TEST_F(DirectoryTreeTest, WatchedDirectoryHasToBeFound) {
+  lookup_.fails = true;
+  EXPECT_FALSE(tree_.AddRoot(HandleOf("a"), "/deep"));
+  lookup_.fails = false;
+  EXPECT_FALSE(tree_.AddRoot(HandleOf("nowhere"), "/deep"));
+  EXPECT_THAT(tree_.Roots(), ElementsAre("/s"));
+  EXPECT_THAT(tree_.RootsAt(HandleOf("share"), "a"), IsEmpty());
+}
+
+TEST_F(DirectoryTreeTest, WhatLeadsToAWatchedDirectory) {
+  EXPECT_TRUE(tree_.AddRoot(HandleOf("b"), "/deep"));
+  EXPECT_THAT(tree_.RootsAt(HandleOf("top"), "share"), UnorderedElementsAre("/deep", "/s"));
+  EXPECT_THAT(tree_.RootsAt(HandleOf("share"), "a"), ElementsAre("/deep"));
+  EXPECT_THAT(tree_.RootsAt(HandleOf("a"), "b"), ElementsAre("/deep"));
+  EXPECT_THAT(tree_.RootsAt(HandleOf("b"), "f"), IsEmpty());
+  EXPECT_THAT(tree_.RootsAt(HandleOf("top"), "other"), IsEmpty());
+  tree_.RemoveRoot("/s");
+  EXPECT_THAT(tree_.RootsAt(HandleOf("top"), "share"), ElementsAre("/deep"));
 }
 
 TEST_F(DirectoryTreeTest, RemembersABoundedNumberAndFindsTheOthersAgain) {

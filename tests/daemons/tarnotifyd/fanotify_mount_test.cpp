@@ -1,5 +1,6 @@
 // File systems that come and go. Everything is mounted in a mount namespace of this process alone.
 
+#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <sched.h>
 #include <sys/mount.h>
@@ -87,6 +88,36 @@ TEST_F(FanotifyMountTest, FileSystemWithinADirectory) {
   EXPECT_THAT(Refreshed(), ElementsAre("doubt " + point));
   test::WriteFile(point + "/f", "");
   EXPECT_THAT(Told(), ElementsAre("create file " + point + "/f"));
+}
+
+// Its changes are met while no path leads to it.
+TEST_F(FanotifyMountTest, DirectoryThatIsCoveredForAWhile) {
+  const std::string point = inside_ + "/point";
+  test::MakeDirs(point + "/a/b");
+  if (!StartMounting({inside_})) return;
+  const UniqueFd fd(open(point.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (!Mount("tmpfs", point)) return;
+  EXPECT_THAT(Refreshed(), ElementsAre("doubt " + point));
+  ASSERT_EQ(mkdirat(fd.get(), "a/b/unseen", 0700), 0);
+  EXPECT_THAT(Told(), IsEmpty());
+  Unmount();
+  EXPECT_THAT(Refreshed(), ElementsAre("doubt " + point));
+  test::WriteFile(point + "/a/b/f", "");
+  EXPECT_THAT(Told(), ElementsAre("create file " + point + "/a/b/f"));
+}
+
+TEST_F(FanotifyMountTest, DirectoryThatIsCoveredUnnoticed) {
+  const std::string point = inside_ + "/point";
+  test::MakeDirs(point + "/a/b");
+  if (!StartMounting({inside_})) return;
+  const UniqueFd fd(open(point.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (!Mount("tmpfs", point)) return;
+  ASSERT_EQ(renameat(fd.get(), "a", fd.get(), "c"), 0);
+  ASSERT_EQ(mkdirat(fd.get(), "c/b/unseen", 0700), 0);
+  EXPECT_THAT(Told(), ElementsAre("rename dir " + point + "/a -> " + point + "/c"));
+  Unmount();
+  test::WriteFile(point + "/c/b/f", "");
+  EXPECT_THAT(Told(), ElementsAre("create file " + point + "/c/b/f"));
 }
 
 TEST_F(FanotifyMountTest, IgnoredFileSystemIsNotWatched) {

@@ -121,6 +121,7 @@ TEST_F(FanotifySourceTest, MovesAcrossTheEdge) {
   std::rename((inside_ + "/d").c_str(), (outside_ + "/x").c_str());
   EXPECT_THAT(Told(), ElementsAre("delete dir " + inside_ + "/d"));
   test::WriteFile(outside_ + "/x/e/unheard", "");
+  EXPECT_THAT(Told(), IsEmpty());
   std::rename((outside_ + "/x").c_str(), (inside_ + "/y").c_str());
   test::WriteFile(inside_ + "/y/e/heard", "");
   EXPECT_THAT(Told(),
@@ -259,6 +260,40 @@ TEST_F(FanotifySourceTest, FileThatHasLostItsNameIsNoReasonForDoubt) {
   EXPECT_THAT(Told(), IsSubsetOf({"modify file " + file}));
   source_->Refresh(model_);
   EXPECT_THAT(model_.Told(), IsEmpty());
+}
+
+// The kernel tells of the last rename in the place of the first, which was the same.
+TEST_F(FanotifySourceTest, DirectoryThatIsRenamedToAndFro) {
+  const std::string one = inside_ + "/one";
+  const std::string other = inside_ + "/other";
+  test::MakeDirs(one);
+  if (!StartInside()) return;
+  std::rename(one.c_str(), other.c_str());
+  std::rename(other.c_str(), one.c_str());
+  std::rename(one.c_str(), other.c_str());
+  EXPECT_THAT(Told(), Contains("rename dir " + one + " -> " + other));
+  test::WriteFile(other + "/f", "");
+  EXPECT_THAT(Told(), ElementsAre("create file " + other + "/f"));
+}
+
+TEST_F(FanotifySourceTest, LinkIsACreationAndNothingElse) {
+  test::WriteFile(inside_ + "/f", "");
+  if (!StartInside()) return;
+  ASSERT_EQ(link((inside_ + "/f").c_str(), (inside_ + "/g").c_str()), 0);
+  EXPECT_THAT(Told(), ElementsAre("create file " + inside_ + "/g"));
+  source_->Refresh(model_);
+  source_->Refresh(model_);
+  EXPECT_THAT(Told(), IsEmpty());
+}
+
+TEST_F(FanotifySourceTest, DirectoryThatIsAwayForAMoment) {
+  const std::string place = scratch_ / "above/place";
+  test::MakeDirs(place);
+  if (!Start({inside_, place}, model_)) return;
+  Told();
+  std::rename((scratch_ / "above").c_str(), (scratch_ / "aside").c_str());
+  std::rename((scratch_ / "aside").c_str(), (scratch_ / "above").c_str());
+  EXPECT_THAT(Told(), ElementsAre("doubt " + place, "doubt " + place));
 }
 
 TEST_F(FanotifySourceTest, NothingIsReadWhereThereIsNothing) {

@@ -35,17 +35,31 @@ std::string NameOf(std::uint32_t kind) {
   }
 }
 
+// The number of links changes without an event of its own, and with it the time of the change.
+std::string StampOf(const struct stat& status) {
+  if (!S_ISREG(status.st_mode)) return "";
+  return std::to_string(status.st_ino) + ":" + std::to_string(status.st_size) + ":" +
+         std::to_string(status.st_mtim.tv_sec) + ":" + std::to_string(status.st_mtim.tv_nsec) +
+         ":" + std::to_string(status.st_mode);
+}
+
+std::set<std::string> PathsOf(const StampedTree& tree) {
+  std::set<std::string> paths;
+  for (const auto& [path, stamp] : tree) paths.insert(path);
+  return paths;
+}
+
 }  // namespace
 
-std::set<std::string> ListTree(const std::string& top, const std::set<std::string>& ignored) {
-  std::set<std::string> found;
+StampedTree StampTree(const std::string& top, const std::set<std::string>& ignored) {
+  StampedTree found;
   std::vector<std::string> left{top};
   while (!left.empty()) {
     const std::string path = left.back();
     left.pop_back();
     struct stat status {};
     if (lstat(path.c_str(), &status) != 0) continue;
-    found.insert(path);
+    found[path] = StampOf(status);
     if (!S_ISDIR(status.st_mode)) continue;
     const std::unique_ptr<DIR, CloseDir> dir(opendir(path.c_str()));
     while (const dirent* entry = dir ? readdir(dir.get()) : nullptr) {
@@ -57,31 +71,52 @@ std::set<std::string> ListTree(const std::string& top, const std::set<std::strin
   return found;
 }
 
+std::set<std::string> ListTree(const std::string& top, const std::set<std::string>& ignored) {
+  return PathsOf(StampTree(top, ignored));
+}
+
 std::string InWords(const notify::Change& change) {
   return NameOf(change.kind) + (change.is_dir ? " dir " : " file ") +
          (change.kind == EVENT_RENAME ? change.path_old + " -> " : "") + change.path;
 }
 
+std::set<std::string> DiskModel::Paths() const {
+  return PathsOf(paths_);
+}
+
+bool DiskModel::IsWithin(const std::string& path) const {
+  return path == top_ || path.compare(0, top_.size() + 1, top_ + "/") == 0;
+}
+
 // A directory in the place of a file that is told of has come later: that will be told, too.
 void DiskModel::LookAt(const std::string& path, bool and_below) {
+  if (!IsWithin(path)) return;
   struct stat status {};
   const bool exists = lstat(path.c_str(), &status) == 0;
   if (exists && !and_below) {
-    paths_.insert(path);
+    paths_[path] = StampOf(status);
     return;
   }
   const std::string below = path + "/";
   paths_.erase(path);
   auto entry = paths_.lower_bound(below);
-  while (entry != paths_.end() && entry->compare(0, below.size(), below) == 0) {
+  while (entry != paths_.end() && entry->first.compare(0, below.size(), below) == 0) {
     entry = paths_.erase(entry);
   }
-  for (const std::string& found : ListTree(path, ignored_)) paths_.insert(found);
+  paths_.merge(StampTree(path, ignored_));
+}
+
+// Of what was told to be there.
+void DiskModel::Restamp(const std::string& path) {
+  const auto entry = paths_.find(path);
+  struct stat status {};
+  if (entry == paths_.end() || lstat(path.c_str(), &status) != 0) return;
+  entry->second = StampOf(status);
 }
 
 void DiskModel::OnChange(const notify::Change& change) {
   told_.push_back(InWords(change));
-  if ((change.kind & (EVENT_MODIFY | EVENT_ATTR)) != 0) return;
+  if ((change.kind & (EVENT_MODIFY | EVENT_ATTR)) != 0) return Restamp(change.path);
   const bool is_rename = change.kind == EVENT_RENAME;
   if (is_rename) LookAt(change.path_old, true);
   LookAt(change.path, change.is_dir || is_rename);

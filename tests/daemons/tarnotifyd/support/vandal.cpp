@@ -15,8 +15,32 @@ namespace {
 void Write(const std::string& path) {
   const int fd = open(path.c_str(), O_WRONLY | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600);
   if (fd < 0) return;
-  if (write(fd, "text", 4) < 0) errno = 0;
+  // Whoever writes to a file under one of its names is told of under this one only.
+  struct stat status {};
+  const bool is_alone = fstat(fd, &status) == 0 && status.st_nlink == 1;
+  if (is_alone && write(fd, "text", 4) < 0) errno = 0;
   close(fd);
+}
+
+void Touch(const std::string& path, unsigned how) {
+  const int fd = open(path.c_str(), O_WRONLY | O_APPEND | O_CLOEXEC | O_NOFOLLOW);
+  if (fd < 0) return;
+  struct stat status {};
+  if (fstat(fd, &status) == 0 && status.st_nlink == 1) {
+    if (how == 0 && fchmod(fd, status.st_mode ^ 0077) != 0) errno = 0;
+    if (how == 1 && futimens(fd, nullptr) != 0) errno = 0;
+    if (how == 2 && ftruncate(fd, status.st_size / 2) != 0) errno = 0;
+    if (how > 2 && write(fd, "more", 4) < 0) errno = 0;
+  }
+  close(fd);
+}
+
+// The kernel may tell of it in fewer steps.
+void MoveToAndFro(const std::string& one, const std::string& other) {
+  std::rename(one.c_str(), other.c_str());
+  std::rename(other.c_str(), one.c_str());
+  std::rename(one.c_str(), other.c_str());
+  Write(other + "/late");
 }
 
 }  // namespace
@@ -24,7 +48,7 @@ void Write(const std::string& path) {
 // Most of this fails most of the time: what it is done to does not exist, or is in the way.
 void Vandal::DoOne() {
   const std::string path = AnyPath();
-  switch (Below(10)) {
+  switch (Below(14)) {
     case 0:
     case 1:
     case 2:
@@ -38,6 +62,11 @@ void Vandal::DoOne() {
       std::filesystem::remove_all(path, error);
       return;
     }
+    case 6:
+      return MoveToAndFro(path, AnyPath());
+    case 7:
+    case 8:
+      return Touch(path, Below(6));
     default:
       return Move(path);
   }
