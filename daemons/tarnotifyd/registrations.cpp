@@ -59,18 +59,20 @@ bool ShortenAll(MonitorRegistration* registration) {
                      [](WatchedPlace& place) { return Shorten(&place.path); });
 }
 
-std::optional<MonitorRegistration> Load(const std::string& file) {
-  Json::Value document;
+// Whether an error of reading is about the file, not about the state of the system.
+bool IsLasting(int error) {
+  return error == EINVAL || error == EFBIG || error == ENOENT;
+}
+
+void PassOver(const std::string& file, const std::string& reason) {
+  daemon::LogError("Passing over " + file + ", which " + reason);
+}
+
+std::optional<MonitorRegistration> Parse(const std::string& file, const Json::Value& document) {
   MonitorRegistration registration;
-  if (!platform::ReadRegistrationFile(file, &document)) {
-    if (errno == ENOENT) return std::nullopt;
-    daemon::LogError("Passing over " + file +
-                     ", which cannot be read as a registration: " + std::strerror(errno));
-    return std::nullopt;
-  }
   platform::ParseRegistration(document, &registration);
   if (ShortenAll(&registration)) return registration;
-  daemon::LogError("Passing over " + file + ", which names a place that is no absolute path");
+  PassOver(file, "names a place that is no absolute path");
   return std::nullopt;
 }
 
@@ -111,13 +113,35 @@ bool Registrations::Refresh() {
       continue;
     }
     changed = true;
-    now.emplace(name, File{std::move(version), Load(name)});
+    File file = known != files_.end() ? std::move(known->second) : File();
+    Load(name, std::move(version), &file);
+    now.emplace(name, std::move(file));
   }
   files_ = std::move(now);
   if (!changed) return false;
   const QueuePlaces before = std::move(queues_);
   Collect();
   return queues_ != before;
+}
+
+// One that cannot be read for want of descriptors, for instance, holds as it was, and is read
+// again.
+void Registrations::Load(const std::string& name, std::string version, File* file) {
+  Json::Value document;
+  if (platform::ReadRegistrationFile(name, &document)) {
+    *file = {std::move(version), Parse(name, document), false};
+    return;
+  }
+  const int error = errno;
+  if (error != ENOENT && !file->failed) {
+    PassOver(name, std::string("cannot be read as a registration: ") + std::strerror(error));
+  }
+  if (IsLasting(error)) {
+    *file = {std::move(version), std::nullopt, false};
+  } else {
+    file->version.clear();
+    file->failed = true;
+  }
 }
 
 void Registrations::Collect() {

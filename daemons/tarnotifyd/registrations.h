@@ -36,9 +36,11 @@ class Registrations {
   struct File {
     std::string version;  // tells two contents of one name apart
     std::optional<platform::MonitorRegistration> registration;
+    bool failed = false;  // it could not be read the last time, though it may be next time
   };
 
   void Watch();
+  static void Load(const std::string& name, std::string version, File* file);
   void Collect();
 
   UniqueFd watch_;

@@ -63,6 +63,14 @@ class InotifyModelTest : public ::testing::Test {
     return text;
   }
 
+  static std::set<std::string> Below(const std::string& root, const std::set<std::string>& paths) {
+    std::set<std::string> below;
+    for (const std::string& path : paths) {
+      if (path == root || path.compare(0, root.size() + 1, root + "/") == 0) below.insert(path);
+    }
+    return below;
+  }
+
   std::string Told() const {
     std::string text = "\ntold:\n";
     for (const std::string& line : model_.Told()) text += line + "\n";
@@ -111,6 +119,37 @@ TEST_P(InotifySeedTest, KnowsTheDiskAfterAStorm) {
   storm.join();
   ASSERT_NO_FATAL_FAILURE(ExpectSame(GetParam()));
   ExpectAllWatched(GetParam());
+}
+
+// What is registered comes and goes itself, lies within another one, and exchanges things with it.
+TEST_P(InotifySeedTest, KnowsDirectoriesThatComeAndGo) {
+  const std::vector<std::string> roots{inside_ + "/a", inside_ + "/b", inside_ + "/b/c",
+                                       inside_ + "/c/d"};
+  const std::vector<std::string> without_nested{roots[0], roots[2], roots[3]};
+  source_.SetDirectories(roots, {"@eaDir"}, model_);
+  Vandal vandal(inside_, outside_, GetParam() + 2000);
+  std::mt19937 random(GetParam() + 3000);
+  for (int i = 0; i < 500; ++i) {
+    vandal.DoOne();
+    if (random() % 4 == 0) source_.Read(model_);
+    if (random() % 10 == 0) source_.Refresh(model_);
+    if (random() % 50 == 0) {
+      source_.SetDirectories(random() % 2 == 0 ? roots : without_nested, {"@eaDir"}, model_);
+    }
+  }
+  source_.SetDirectories(roots, {"@eaDir"}, model_);
+  for (int i = 0; i < 3; ++i) {
+    test::ReadAll(source_, model_);
+    source_.Refresh(model_);
+  }
+  test::ReadAll(source_, model_);
+  for (const std::string& root : roots) {
+    if (!std::filesystem::is_directory(std::filesystem::symlink_status(root))) continue;
+    const std::set<std::string> disk = test::ListTree(root, kIgnored);
+    const std::set<std::string> known = Below(root, model_.Paths());
+    ASSERT_TRUE(known == disk) << "seed " << GetParam() << "\nnot told of: " << Beyond(disk, known)
+                               << "\nnot told to be gone: " << Beyond(known, disk) << Told();
+  }
 }
 
 INSTANTIATE_TEST_SUITE_P(Seeds, InotifySeedTest, ::testing::Range(0U, 12U));

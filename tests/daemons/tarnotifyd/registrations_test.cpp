@@ -80,6 +80,24 @@ TEST_F(RegistrationsTest, WhatCannotBeListedHolds) {
   EXPECT_EQ(registrations_.Queues().size(), 1U);
 }
 
+// As for want of descriptors: what was registered is not withdrawn by that.
+TEST_F(RegistrationsTest, WhatCannotBeReadForNowHolds) {
+  Put("a.json", Text("/q", "/v/a"));
+  registrations_.Refresh();
+  std::filesystem::remove(directory_ + "/a.json");
+  std::filesystem::create_symlink("a.json", directory_ + "/a.json");
+  for (int i = 0; i < 2; ++i) {
+    EXPECT_FALSE(registrations_.Refresh());
+    EXPECT_EQ(registrations_.Queues().size(), 1U);
+  }
+  Put("a.json", Text("/q", "/v/b"));
+  EXPECT_TRUE(registrations_.Refresh());
+  EXPECT_EQ(registrations_.Queues().at("/q").at(0).path, "/v/b");
+  std::filesystem::remove(directory_ + "/a.json");
+  EXPECT_TRUE(registrations_.Refresh());
+  EXPECT_TRUE(registrations_.Queues().empty());
+}
+
 TEST_F(RegistrationsTest, PathsAreBroughtIntoTheirShortestForm) {
   Put("a.json", Text("/q/./x//y", "/v//a/../b/"));
   EXPECT_TRUE(registrations_.Refresh());
