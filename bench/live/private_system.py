@@ -162,6 +162,11 @@ class PrivateSystem:
     def log(self):
         return self._log.read_text(errors="replace")
 
+    def shortages(self):
+        """What the monitor could not watch, as when others use up the user's inotify watches: it
+        finds changes there later than a check waits."""
+        return [line for line in self.log().splitlines() if "can be watched: " in line]
+
     def index(self, name):
         """Makes a directory of files a share and indexes the whole of it."""
         share = self.files / name

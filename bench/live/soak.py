@@ -161,7 +161,7 @@ def check_source(options, source):
         print("disturbed by", disturber.counts, "left with",
               [len(tree.files) for tree in trees], "files")
         print("files that are new:", sorted(files_end - files_before))
-        failures = leaks(middle, end) + shares_differ(system, trees)
+        failures = leaks(middle, end) + shares_differ(system, trees) + system.shortages()
         if end["files"] > before["files"]:
             failures.append(f"{end['files'] - before['files']} files more than before")
         return failures

@@ -78,6 +78,7 @@ def run_once(options, source, seed, with_kills):
         system.wait_idle(options.patience)
         found = comparison.differences(system, share)
         found += comparison.search_differences(system, share, *tree.sample(_SAMPLE))
+        found += system.shortages()
     report.row(seed, source, killer.kills, options.files, f"{stormed:.1f}",
                f"{time.monotonic() - begun:.1f}", len(tree.files), len(found), widths=WIDTHS)
     return comparison.shorten(found, f"seed {seed}, {source}, {killer.kills} kills")
