@@ -11,6 +11,9 @@ namespace {
 // A reader of files that was started anew meanwhile does better the second time.
 constexpr int kAttempts = 2;
 
+// A document that is set aside must still go when its file has gone.
+constexpr char kRemoval[] = " (removal)";
+
 }  // namespace
 
 DocumentWriter::DocumentWriter(Index& index, FileSystem& files, TaskLane& lane, Progress& progress,
@@ -22,42 +25,47 @@ DocumentWriter::DocumentWriter(Index& index, FileSystem& files, TaskLane& lane, 
       aside_(aside),
       may_remove_(std::move(may_remove)) {}
 
-void DocumentWriter::Submit(const std::string& path, std::function<void()> change) {
+void DocumentWriter::Submit(const std::string& path, const std::string& name,
+                            std::function<void()> change) {
   progress_.AddWaiting(path);
-  lane_.Submit(path, [this, path, change = std::move(change)] {
+  lane_.Submit(path, [this, path, name, change = std::move(change)] {
     progress_.Begin(path);
-    aside_.Try(path, change);
+    aside_.Try(name, change);
     progress_.TakeWaiting(path);
   });
 }
 
 void DocumentWriter::Upsert(const std::string& path, bool need_meta) {
-  Submit(path, [this, path, need_meta] { UpsertNow(path, need_meta); });
+  Submit(path, path, [this, path, need_meta] { UpsertNow(path, need_meta); });
 }
 
 void DocumentWriter::ReplaceDirectory(const std::string& path, bool need_meta) {
   may_remove_();
-  Submit(path, [this, path, need_meta] {
+  Submit(path, path, [this, path, need_meta] {
     index_.DeleteBelow(path);
     UpsertNow(path, need_meta);
   });
 }
 
 void DocumentWriter::SetAttributes(const std::string& path) {
-  Submit(path, [this, path] { SetAttributesNow(path); });
+  Submit(path, path, [this, path] { SetAttributesNow(path); });
 }
 
 void DocumentWriter::Remove(const std::string& path) {
   may_remove_();
-  Submit(path, [this, path] {
+  Submit(path, path + kRemoval, [this, path] {
     index_.Delete(path);
+    aside_.Forget(path, false);
     progress_.Done(path);
   });
 }
 
 void DocumentWriter::RemoveTree(const std::string& path) {
   may_remove_();
-  Submit(path, [this, path] { RemoveTreeNow(path); });
+  Submit(path, path + kRemoval, [this, path] {
+    RemoveTreeNow(path);
+    aside_.Forget(path, true);
+  });
 }
 
 void DocumentWriter::Rename(const std::string& new_path, const std::string& old_path) {

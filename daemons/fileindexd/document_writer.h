@@ -42,7 +42,7 @@ class DocumentWriter {
   void Rename(const std::string& new_path, const std::string& old_path);
 
  private:
-  void Submit(const std::string& path, std::function<void()> change);
+  void Submit(const std::string& path, const std::string& name, std::function<void()> change);
   void UpsertNow(const std::string& path, bool need_meta);
   void SetAttributesNow(const std::string& path);
   void RemoveTreeNow(const std::string& path);

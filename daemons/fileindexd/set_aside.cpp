@@ -61,6 +61,14 @@ bool SetAside::Has(const std::string& name) const {
   return found != troubles_.end() && found->second.aside;
 }
 
+void SetAside::Forget(const std::string& path, bool below) {
+  const std::lock_guard<std::mutex> lock(mutex_);
+  troubles_.erase(path);
+  if (!below) return;
+  const std::string dir = path + '/';
+  std::erase_if(troubles_, [&](const auto& entry) { return entry.first.rfind(dir, 0) == 0; });
+}
+
 // Only the first failure of a pass is surely one: it ends whatever else is being done.
 void SetAside::Blame(const std::string& name, const std::string& error) {
   const std::lock_guard<std::mutex> lock(mutex_);

@@ -15,10 +15,11 @@
 
 namespace quarry::fileindexd {
 
-// Pieces of work are named for people: "/v/s/a.txt" for a document, "/v/s/d/" for comparing a
-// directory, "/v/s/a -> /v/s/b" for a move. One at which several passes have failed, and whose own
-// fault that may be, is set aside: it is left out until GiveAnotherChance(). All members may be
-// called from any thread; BeginPass() to Failed() belong to one pass at a time.
+// Pieces of work are named for people: "/v/s/a.txt" for a document, "/v/s/a.txt (removal)" for
+// removing it, "/v/s/d/" for comparing a directory, "/v/s/a -> /v/s/b" for a move. One at which
+// several passes have failed, and whose own fault that may be, is set aside: it is left out until
+// GiveAnotherChance(). All members may be called from any thread; BeginPass() to Failed() belong to
+// one pass at a time.
 class SetAside {
  public:
   using TimePoint = std::chrono::steady_clock::time_point;
@@ -36,6 +37,8 @@ class SetAside {
   void BeginPass(bool can_read);
   // Does the work unless it is set aside. Throws what the work throws.
   void Try(const std::string& name, const std::function<void()>& work);
+  // The document of that path, and with `below` all below it, is gone, and its troubles with it.
+  void Forget(const std::string& path, bool below);
   // The pass is over. After a failure returns what was set aside for it.
   void Succeeded();
   std::optional<Work> Failed();

@@ -124,10 +124,8 @@ Survey::Rules Worker::CurrentRules() {
 }
 
 void Worker::ClaimReindex() {
-  if (aside_.IsDue()) {
-    aside_.GiveAnotherChance();
-    check_status_ = true;
-  }
+  if (aside_.IsDue()) aside_.GiveAnotherChance();
+  if (aside_.IsEmpty() && std::exchange(marked_, false)) check_status_ = true;
   if (!check_status_.exchange(false)) return;
   try {
     FollowMark(parts_.host->NeedsReindex());
@@ -221,6 +219,7 @@ void Worker::MarkForSetAside() {
   if (!mark_missing_) return;
   parts_.host->MarkNeedsReindex();
   mark_missing_ = false;
+  marked_ = true;
 }
 
 // Also where there is nothing left to do, as after a folder list that could not be loaded.

@@ -93,6 +93,7 @@ class Worker {
   std::uint64_t compares_asked_ = 1;
   std::uint64_t compares_done_ = 0;
   bool mark_missing_ = false;  // something was set aside, but the share is not yet marked
+  bool marked_ = false;        // it is, and nothing has asked since whether that still holds
   int missing_index_ = 0;      // passes in a row that failed for want of it
   std::string last_error_;
   Milliseconds backoff_{0};

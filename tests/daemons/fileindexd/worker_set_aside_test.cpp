@@ -11,6 +11,8 @@ namespace {
 
 using fileindex::EVENT_ATTR;
 using fileindex::EVENT_CREATE;
+using fileindex::EVENT_DELETE;
+using fileindex::EVENT_MODIFY;
 using fileindex::EVENT_REINDEX;
 using fileindex::EVENT_RENAME;
 using std::chrono::milliseconds;
@@ -98,6 +100,53 @@ TEST_F(PoisonTest, WhoTakesTheMarkAwayHasEverythingTriedAgain) {
   ExpectInLine();
   EXPECT_TRUE(SetAside().empty());
   EXPECT_FALSE(host_.NeedsReindex());
+}
+
+TEST_F(PoisonTest, IsForgottenWhenItsFileHasGone) {
+  StepsUntilSetAside();
+  StepUntilAtRest();
+  disk_.Remove("/v/s/b.txt");
+  Queue(EVENT_DELETE, "/v/s/b.txt");
+  worker_->Step();
+  EXPECT_TRUE(SetAside().empty());
+  StepUntilAtRest();
+  EXPECT_FALSE(host_.NeedsReindex());
+  ExpectInLine();
+}
+
+TEST_F(PoisonTest, IsRemovedAndForgottenWithTheDirectoryAboveIt) {
+  index_.SetHook(nullptr);
+  StepUntilAtRest();
+  disk_.WriteFile("/v/s/d/x.txt");
+  Queue(EVENT_CREATE, "/v/s/d", true);
+  worker_->Step();
+  disk_.WriteFile("/v/s/d/x.txt");
+  Queue(EVENT_MODIFY, "/v/s/d/x.txt");
+  Poison("upsert /v/s/d/x.txt content", Error(engine::kInternalFailure, "cannot"));
+  StepsUntilSetAside();
+  StepUntilAtRest();
+  ASSERT_EQ(1U, index_.All().count("/v/s/d/x.txt"));
+  disk_.Remove("/v/s/d");
+  Queue(EVENT_DELETE, "/v/s/d", true);
+  worker_->Step();
+  EXPECT_TRUE(SetAside().empty());
+  StepUntilAtRest();
+  EXPECT_FALSE(host_.NeedsReindex());
+  ExpectInLine();
+}
+
+TEST_F(PoisonTest, ARemovalThatFailsIsSetAsideToo) {
+  index_.SetHook(nullptr);
+  StepUntilAtRest();
+  disk_.Remove("/v/s/b.txt");
+  disk_.WriteFile("/v/s/d.txt");
+  Queue(EVENT_DELETE, "/v/s/b.txt");
+  Queue(EVENT_CREATE, "/v/s/d.txt");
+  Poison("delete /v/s/b.txt", Error(engine::kInternalFailure, "cannot"));
+  StepsUntilSetAside();
+  StepUntilAtRest();
+  EXPECT_EQ("/v/s/b.txt (removal)", SetAside()[0]["path"].asString());
+  EXPECT_EQ(1U, index_.All().count("/v/s/d.txt"));
 }
 
 TEST_F(PoisonTest, WhatFailsThenIsSetAsideAtOnce) {
