@@ -187,8 +187,9 @@ bool MountedDirectories::OpenEntrances() {
 
 // What is not there any more is passed over: whoever watches it will notice.
 bool MountedDirectories::OpenEntrance(const std::string& path) {
-  UniqueFd fd(open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));  // O_PATH does not do
-  if (!fd.valid()) return errno == ENOENT || errno == ENOTDIR;
+  // O_PATH does not do.
+  UniqueFd fd(open(path.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+  if (!fd.valid()) return IsGone(errno);
   struct stat status {};
   if (fstat(fd.get(), &status) != 0) return false;
   if (status.st_dev != device_) return true;

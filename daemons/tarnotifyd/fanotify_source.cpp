@@ -1,6 +1,5 @@
 #include "daemons/tarnotifyd/fanotify_source.h"
 
-#include <fcntl.h>
 #include <sys/epoll.h>
 #include <sys/stat.h>
 
@@ -13,6 +12,7 @@
 #include "common/error.h"
 #include "daemons/common/log.h"
 #include "daemons/common/system_error.h"
+#include "daemons/tarnotifyd/directory_scan.h"
 
 namespace quarry::notify {
 namespace {
@@ -121,7 +121,7 @@ void FanotifySource::Check(ChangeSink& sink) {
 }
 
 void FanotifySource::Check(Watch& watch, ChangeSink& sink) {
-  const UniqueFd fd(open(watch.path.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+  const UniqueFd fd = OpenDirectory(watch.path);
   const Finding finding = Look(fd.get());
   if (watch.finding == finding) return;
   Unbind(watch);

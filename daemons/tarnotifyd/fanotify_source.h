@@ -22,6 +22,8 @@ namespace quarry::notify {
 // too. directory_tree.h says which paths are told and why nothing is lost by them. Changes of the
 // watched directories themselves are told as changes of their attributes and as doubt.
 //
+// A symbolic link in the place of a watched directory is not followed: there is no directory.
+//
 // No directory is kept open from one call to the next, so everything can be unmounted. Refresh()
 // and SetDirectories() look at every watched directory, and block where its file system does.
 class FanotifySource : public ChangeSource {

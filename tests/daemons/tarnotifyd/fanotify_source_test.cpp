@@ -286,6 +286,19 @@ TEST_F(FanotifySourceTest, LinkIsACreationAndNothingElse) {
   EXPECT_THAT(Told(), IsEmpty());
 }
 
+TEST_F(FanotifySourceTest, LinkInThePlaceOfADirectoryIsNotFollowed) {
+  const std::string place = scratch_ / "place";
+  test::MakeDirs(place);
+  if (!Start({inside_, place}, model_)) return;
+  rmdir(place.c_str());
+  ASSERT_EQ(symlink(outside_.c_str(), place.c_str()), 0);
+  source_->Refresh(model_);
+  EXPECT_THAT(source_->Unwatchable(), IsEmpty());
+  Told();
+  test::WriteFile(outside_ + "/f", "");
+  EXPECT_THAT(Told(), IsEmpty());
+}
+
 TEST_F(FanotifySourceTest, DirectoryThatIsAwayForAMoment) {
   const std::string place = scratch_ / "above/place";
   test::MakeDirs(place);
