@@ -55,6 +55,18 @@ def children_of(pid):
     return result
 
 
+def is_working(pid):
+    """Whether a thread of the process runs, or could if a processor were free."""
+    try:
+        for thread in os.listdir(f"/proc/{pid}/task"):
+            with open(f"/proc/{pid}/task/{thread}/stat", encoding="utf-8") as fields:
+                if fields.read().rpartition(")")[2].split()[0] in "RD":
+                    return True
+    except OSError:
+        pass  # it has ended
+    return False
+
+
 def memory_of(pid):
     """Proportional set size in bytes: memory that processes share is counted once among them. Where
     that may not be read, the resident size."""
@@ -131,6 +143,10 @@ class Program:
     def running(self):
         """Whether the command itself is."""
         return os.path.exists(f"/proc/{self._pid}/exe") and self._keeper.poll() is None
+
+    def is_working(self):
+        """Whether any process of it has something to do at this moment."""
+        return any(map(is_working, process_tree(self._keeper.pid)))
 
     def wait(self, deadline, log):
         """Waits until the command ends by itself; what it has cost. It is ended at the deadline, in

@@ -68,7 +68,7 @@ class LocalSearchAllText(LocalSearch):
     """With settings that make it read all text of the corpus, as the others do."""
 
     name = "localsearch-all"
-    title = "LocalSearch, all text"
+    variant = "all text"
 
     def settings(self):
         return super().settings() + "\n[org/freedesktop/tracker/extract]\n" + ALL_TEXT

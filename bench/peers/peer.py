@@ -23,10 +23,10 @@ class Outcome:
 
 
 class Peer:
-    """One program. name, title and packages are of the class; an object is one index of its own
+    """One program. name, title, variant and packages are of the class; an object is one index of its own
     below a place, which nothing else uses."""
 
-    name = title = ""
+    name = title = variant = ""
     packages = ()
 
     def __init__(self, place, corpus, deadline):
@@ -47,6 +47,11 @@ class Peer:
         raise NotImplementedError
 
     @classmethod
+    def label(cls):
+        """What the program is called in a table."""
+        return f"{cls.title} {cls.version()}" + (", " + cls.variant if cls.variant else "")
+
+    @classmethod
     def version(cls):
         """Of the Debian package, without its revision."""
         text = subprocess.run(["dpkg-query", "-W", "-f=${Version}", cls.packages[0]], check=False,
@@ -65,13 +70,14 @@ class Peer:
         return Outcome(cost, bytes_on_disk(self.index_directory()), found)
 
     def wait_until(self, program, is_done):
-        """Ends the program when is_done() was true for SETTLED_SECONDS without a break, or at the
-        deadline. Returns the cost; its wall time is up to the moment when it became done."""
+        """Ends the program when for SETTLED_SECONDS without a break is_done() was true and no process
+        worked, or at the deadline. Returns the cost; its wall time is up to the moment when it became
+        done."""
         done_at = None
         while program.seconds() < self.deadline:
             if not program.running():
                 raise Failure(f"{self.title} has ended by itself; see {self.log}")
-            if not is_done():
+            if program.is_working() or not is_done():
                 done_at = None
             elif done_at is None:
                 done_at = program.seconds()

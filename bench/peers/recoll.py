@@ -37,5 +37,5 @@ class RecollBuffered(Recoll):
     """Collects 300 MB of text before it writes, which it recommends where there is memory."""
 
     name = "recoll-300"
-    title = "Recoll, 300 MB buffer"
+    variant = "300 MB buffer"
     settings = "idxflushmb = 300\n"
