@@ -25,7 +25,9 @@ void Suggest(const std::vector<std::string>& shares, bool json) {
   fileindex::UpdateTermSuggestion(ids);
   Json::Value result;
   result["indexes"] = Vec2JsonArr<std::string>(ids);
-  PrintDone(json, "Refreshed the words to suggest (" + std::to_string(ids.size()) + " shares).",
+  PrintDone(json,
+            "Refreshed the words to suggest (" + std::to_string(ids.size()) +
+                (ids.size() == 1 ? " share)." : " shares)."),
             result);
 }
 
