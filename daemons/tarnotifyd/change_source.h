@@ -53,8 +53,9 @@ class ChangeSource {
 
   // Watches these directories, whole, in place of the earlier ones: full paths without a "/" at the
   // end, some perhaps below others. `ignore` names need not be watched at any depth. Every
-  // directory that was not among the earlier ones is told to the sink as doubtful once it is
-  // watched, now or by a later Read() or Refresh(); one that was stays watched without a gap.
+  // directory that was not among the earlier ones is told to the sink as doubtful, by
+  // itself or with one above it, once it is watched, now or by a later Read() or Refresh(); one
+  // that was stays watched without a gap.
   virtual void SetDirectories(const std::vector<std::string>& directories,
                               const std::vector<std::string>& ignore, ChangeSink& sink) = 0;
 

@@ -236,8 +236,8 @@ void InotifySource::SetDirectories(const std::vector<std::string>& directories,
   std::unordered_set<std::string> ignored(ignore.begin(), ignore.end());
   const bool same_ignored = ignored == ignore_;
   ignore_ = std::move(ignored);
-  DoubtCovered(before, sink);
   if (same_ignored && watches_) {
+    DoubtCovered(before, sink);
     FollowRoots(sink);
   } else {
     BeginAnew(sink);
@@ -245,26 +245,27 @@ void InotifySource::SetDirectories(const std::vector<std::string>& directories,
   ArmTimer();
 }
 
-// Directories that are new to be watched, but lie in one that is watched already.
+// Directories that are new to be watched, but lie in one that is watched already. Of those in one
+// that is new itself the doubt about that one tells.
 void InotifySource::DoubtCovered(const std::vector<std::string>& before, ChangeSink& sink) const {
   for (const std::string& path : directories_) {
-    if (IsWanted(path) || std::binary_search(before.begin(), before.end(), path)) continue;
-    sink.OnDoubt(path);
+    if (std::binary_search(before.begin(), before.end(), path)) continue;
+    if (std::binary_search(before.begin(), before.end(), Above(path))) sink.OnDoubt(path);
   }
 }
 
-// Whether the directory is to be watched by itself: not as a part of another one.
-bool InotifySource::IsWanted(const std::string& path) const {
+// The directory that is to be watched of which this one is a part, the nearest one; "" when it is
+// to be watched by itself.
+std::string InotifySource::Above(const std::string& path) const {
   std::size_t end = path.rfind('/');
   while (end != std::string::npos && end > 0) {
     const std::size_t next = path.find('/', end + 1);
-    if (ignore_.count(path.substr(end + 1, next - end - 1)) > 0) return true;
-    if (std::binary_search(directories_.begin(), directories_.end(), path.substr(0, end))) {
-      return false;
-    }
+    if (ignore_.count(path.substr(end + 1, next - end - 1)) > 0) return {};
+    std::string above = path.substr(0, end);
+    if (std::binary_search(directories_.begin(), directories_.end(), above)) return above;
     end = path.rfind('/', end - 1);
   }
-  return true;
+  return {};
 }
 
 void InotifySource::Refresh(ChangeSink& sink) {
@@ -309,7 +310,7 @@ void InotifySource::FollowRoot(const std::string& path, ChangeSink& sink) {
   DirectoryId now;
   const bool exists = IdentifyPath(path, &now);
   if (!exists && !IsGone(errno)) return;  // for want of descriptors, for instance
-  const bool is_wanted = exists && (IsWanted(path) || (now.is_mount && IsMountPoint(path)));
+  const bool is_wanted = exists && (Above(path).empty() || (now.is_mount && IsMountPoint(path)));
   const auto root = roots_.find(path);
   const bool is_known = root != roots_.end();
   if (is_known) {

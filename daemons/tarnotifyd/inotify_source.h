@@ -67,7 +67,7 @@ class InotifySource : public ChangeSource {
   void AddIfThere(Id directory, const std::string& name, ChangeSink& sink);
   std::string PathOf(Id directory, const std::string& name) const;
 
-  bool IsWanted(const std::string& path) const;
+  std::string Above(const std::string& path) const;
   void FollowRoots(ChangeSink& sink);
   void FollowRoot(const std::string& path, ChangeSink& sink);
   bool IsAsWatched(const Root& root, const DirectoryId& now) const;

@@ -253,7 +253,7 @@ TEST_F(InotifySourceTest, ADirectoryAboveTheRootTakesItAlong) {
 TEST_F(InotifySourceTest, NestedDirectoriesAreWatchedOnce) {
   test::MakeDirs(top_ + "/a/b");
   source_.SetDirectories({top_, top_ + "/a"}, {}, model_);
-  EXPECT_THAT(Told(), Contains("doubt " + top_));
+  EXPECT_THAT(Told(), ElementsAre("doubt " + top_));
   WriteFile(top_ + "/a/f", "x");
   EXPECT_THAT(Told(), ElementsAre("create file " + top_ + "/a/f"));
   // What is new, but watched already, is told at once.
