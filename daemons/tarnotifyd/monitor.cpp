@@ -141,7 +141,8 @@ void Monitor::TakeOver(const QueuePlaces& queues) {
   for (const auto& [queue, places] : queues) {
     const auto known = queues_.find(queue);
     if (known == queues_.end()) {
-      feeds.push_back(std::make_unique<QueueFeed>(queue));
+      feeds.push_back(std::make_unique<QueueFeed>(
+          queue, [this, name = queue] { return registrations_.IsStillThere(name); }));
     } else {
       feeds.push_back(
           std::move(feeds_[static_cast<std::size_t>(std::distance(queues_.begin(), known))]));

@@ -65,7 +65,8 @@ void QueueFeed::Write(Clock::time_point now) {
     waiting_ += fold_.Ready();
     unwritten_ += QueueLines(fold_.Take());
   }
-  switch (AppendToQueue(queue_, doubtful_ ? OverflowLine(doubtful_directory_) : unwritten_)) {
+  const std::string lines = doubtful_ ? OverflowLine(doubtful_directory_) : unwritten_;
+  switch (AppendToQueue(queue_, lines, is_wanted_)) {
     case WriteResult::kBusy:
       not_before_ = now + kLockPause;
       return;

@@ -6,8 +6,10 @@
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <optional>
 #include <string>
+#include <utility>
 
 #include "daemons/tarnotifyd/change_fold.h"
 #include "daemons/tarnotifyd/change_source.h"
@@ -26,7 +28,9 @@ class QueueFeed {
   // Changes that wait at most for somebody else's lock. Beyond that they are given up.
   static constexpr std::size_t kMaxWaiting = std::size_t{1} << 16;
 
-  explicit QueueFeed(const std::string& queue) : queue_(queue) {}
+  // `is_wanted` tells whether the queue is still to be written, also after it was taken away.
+  QueueFeed(const std::string& queue, std::function<bool()> is_wanted)
+      : queue_(queue), is_wanted_(std::move(is_wanted)) {}
 
   void Add(const Change& change, Clock::time_point now);
 
@@ -54,6 +58,7 @@ class QueueFeed {
   void Fail(Clock::time_point now);
 
   const std::string queue_;
+  const std::function<bool()> is_wanted_;
   ChangeFold fold_;
   Clock::time_point gathering_since_{};
   std::string unwritten_;    // lines that wait for the lock, and

@@ -34,6 +34,11 @@ UniqueFd LockQueue(const std::string& queue) {
   return UniqueFd();
 }
 
+bool IsEmpty(int fd) {
+  struct stat status {};
+  return fstat(fd, &status) == 0 && status.st_size == 0;
+}
+
 // The last line of the file without its end, "" when it is torn or too long to be an overflow.
 std::string LastLine(int fd) {
   struct stat status {};
@@ -79,10 +84,15 @@ std::string OverflowLine(const std::string& directory) {
   return Line(fileindex::EVENT_OVERFLOW, true, directory, "");
 }
 
-WriteResult AppendToQueue(const std::string& queue, const std::string& lines) {
+WriteResult AppendToQueue(const std::string& queue, const std::string& lines,
+                          const std::function<bool()>& is_wanted) {
   const UniqueFd fd = LockQueue(queue);
   if (!fd.valid()) {
     return errno == EWOULDBLOCK || errno == EINTR ? WriteResult::kBusy : WriteResult::kFailed;
+  }
+  if (IsEmpty(fd.get()) && !is_wanted()) {
+    unlink(queue.c_str());
+    return WriteResult::kDone;
   }
   if (EndsInOverflow(fd.get())) return WriteResult::kDone;
   int cut_error = 0;

@@ -3,6 +3,7 @@
 #ifndef QUARRY_DAEMONS_TARNOTIFYD_QUEUE_FILE_H_
 #define QUARRY_DAEMONS_TARNOTIFYD_QUEUE_FILE_H_
 
+#include <functional>
 #include <string>
 #include <vector>
 
@@ -24,9 +25,11 @@ enum class WriteResult {
 };
 
 // Takes the queue's lock, opens the queue anew under it, so that no line lands in a snapshot, and
-// appends the lines, all of them or none. Creates the queue if it is missing. Does not wait for the
-// lock.
-WriteResult AppendToQueue(const std::string& queue, const std::string& lines);
+// appends the lines, all of them or none. Creates the queue if it is missing; but one that is
+// missing or empty, and by now not `is_wanted`, is removed instead, which is kDone too: whoever
+// gave it up would leave it behind for ever. Does not wait for the lock.
+WriteResult AppendToQueue(const std::string& queue, const std::string& lines,
+                          const std::function<bool()>& is_wanted);
 
 }  // namespace quarry::notify
 

@@ -124,6 +124,13 @@ bool Registrations::Refresh() {
   return queues_ != before;
 }
 
+bool Registrations::IsStillThere(const std::string& queue) const {
+  return std::any_of(files_.begin(), files_.end(), [&](const auto& entry) {
+    const auto& registration = entry.second.registration;
+    return registration && registration->queue == queue && !VersionOf(entry.first).empty();
+  });
+}
+
 // One that cannot be read for want of descriptors, for instance, holds as it was, and is read
 // again.
 void Registrations::Load(const std::string& name, std::string version, File* file) {

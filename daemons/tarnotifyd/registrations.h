@@ -32,6 +32,9 @@ class Registrations {
 
   const QueuePlaces& Queues() const { return queues_; }
 
+  // Whether a registration for the queue that was there at the last Refresh() still is.
+  bool IsStillThere(const std::string& queue) const;
+
  private:
   struct File {
     std::string version;  // tells two contents of one name apart

@@ -112,8 +112,9 @@ void MoveShare(const std::string& name, const std::string& new_path) {
 
 // A line that came too late is no loss: the worker of a share that has moved compares all of it.
 void CleanUpShareMove(const std::string& old_path) {
-  RemoveQueue(old_path);
+  // The monitor makes no queue anew that is not registered any more.
   if (!RemoveRegistrations(QueueOf(old_path))) SystemFailure("Cannot withdraw from the monitor");
+  RemoveQueue(old_path);
 }
 
 void MoveWatches(const std::string& share_path, const std::string& old_path,

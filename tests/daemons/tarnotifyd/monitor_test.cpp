@@ -124,6 +124,19 @@ TEST_F(MonitorTest, WhatIsWithdrawnIsNotWatched) {
   EXPECT_THAT(Take("a"), ElementsAre());
 }
 
+// As when the share has got another name, and its queue with it.
+TEST_F(MonitorTest, WhatIsWithdrawnBeforeItsLinesAreWrittenLeavesNoQueue) {
+  Follow("a", {Place("/v/a")});
+  std::filesystem::remove(QueuePath("a"));
+  source_->Tell([&](ChangeSink& sink) {
+    sink.OnChange({EVENT_CREATE, false, false, "/v/a/b", ""});
+    ASSERT_TRUE(MonitorQueue::Delete(QueuePath("a"), "fileindex", MONITOR_QUEUE_TYPE_APPLICATION));
+  });
+  monitor_.Step(0);
+  monitor_.Finish();
+  EXPECT_FALSE(std::filesystem::exists(QueuePath("a")));
+}
+
 TEST_F(MonitorTest, ADamagedRegistrationIsPassedOver) {
   Follow("a", {Place("/v/a")});
   const std::string directory = test::TestRoot() + "/var/lib/quarry/monitor/";

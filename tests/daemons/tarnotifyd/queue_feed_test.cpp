@@ -61,7 +61,8 @@ class QueueFeedTest : public ::testing::Test {
 
   test::TempDir scratch_;
   const std::string queue_ = scratch_ / "queue";
-  QueueFeed feed_{queue_};
+  bool is_wanted_ = true;
+  QueueFeed feed_{queue_, [this] { return is_wanted_; }};
   Clock::time_point now_ = Clock::now();
 };
 
@@ -101,6 +102,21 @@ TEST_F(QueueFeedTest, NothingLandsInASnapshot) {
   Create("/b");
   EXPECT_EQ(QueueAfter(QueueFeed::kGather), CreateLine("/b"));
   EXPECT_EQ(test::ReadFile(queue_ + ".tmp"), CreateLine("/a"));
+}
+
+TEST_F(QueueFeedTest, AQueueThatWasGivenUpIsNotMadeAnew) {
+  is_wanted_ = false;
+  Create("/a");
+  EXPECT_EQ(QueueAfter(QueueFeed::kGather), "none");
+  EXPECT_EQ(feed_.Due(), now_ - QueueFeed::kGather + ChangeFold::kPause);
+}
+
+TEST_F(QueueFeedTest, WhatWaitsInAQueueIsNeverGivenUp) {
+  Create("/a");
+  QueueAfter(QueueFeed::kGather);
+  is_wanted_ = false;
+  Create("/b");
+  EXPECT_EQ(QueueAfter(QueueFeed::kGather), CreateLine("/a") + CreateLine("/b"));
 }
 
 TEST_F(QueueFeedTest, WaitsForTheLockWithoutBlocking) {
