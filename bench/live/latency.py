@@ -107,6 +107,8 @@ def measure(options, source):
         system.wait_idle()
         moments = random.Random(options.seed)
         for kind in Changes.KINDS:
+            if options.kind not in ("all", kind.__name__):
+                continue
             times = []
             for _ in range(options.changes):
                 # Not in step with anything that looks for work from time to time.
@@ -134,6 +136,9 @@ def check(options):
 if __name__ == "__main__":
     arguments = report.parser(
         __doc__ + f" Fails when more than 1 % of one kind take {BOUND_MS} ms or longer.",
-        ["scripts/live latency", "scripts/live latency --changes 50 --source inotify"])
+        ["scripts/live latency", "scripts/live latency --changes 50 --source inotify",
+         "scripts/live latency --kind chmod"])
     arguments.add_argument("--changes", type=int, default=1000, help="of each kind")
+    arguments.add_argument("--kind", choices=("all", *(kind.__name__ for kind in Changes.KINDS)),
+                           default="all", help="of change")
     report.run(check, arguments.parse_args())

@@ -41,10 +41,14 @@ class Peer:
 
     def ask(self, message, seconds=60):
         """The answer's data. Raises OSError when nobody answers, CheckFailed when refused."""
+        was_open = self._socket is not None
         try:
             answer = self._exchange(message, seconds)
         except OSError:
             self.close()
+            # A daemon closes a connection that was silent for long, and every one when it ends.
+            if was_open:
+                return self.ask(message, seconds)
             raise
         if not answer.get("success"):
             raise CheckFailed(f"{message} is answered {answer.get('error')}")
@@ -221,13 +225,13 @@ class PrivateSystem:
         return pid is not None
 
     def queues(self):
-        """Bytes that wait in queues and snapshots."""
+        """The queues and snapshots in which something waits."""
         queues = self.root / "var/lib/quarry/queue"
-        return sum(size_of(file) for file in queues.iterdir()) if queues.exists() else 0
+        return [file for file in queues.iterdir() if size_of(file)] if queues.exists() else []
 
     def is_idle(self):
         progress = self.progress()
-        return (progress is not None and self.queues() == 0 and len(self.pids()) == len(DAEMONS) and
+        return (progress is not None and not self.queues() and len(self.pids()) == len(DAEMONS) and
                 all(share["state"] in ("idle", "stopped") for share in progress["shares"]))
 
     def wait_idle(self, seconds=600, settled=2.0):
@@ -247,7 +251,8 @@ class PrivateSystem:
         try:
             wait_until(settled_down, seconds, "an idle system", pause=0.05)
         except CheckFailed as failure:
-            raise CheckFailed(f"{failure}; {self.progress()}; queues hold {self.queues()} bytes")
+            waiting = {file.name: file.read_bytes()[:500] for file in self.queues()}
+            raise CheckFailed(f"{failure}; {self.progress()}; in queues: {waiting}")
 
 
 def size_of(path):
