@@ -33,7 +33,7 @@ def wait_until(condition, seconds, what, pause=0.01):
 
 
 class Peer:
-    """One connection to a daemon, made anew when it breaks. Text that is not UTF-8 goes both ways."""
+    """One connection to a daemon, made anew when it breaks. Text need not be UTF-8."""
 
     def __init__(self, address):
         self._address = address
@@ -204,7 +204,8 @@ class PrivateSystem:
 
     def pause_for(self, seconds):
         try:
-            self._index_daemon.ask({"type": "pause", "data": {"resume_time": int(time.time()) + seconds}})
+            until = int(time.time()) + seconds
+            self._index_daemon.ask({"type": "pause", "data": {"resume_time": until}})
         except OSError:
             pass
 
@@ -235,8 +236,8 @@ class PrivateSystem:
                 all(share["state"] in ("idle", "stopped") for share in progress["shares"]))
 
     def wait_idle(self, seconds=600, settled=2.0):
-        """Waits until nothing has been to be done for `settled` seconds; longer than a monitor holds
-        back what it saw, or needs to be started again."""
+        """Waits until nothing has been to be done for `settled` seconds; longer than a monitor
+        holds back what it saw, or needs to be started again."""
         since = None
 
         def settled_down():

@@ -1,5 +1,5 @@
-"""What it costs to compare very many unchanged files, and to rename a directory of very many: no file
-may be opened, and no document be sent."""
+"""What it costs to compare very many unchanged files, and to rename a directory of very many: no
+file may be opened, and no document be sent."""
 
 import os
 import time

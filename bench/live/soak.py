@@ -1,6 +1,6 @@
 """Changes the disk at random for a long time, while daemons are killed, indexing is paused, folders
-come and go, and a share gets other names. In the end the index must hold exactly what the disk does,
-and nothing may have leaked."""
+come and go, and a share gets other names. In the end the index must hold exactly what the disk
+does, and nothing may have leaked."""
 
 import os
 import random
@@ -91,7 +91,8 @@ def usage(system):
         members = processes.family(pid)
         used[f"{daemon} descriptors"] = max(map(processes.descriptors, members))
         used[f"{daemon} MB"] = round(sum(processes.memory_mb(member)[1] for member in members))
-    files = [os.path.join(place, name) for place, _, names in os.walk(system.root) for name in names]
+    files = [os.path.join(place, name)
+             for place, _, names in os.walk(system.root) for name in names]
     # What SQLite keeps beside a database comes and goes.
     files = [file for file in files if not file.endswith(("-wal", "-shm"))]
     used["files"] = len(files)

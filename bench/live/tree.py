@@ -11,7 +11,7 @@ _FILLER = "the quick brown fox jumps over the lazy dog".split()
 
 
 class Tree:
-    """A directory with random contents. Each version of each file has one word that no other has."""
+    """A directory with random contents. Each version of each file has a word that no other has."""
 
     def __init__(self, top, seed):
         self.top = top

@@ -43,7 +43,8 @@ def enough_watches(count):
         yield
         return
     if os.geteuid() != 0:
-        raise CheckFailed(f"{_LIMIT} is {limit}; as root: sysctl fs.inotify.max_user_watches={wanted}")
+        raise CheckFailed(f"{_LIMIT} is {limit}; "
+                          f"as root: sysctl fs.inotify.max_user_watches={wanted}")
     print(f"{_LIMIT} is {wanted} instead of {limit} until the end of this check")
     _LIMIT.write_text(str(wanted))
     try:
