@@ -4,6 +4,7 @@
 #include <memory>
 
 #include "common/error.h"
+#include "common/json_text.h"
 
 namespace quarry {
 namespace {
@@ -25,17 +26,6 @@ const Json::CharReaderBuilder& ReaderBuilder() {
   return *builder;
 }
 
-const Json::StreamWriterBuilder& WriterBuilder() {
-  static const Json::StreamWriterBuilder* const builder = [] {
-    auto* made = new Json::StreamWriterBuilder;
-    (*made)["indentation"] = "";
-    (*made)["commentStyle"] = "None";
-    (*made)["emitUTF8"] = true;
-    return made;
-  }();
-  return *builder;
-}
-
 // Whether the text holds what the library overlooks: it takes a NUL byte for the end of the text,
 // and lets comments pass in some places even where they are not allowed. Outside strings a "/" can
 // only begin a comment.
@@ -50,6 +40,7 @@ bool HoldsCommentOrNul(const std::string& text) {
 }
 
 bool Parse(Json::Value& out, const std::string& text) {
+  if (ReadPlainJson(text, &out)) return true;
   if (HoldsCommentOrNul(text)) return false;
   const std::unique_ptr<Json::CharReader> reader(ReaderBuilder().newCharReader());
   try {
@@ -143,7 +134,7 @@ bool fromString(Json::Value& out, const std::string& text) {
 }
 
 std::string toString(const Json::Value& value) {
-  return Json::writeString(WriterBuilder(), value);
+  return WriteJson(value);
 }
 
 bool isObject(const Json::Value& value) {
