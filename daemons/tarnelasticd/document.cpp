@@ -7,6 +7,7 @@
 #include "common/json.h"
 #include "daemons/tarnelasticd/engine_error.h"
 #include "daemons/tarnelasticd/field_names.h"
+#include "daemons/tarnelasticd/varint.h"
 
 namespace quarry::engine {
 namespace {
@@ -58,25 +59,8 @@ Cell MakeCell(Storage storage, const Json::Value& value) {
   return {};
 }
 
-void AppendNumber(std::string* out, std::size_t number) {
-  for (; number >= 0x80; number >>= 7) out->push_back(static_cast<char>(0x80 | (number & 0x7f)));
-  out->push_back(static_cast<char>(number));
-}
-
 [[noreturn]] void FailDamaged() {
   throw Error(kDamagedIndex, "A stored document is damaged");
-}
-
-std::size_t TakeNumber(std::string_view* bytes) {
-  std::size_t number = 0;
-  for (unsigned shift = 0; shift < 63; shift += 7) {
-    if (bytes->empty()) FailDamaged();
-    const auto byte = static_cast<unsigned char>(bytes->front());
-    bytes->remove_prefix(1);
-    number |= static_cast<std::size_t>(byte & 0x7f) << shift;
-    if (byte < 0x80) return number;
-  }
-  FailDamaged();
 }
 
 // Packed: for each text that is not empty its column, its length and its bytes.
@@ -237,11 +221,9 @@ Labels ReadLabels(const Schema& schema, const Statement& row) {
 std::vector<std::string_view> UnpackTexts(const Schema& schema, std::string_view packed) {
   std::vector<std::string_view> texts(schema.text_columns());
   while (!packed.empty()) {
-    const std::size_t column = TakeNumber(&packed);
-    const std::size_t size = TakeNumber(&packed);
-    if (column >= texts.size() || size > packed.size()) FailDamaged();
-    texts[column] = packed.substr(0, size);
-    packed.remove_prefix(size);
+    const std::uint64_t column = TakeNumber(&packed);
+    if (column >= texts.size()) FailDamaged();
+    texts[column] = TakeCounted(&packed);
   }
   return texts;
 }

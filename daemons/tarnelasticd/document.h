@@ -33,7 +33,7 @@ struct StoredDocument {
   std::vector<Cell> cells;  // one per column of the schema
   std::string extra;        // a JSON object, or empty
   Labels labels;
-  std::string body;  // the packed full text, not compressed; empty when there is none
+  std::string body;  // the packed full text; empty when there is none
 };
 
 // `document`, an object, as rows under `path`. A value that does not fit the column of its field is

@@ -211,9 +211,9 @@ Json::Value Engine::DocumentUpsert(const Json::Value& data) {
   const Json::Value& document = ObjectProperty(data, "data");
   const MemoryBudget::Share memory(&memory_, EstimateMemory(document));
   Index::Access access(index.get());
-  PreparedDocument prepared = PrepareDocument(*access.schema(), path, document);
+  StoredDocument stored = MakeDocument(*access.schema(), path, document);
   NotingDamage(index.get(), [&] {
-    access.Write([&](IndexWriter& writer) { writer.Upsert(std::move(prepared)); });
+    access.Write([&](IndexWriter& writer) { writer.Upsert(std::move(stored)); });
   });
   return {};
 }

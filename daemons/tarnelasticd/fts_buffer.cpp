@@ -1,24 +1,21 @@
 #include "daemons/tarnelasticd/fts_buffer.h"
 
 #include <utility>
-#include <vector>
-
-#include "daemons/tarnelasticd/compression.h"
 
 namespace quarry::engine {
 namespace {
 
 constexpr std::size_t kEntryBytes = 160;
 
-std::size_t SizeOf(const std::optional<std::string>& text) {
-  return text ? text->size() : 0;
+std::size_t SizeOf(const std::string& text) {
+  return text.size();
 }
 std::size_t SizeOf(const std::optional<Labels>& labels) {
   return labels ? labels->name.size() + labels->extra.size() : 0;
 }
 
-template <typename Map, typename Old, typename Now>
-std::size_t Merge(Map* changes, std::int64_t id, Old old, Now now) {
+template <typename Map, typename State>
+std::size_t Merge(Map* changes, std::int64_t id, State old, State now) {
   const auto [entry, is_new] = changes->try_emplace(id);
   auto& change = entry->second;
   std::size_t added = SizeOf(now);
@@ -30,55 +27,56 @@ std::size_t Merge(Map* changes, std::int64_t id, Old old, Now now) {
   return added;
 }
 
-// "INSERT INTO table(table,rowid,columns) VALUES('delete',?,...)" removes from a table without
-// content what the same values have put there.
-std::string DeleteSql(const std::string& table, const std::string& columns, std::size_t count) {
-  std::string sql =
-      "INSERT INTO " + table + "(" + table + ",rowid," + columns + ") VALUES('delete',?1";
-  for (std::size_t i = 0; i < count; ++i) sql += ",?" + std::to_string(i + 2);
-  return sql + ")";
-}
-
-std::string InsertSql(const std::string& table, const std::string& columns, std::size_t count) {
-  std::string sql = "INSERT INTO " + table + "(rowid," + columns + ") VALUES(?1";
-  for (std::size_t i = 0; i < count; ++i) sql += ",?" + std::to_string(i + 2);
-  return sql + ")";
-}
-
-void RunWithTexts(Statement* statement, std::int64_t id,
-                  const std::vector<std::string_view>& texts) {
-  statement->Bind(1, id);
-  int index = 2;
-  for (const std::string_view text : texts) statement->Bind(index++, text);
-  statement->Run();
-}
-
-// The pair of statements that change rows of one table.
-class Table {
- public:
-  Table(Database* db, const std::string& name, const std::string& columns, std::size_t count)
-      : remove_(db->Prepare(DeleteSql(name, columns, count))),
-        insert_(db->Prepare(InsertSql(name, columns, count))) {}
-  void Remove(std::int64_t id, const std::vector<std::string_view>& texts) {
-    RunWithTexts(&remove_, id, texts);
-  }
-  void Insert(std::int64_t id, const std::vector<std::string_view>& texts) {
-    RunWithTexts(&insert_, id, texts);
-  }
-
- private:
-  Statement remove_;
-  Statement insert_;
-};
-
 }  // namespace
 
 std::string MarkedName(const TextTokenizer& tokenizer, std::string_view name) {
   return kNameBegin + tokenizer.Fold(name) + kNameEnd;
 }
 
-void FtsBuffer::ChangeBody(std::int64_t id, std::optional<std::string> old,
-                           std::optional<std::string> now) {
+// "INSERT INTO table(table,rowid,columns) VALUES('delete',?,...)" removes from a table without
+// content what the same values have put there.
+FtsBuffer::Table FtsBuffer::MakeTable(const std::string& name, const std::string& columns,
+                                      std::size_t count) {
+  std::string values = "?1";
+  for (std::size_t i = 0; i < count; ++i) values += ",?" + std::to_string(i + 2);
+  return {"INSERT INTO " + name + "(" + name + ",rowid," + columns + ") VALUES('delete'," + values +
+              ")",
+          "INSERT INTO " + name + "(rowid," + columns + ") VALUES(" + values + ")"};
+}
+
+FtsBuffer::FtsBuffer(const Schema& schema, Database* db, const TextTokenizer& tokenizer)
+    : schema_(schema),
+      db_(db),
+      tokenizer_(tokenizer),
+      body_(
+          MakeTable("body", Schema::ColumnList("t", schema.text_columns()), schema.text_columns())),
+      label_(MakeTable("labels", "name,extra", 2)),
+      name_(MakeTable("names", "name", 1)) {}
+
+void FtsBuffer::Run(const std::string& sql, std::int64_t id,
+                    const std::vector<std::string_view>& texts) {
+  Statement statement = db_->Prepare(sql);
+  statement.Bind(1, id);
+  int index = 2;
+  for (const std::string_view text : texts) statement.Bind(index++, text);
+  statement.Run();
+}
+
+void FtsBuffer::RunBody(const std::string& sql, std::int64_t id, std::string_view body) {
+  if (!body.empty()) Run(sql, id, UnpackTexts(schema_, body));
+}
+
+void FtsBuffer::InsertLabels(std::int64_t id, const Labels& labels) {
+  Run(label_.insert, id, {labels.name, labels.extra});
+  Run(name_.insert, id, {MarkedName(tokenizer_, labels.name)});
+}
+
+void FtsBuffer::Insert(std::int64_t id, const Labels& labels, std::string_view body) {
+  InsertLabels(id, labels);
+  RunBody(body_.insert, id, body);
+}
+
+void FtsBuffer::ChangeBody(std::int64_t id, std::string old, std::string now) {
   bytes_ += Merge(&bodies_, id, std::move(old), std::move(now));
 }
 
@@ -87,24 +85,21 @@ void FtsBuffer::ChangeLabels(std::int64_t id, std::optional<Labels> old,
   bytes_ += Merge(&labels_, id, std::move(old), std::move(now));
 }
 
-void FtsBuffer::Flush(const Schema& schema, Database* db, const TextTokenizer& tokenizer) {
-  if (!bodies_.empty()) {
-    const std::size_t count = schema.text_columns();
-    Table body(db, "body", Schema::ColumnList("t", count), count);
-    for (const auto& [id, change] : bodies_) {
-      if (change.old) body.Remove(id, UnpackTexts(schema, Decompress(*change.old)));
-      if (change.now) body.Insert(id, UnpackTexts(schema, *change.now));
-    }
+void FtsBuffer::FlushLabels(std::int64_t id, const Change<std::optional<Labels>>& change) {
+  const auto& [old, now] = change;
+  if (old) Run(label_.remove, id, {old->name, old->extra});
+  if (now) Run(label_.insert, id, {now->name, now->extra});
+  if (old && now && old->name == now->name) return;
+  if (old) Run(name_.remove, id, {MarkedName(tokenizer_, old->name)});
+  if (now) Run(name_.insert, id, {MarkedName(tokenizer_, now->name)});
+}
+
+void FtsBuffer::Flush() {
+  for (const auto& [id, change] : bodies_) {
+    RunBody(body_.remove, id, change.old);
+    RunBody(body_.insert, id, change.now);
   }
-  Table labels(db, "labels", "name,extra", 2);
-  Table names(db, "names", "name", 1);
-  for (const auto& [id, change] : labels_) {
-    if (change.old) labels.Remove(id, {change.old->name, change.old->extra});
-    if (change.now) labels.Insert(id, {change.now->name, change.now->extra});
-    if (change.old && change.now && change.old->name == change.now->name) continue;
-    if (change.old) names.Remove(id, {MarkedName(tokenizer, change.old->name)});
-    if (change.now) names.Insert(id, {MarkedName(tokenizer, change.now->name)});
-  }
+  for (const auto& [id, change] : labels_) FlushLabels(id, change);
   Clear();
 }
 

@@ -1,8 +1,9 @@
-// Changes of the full text that have not reached its tables yet.
+// Changes of the full text on their way to its tables.
 //
 // FTS5 writes a whole segment each time row ids do not ascend, so changes in arbitrary order would
 // cost one segment each. They are collected here and applied in order of row ids; a row that
-// changes several times is written once.
+// changes several times is written once. New rows, whose ids ascend by themselves, do not wait:
+// cutting them into words is most of the work of a first index, and others can go on meanwhile.
 
 #ifndef QUARRY_DAEMONS_TARNELASTICD_FTS_BUFFER_H_
 #define QUARRY_DAEMONS_TARNELASTICD_FTS_BUFFER_H_
@@ -12,6 +13,8 @@
 #include <map>
 #include <optional>
 #include <string>
+#include <string_view>
+#include <vector>
 
 #include "daemons/tarnelasticd/database.h"
 #include "daemons/tarnelasticd/document.h"
@@ -20,32 +23,54 @@
 
 namespace quarry::engine {
 
-// One thread at a time.
+// Works inside of the transaction that is open in a database. Whatever fails, that transaction must
+// be rolled back and the buffer cleared. One thread at a time.
 class FtsBuffer {
  public:
-  // The full text of a row changes from `old` (compressed, as stored) to `now` (packed); nothing
-  // stands for a row without full text.
-  void ChangeBody(std::int64_t id, std::optional<std::string> old, std::optional<std::string> now);
+  // What is given must outlive the buffer.
+  FtsBuffer(const Schema& schema, Database* db, const TextTokenizer& tokenizer);
+
+  // Puts in a row whose id is above all others'. An empty full text is none.
+  void Insert(std::int64_t id, const Labels& labels, std::string_view body);
+  // The full text of a row changes from `old` to `now` (both packed); empty stands for a row
+  // without full text.
+  void ChangeBody(std::int64_t id, std::string old, std::string now);
   void ChangeLabels(std::int64_t id, std::optional<Labels> old, std::optional<Labels> now);
 
   // Roughly the memory that is held.
   std::size_t bytes() const { return bytes_; }
 
-  // Applies everything through `db`, inside the transaction that is open there, and is empty then.
-  // After a failure that transaction must be rolled back and the buffer cleared.
-  void Flush(const Schema& schema, Database* db, const TextTokenizer& tokenizer);
+  // Applies everything, and is empty then.
+  void Flush();
   void Clear();
 
  private:
   // The first old state counts, and the last new one.
-  template <typename Old, typename Now>
+  template <typename State>
   struct Change {
-    std::optional<Old> old;
-    std::optional<Now> now;
+    State old;
+    State now;
   };
+  // The statements that change rows of one table.
+  struct Table {
+    std::string remove;
+    std::string insert;
+  };
+  static Table MakeTable(const std::string& name, const std::string& columns, std::size_t count);
 
-  std::map<std::int64_t, Change<std::string, std::string>> bodies_;
-  std::map<std::int64_t, Change<Labels, Labels>> labels_;
+  void Run(const std::string& sql, std::int64_t id, const std::vector<std::string_view>& texts);
+  void RunBody(const std::string& sql, std::int64_t id, std::string_view body);
+  void InsertLabels(std::int64_t id, const Labels& labels);
+  void FlushLabels(std::int64_t id, const Change<std::optional<Labels>>& change);
+
+  const Schema& schema_;
+  Database* db_;
+  const TextTokenizer& tokenizer_;
+  const Table body_;
+  const Table label_;
+  const Table name_;
+  std::map<std::int64_t, Change<std::string>> bodies_;
+  std::map<std::int64_t, Change<std::optional<Labels>>> labels_;
   std::size_t bytes_ = 0;
 };
 

@@ -4,10 +4,10 @@
 #include <utility>
 
 #include "daemons/common/log.h"
-#include "daemons/tarnelasticd/compression.h"
 #include "daemons/tarnelasticd/document.h"
 #include "daemons/tarnelasticd/index_files.h"
 #include "daemons/tarnelasticd/terms.h"
+#include "daemons/tarnelasticd/text_store.h"
 
 namespace quarry::engine {
 
@@ -129,13 +129,10 @@ void Index::CopyDocuments(const Schema& schema, const std::string& database_path
   const ReaderPool::Lease reader = store_->readers->Take();
   const Schema& old = *store_->schema;
   Statement rows = reader->db().Prepare("SELECT " + RowColumns(old) + " FROM docs ORDER BY id");
-  Statement text = reader->db().Prepare("SELECT packed FROM texts WHERE id=?1");
   while (rows.Step()) {
     Json::Value document = ReadRow(old, rows, nullptr);
-    text.Bind(1, rows.Int(0));
-    if (text.Step()) AddTexts(old, Decompress(text.Blob(0)), nullptr, &document);
-    text.Reset();
-    writer.Upsert(PrepareDocument(schema, rows.Text(1), document));
+    AddTexts(old, ReadText(&reader->db(), rows.Int(0)), nullptr, &document);
+    writer.Upsert(MakeDocument(schema, rows.Text(1), document));
   }
   if (HasTerms(&reader->db())) writer.RequestTerms();
   writer.Commit();

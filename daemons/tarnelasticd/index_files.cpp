@@ -151,7 +151,7 @@ void FoldLog(const std::string& database) {
 void FillDatabase(Database* db, const Schema& schema) {
   db->Execute("PRAGMA journal_mode=DELETE;PRAGMA synchronous=FULL;BEGIN IMMEDIATE");
   db->Execute(schema.CreateStatements());
-  db->Execute("INSERT INTO body(body,rank) VALUES('hashsize',16777216)");
+  db->Execute("INSERT INTO body(body,rank) VALUES('hashsize',8388608)");
   Statement insert = db->Prepare("INSERT INTO meta(key,value) VALUES(?1,?2)");
   insert.Bind(1, std::string_view("layout")).Bind(2, std::int64_t{kLayoutVersion}).Run();
   const std::string mappings = toString(schema.mappings());

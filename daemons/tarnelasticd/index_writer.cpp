@@ -5,7 +5,6 @@
 #include <utility>
 #include <vector>
 
-#include "daemons/tarnelasticd/compression.h"
 #include "daemons/tarnelasticd/engine_error.h"
 #include "daemons/tarnelasticd/request.h"
 #include "daemons/tarnelasticd/terms.h"
@@ -81,19 +80,14 @@ void ApplyChanges(const Json::Value& changes, Json::Value* document) {
 
 }  // namespace
 
-PreparedDocument PrepareDocument(const Schema& schema, std::string_view path,
-                                 const Json::Value& document) {
-  PreparedDocument prepared{MakeDocument(schema, path, document), {}};
-  if (!prepared.document.body.empty()) prepared.packed = Compress(prepared.document.body);
-  return prepared;
-}
-
 IndexWriter::IndexWriter(const std::string& database_path, std::shared_ptr<const Schema> schema,
                          const WriterLimits& limits)
     : schema_(std::move(schema)),
       limits_(limits),
       db_(database_path),
       tokenizer_(db_.handle()),
+      buffer_(*schema_, &db_, tokenizer_),
+      texts_(&db_),
       insert_sql_(InsertSql(*schema_)),
       update_sql_(UpdateSql(*schema_)),
       select_row_sql_("SELECT " + RowColumns(*schema_) + " FROM docs WHERE path=?1") {
@@ -137,6 +131,7 @@ void IndexWriter::Begin() {
 
 void IndexWriter::Rollback() noexcept {
   buffer_.Clear();
+  texts_.Clear();
   if (!uncommitted_) return;
   uncommitted_ = false;
   lost_ = true;
@@ -153,7 +148,7 @@ void IndexWriter::Rollback() noexcept {
 void IndexWriter::KeepWithinLimits() {
   if (buffer_.bytes() >= limits_.flush_bytes) {
     transaction_bytes_ += buffer_.bytes();
-    buffer_.Flush(*schema_, &db_, tokenizer_);
+    buffer_.Flush();
   }
   if (transaction_bytes_ >= limits_.commit_bytes || IsOld()) CommitNow();
 }
@@ -166,7 +161,8 @@ void IndexWriter::CommitNow() {
   // Whoever removes the file under us must not be told that documents are safe in it.
   if (db_.HasMoved()) throw Error(kDamagedIndex, "The index's database has been removed");
   transaction_bytes_ += buffer_.bytes();
-  buffer_.Flush(*schema_, &db_, tokenizer_);
+  buffer_.Flush();
+  texts_.Flush();
   if (terms_requested_) CollectTerms(&db_);
   db_.Prepare("INSERT OR REPLACE INTO meta(key,value) VALUES('documents',?1)")
       .Bind(1, documents_.load())
@@ -207,18 +203,6 @@ std::optional<IndexWriter::Found> IndexWriter::FindByPath(std::string_view path)
   return Found{row.Int(0), ReadLabels(*schema_, row)};
 }
 
-std::optional<std::string> IndexWriter::ReadPacked(std::int64_t id) {
-  Statement row = db_.Prepare("SELECT packed FROM texts WHERE id=?1");
-  row.Bind(1, id);
-  if (!row.Step()) return std::nullopt;
-  return std::string(row.Blob(0));
-}
-
-std::string IndexWriter::ReadBody(std::int64_t id) {
-  const std::optional<std::string> packed = ReadPacked(id);
-  return packed ? Decompress(*packed) : std::string();
-}
-
 void IndexWriter::WriteRow(const std::string& sql, std::int64_t id,
                            const StoredDocument& document) {
   Statement row = db_.Prepare(sql);
@@ -235,58 +219,43 @@ void IndexWriter::ChangeLabels(const Found& old, const Labels& now) {
   buffer_.ChangeLabels(old.id, old.labels, now);
 }
 
-void IndexWriter::WritePacked(std::int64_t id, const std::string& packed, bool exists) {
-  db_.Prepare(exists ? "UPDATE texts SET packed=?2 WHERE id=?1"
-                     : "INSERT INTO texts(id,packed) VALUES(?1,?2)")
-      .Bind(1, id)
-      .BindBlob(2, packed)
-      .Run();
+void IndexWriter::ChangeText(std::int64_t id, std::string body) {
+  std::string old = texts_.Read(id);
+  if (old == body) return;
+  texts_.Write(id, body);
+  buffer_.ChangeBody(id, std::move(old), std::move(body));
 }
 
-void IndexWriter::ChangeText(std::int64_t id, const std::string& body, const std::string& packed) {
-  std::optional<std::string> old = ReadPacked(id);
-  if (old.value_or("") == packed) return;
-  if (packed.empty()) {
-    db_.Prepare("DELETE FROM texts WHERE id=?1").Bind(1, id).Run();
-    buffer_.ChangeBody(id, std::move(old), std::nullopt);
-    return;
-  }
-  WritePacked(id, packed, old.has_value());
-  buffer_.ChangeBody(id, std::move(old), body);
-}
-
-void IndexWriter::Insert(const PreparedDocument& document) {
+void IndexWriter::Insert(StoredDocument document) {
   const std::int64_t id = next_id_++;
-  WriteRow(insert_sql_, id, document.document);
-  buffer_.ChangeLabels(id, std::nullopt, document.document.labels);
-  if (!document.packed.empty()) {
-    WritePacked(id, document.packed, false);
-    buffer_.ChangeBody(id, std::nullopt, document.document.body);
-  }
+  WriteRow(insert_sql_, id, document);
+  buffer_.Insert(id, document.labels, document.body);
+  transaction_bytes_ += document.body.size();
+  if (!document.body.empty()) texts_.Write(id, std::move(document.body));
   ++documents_;
 }
 
-void IndexWriter::Replace(const Found& old, const PreparedDocument& document) {
-  WriteRow(update_sql_, old.id, document.document);
-  ChangeLabels(old, document.document.labels);
-  ChangeText(old.id, document.document.body, document.packed);
+void IndexWriter::Replace(const Found& old, StoredDocument document) {
+  WriteRow(update_sql_, old.id, document);
+  ChangeLabels(old, document.labels);
+  ChangeText(old.id, std::move(document.body));
 }
 
 void IndexWriter::Remove(const Found& old) {
-  ChangeText(old.id, "", "");
+  ChangeText(old.id, "");
   buffer_.ChangeLabels(old.id, old.labels, std::nullopt);
   db_.Prepare("DELETE FROM docs WHERE id=?1").Bind(1, old.id).Run();
   transaction_bytes_ += kRowBytes;
   --documents_;
 }
 
-void IndexWriter::Upsert(PreparedDocument document) {
+void IndexWriter::Upsert(StoredDocument document) {
   Change([&] {
-    const std::optional<Found> old = FindByPath(document.document.path);
+    const std::optional<Found> old = FindByPath(document.path);
     if (old) {
-      Replace(*old, document);
+      Replace(*old, std::move(document));
     } else {
-      Insert(document);
+      Insert(std::move(document));
     }
     return true;
   });
@@ -310,7 +279,7 @@ bool IndexWriter::SetLocked(std::string_view path, const Json::Value& changes) {
     document = ReadRow(*schema_, row, nullptr);
   }
   const bool touches_text = TouchesText(*schema_, changes);
-  if (touches_text) AddTexts(*schema_, ReadBody(found.id), nullptr, &document);
+  if (touches_text) AddTexts(*schema_, texts_.Read(found.id), nullptr, &document);
   ApplyChanges(changes, &document);
   const std::string new_path = document[schema_->path_field()].asString();
   if (new_path != path) {
@@ -318,7 +287,7 @@ bool IndexWriter::SetLocked(std::string_view path, const Json::Value& changes) {
     if (in_the_way) Remove(*in_the_way);
   }
   if (touches_text) {
-    Replace(found, PrepareDocument(*schema_, new_path, document));
+    Replace(found, MakeDocument(*schema_, new_path, document));
   } else {
     const StoredDocument stored = MakeDocument(*schema_, new_path, document);
     WriteRow(update_sql_, found.id, stored);
@@ -366,7 +335,7 @@ Json::Value IndexWriter::Find(const Selection& selection) {
     if (found.size() >= kMaxFound) FailMalformed("Too many documents: ask with a limit");
     Json::Value document = ReadRow(*schema_, rows, only);
     if (wants_text) {
-      const std::string body = ReadBody(rows.Int(0));
+      const std::string body = texts_.Read(rows.Int(0));
       text_bytes += body.size();
       if (text_bytes > kMaxFoundText && !found.empty()) {
         FailMalformed("Too much text: ask with a limit");

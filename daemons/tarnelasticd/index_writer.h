@@ -18,6 +18,7 @@
 #include "daemons/tarnelasticd/fts_buffer.h"
 #include "daemons/tarnelasticd/schema.h"
 #include "daemons/tarnelasticd/selection.h"
+#include "daemons/tarnelasticd/text_store.h"
 #include "daemons/tarnelasticd/text_tokenizer.h"
 
 namespace quarry::engine {
@@ -32,15 +33,6 @@ struct WriterLimits {
   std::chrono::steady_clock::duration commit_age = std::chrono::seconds(3);
 };
 
-// A document to be stored, with its full text compressed already: that takes time, and needs no
-// lock.
-struct PreparedDocument {
-  StoredDocument document;
-  std::string packed;  // the compressed body, empty without full text
-};
-PreparedDocument PrepareDocument(const Schema& schema, std::string_view path,
-                                 const Json::Value& document);
-
 // The one connection that changes an index. Changes collect in a transaction: this object's own
 // questions see them at once, searches after Commit(). A change that fails, whatever for, takes all
 // that was not committed with it; Lost() tells. Throws Error as Database does. One thread at a
@@ -53,7 +45,7 @@ class IndexWriter {
   ~IndexWriter();
 
   // Stores a document in place of the one with its path.
-  void Upsert(PreparedDocument document);
+  void Upsert(StoredDocument document);
   // Changes fields of the document at `path`; null removes one. With a new path the document moves
   // there, in place of the one that is there. Returns whether there is such a document. Throws
   // kMalformedRequest for a path that is none.
@@ -100,14 +92,11 @@ class IndexWriter {
   bool IsOld() const;
 
   std::optional<Found> FindByPath(std::string_view path);
-  std::optional<std::string> ReadPacked(std::int64_t id);
-  std::string ReadBody(std::int64_t id);
-  void Insert(const PreparedDocument& document);
-  void Replace(const Found& old, const PreparedDocument& document);
+  void Insert(StoredDocument document);
+  void Replace(const Found& old, StoredDocument document);
   void Remove(const Found& old);
   void ChangeLabels(const Found& old, const Labels& now);
-  void ChangeText(std::int64_t id, const std::string& body, const std::string& packed);
-  void WritePacked(std::int64_t id, const std::string& packed, bool exists);
+  void ChangeText(std::int64_t id, std::string body);
   void WriteRow(const std::string& sql, std::int64_t id, const StoredDocument& document);
   bool SetLocked(std::string_view path, const Json::Value& changes);
 
@@ -116,6 +105,7 @@ class IndexWriter {
   Database db_;
   TextTokenizer tokenizer_;
   FtsBuffer buffer_;
+  TextStore texts_;
   std::string insert_sql_;
   std::string update_sql_;
   std::string select_row_sql_;

@@ -73,8 +73,12 @@ Schema::Schema(const Json::Value& mappings) : mappings_(mappings) {
   const Json::Value& properties = ObjectIn(mappings, "properties");
   if (properties.size() > kMaxFields) Refuse("there are too many fields");
   fields_[path_field_] = {path_field_, Storage::kPath, 0, 1};
+  // FTS5 writes the number of a column down with each word, but for the first column's: that is for
+  // the field with the most words.
+  if (properties.isMember(kFieldContent)) {
+    AddField(kFieldContent, properties[kFieldContent], defaults);
+  }
   for (auto field = properties.begin(); field != properties.end(); ++field) {
-    if (!field->isObject()) Refuse(field.name() + " is no object");
     AddField(field.name(), *field, defaults);
   }
   const Storage unlisted = StorageOf(StringSetting(none, defaults, "type", "string"),
@@ -86,7 +90,8 @@ Schema::Schema(const Json::Value& mappings) : mappings_(mappings) {
 void Schema::AddField(const std::string& name, const Json::Value& settings,
                       const Json::Value& default_settings) {
   if (name.empty() || name.size() > kMaxFieldName) Refuse("the name of a field is too long");
-  if (name == path_field_) return;
+  if (!settings.isObject()) Refuse(name + " is no object");
+  if (Find(name) != nullptr) return;
   Storage storage = StorageOf(StringSetting(settings, default_settings, "type", "string"),
                               StringSetting(settings, default_settings, "analyzer", "tarnstandard"),
                               BoolSetting(settings, default_settings, "_all"));

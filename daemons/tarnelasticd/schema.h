@@ -4,7 +4,7 @@
 //   meta    key, value: the version of this layout, the mappings, how many documents there are
 //   docs    one row per document: its path, a column per listed field that is no full text, and
 //           what is not listed as JSON
-//   texts   the full text of a document, packed and compressed
+//   texts   the full texts of documents, packed and compressed; text_store.h says more
 //   body    FTS5 over the full text, a column per field; without content of its own
 //   labels  FTS5 over the words of the file name and the texts of fields that are not listed
 //   names   FTS5 over all three letters in a row of the file name
@@ -24,7 +24,7 @@
 namespace quarry::engine {
 
 // The version of the layout. A database of another version counts as damaged: it is made anew.
-constexpr int kLayoutVersion = 2;
+constexpr int kLayoutVersion = 3;
 
 // How a field's values are kept.
 enum class Storage {

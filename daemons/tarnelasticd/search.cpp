@@ -7,7 +7,6 @@
 
 #include "common/error.h"
 #include "common/file_util.h"
-#include "daemons/tarnelasticd/compression.h"
 #include "daemons/tarnelasticd/document.h"
 #include "daemons/tarnelasticd/field_names.h"
 #include "daemons/tarnelasticd/page.h"
@@ -15,6 +14,7 @@
 #include "daemons/tarnelasticd/request.h"
 #include "daemons/tarnelasticd/snippet.h"
 #include "daemons/tarnelasticd/suggestion.h"
+#include "daemons/tarnelasticd/text_store.h"
 
 namespace quarry::engine {
 namespace {
@@ -142,10 +142,8 @@ Json::Value HitJson(const SearchedIndex& index, const Ranked& ranked,
                     const std::vector<const QueryTerm*>& terms, std::size_t snippet_length) {
   Json::Value hit = AttributesJson(index, ranked);
   if (snippet_length == 0) return hit;
-  Statement row = index.reader->db().Prepare("SELECT packed FROM texts WHERE id=?1");
-  row.Bind(1, ranked.id);
-  if (!row.Step()) return hit;
-  const std::string packed = Decompress(row.Blob(0));
+  const std::string packed = ReadText(&index.reader->db(), ranked.id);
+  if (packed.empty()) return hit;
   hit["snippet"] = SnippetJson(ChooseSnippet(index, packed, terms, snippet_length));
   return hit;
 }

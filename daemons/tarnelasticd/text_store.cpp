@@ -1,0 +1,145 @@
+#include "daemons/tarnelasticd/text_store.h"
+
+#include <algorithm>
+#include <iterator>
+#include <limits>
+#include <string_view>
+#include <utility>
+
+#include "daemons/tarnelasticd/compression.h"
+#include "daemons/tarnelasticd/varint.h"
+
+namespace quarry::engine {
+namespace {
+
+constexpr std::size_t kOpenBytes = std::size_t{4} << 20;
+
+// What a text takes in memory beside its bytes.
+constexpr std::size_t kEntryBytes = 80;
+
+std::size_t CostOf(std::string_view text) {
+  return text.empty() ? 0 : text.size() + kEntryBytes;
+}
+
+constexpr char kSelectRow[] = "SELECT id,packed FROM texts WHERE id<=?1 ORDER BY id DESC LIMIT 1";
+
+// Calls visit(id, text) for each text of a row until it returns false.
+template <typename Visit>
+void ForEachText(std::int64_t row, std::string_view bytes, Visit visit) {
+  auto id = static_cast<std::uint64_t>(row);
+  while (!bytes.empty()) {
+    id += TakeNumber(&bytes);
+    if (!visit(static_cast<std::int64_t>(id), TakeCounted(&bytes))) return;
+  }
+}
+
+}  // namespace
+
+std::string ReadText(Database* db, std::int64_t id) {
+  std::string found;
+  Statement row = db->Prepare(kSelectRow);
+  row.Bind(1, id);
+  if (!row.Step()) return found;
+  const std::string bytes = Decompress(row.Blob(1));
+  ForEachText(row.Int(0), bytes, [&](std::int64_t at, std::string_view text) {
+    if (at == id) found = text;
+    return at < id;
+  });
+  return found;
+}
+
+TextStore::Rows::iterator TextStore::FindOpen(std::int64_t id) {
+  auto row = rows_.upper_bound(id);
+  if (row == rows_.begin()) return rows_.end();
+  --row;
+  return id < row->second.end ? row : rows_.end();
+}
+
+// The first id behind `id` that belongs to another row.
+std::int64_t TextStore::EndBehind(std::int64_t id) {
+  std::int64_t end = std::numeric_limits<std::int64_t>::max();
+  Statement next = db_->Prepare("SELECT min(id) FROM texts WHERE id>?1");
+  next.Bind(1, id).Step();
+  if (!next.IsNull(0)) end = next.Int(0);
+  const auto open = rows_.upper_bound(id);
+  return open == rows_.end() ? end : std::min(end, open->first);
+}
+
+// The row that the id belongs to, or a new one where there is none.
+TextStore::Rows::iterator TextStore::Load(std::int64_t id) {
+  std::int64_t key = id;
+  Row row;
+  row.end = EndBehind(id);
+  Statement stored = db_->Prepare(kSelectRow);
+  stored.Bind(1, id);
+  if (stored.Step()) {
+    key = stored.Int(0);
+    row.stored = true;
+    const std::string bytes = Decompress(stored.Blob(1));
+    ForEachText(key, bytes, [&row](std::int64_t at, std::string_view text) {
+      row.bytes += CostOf(text);
+      row.texts.emplace(at, text);
+      return true;
+    });
+  }
+  open_bytes_ += row.bytes;
+  return rows_.emplace(key, std::move(row)).first;
+}
+
+// As Load(), but of a row that is full a new one begins behind its last text.
+TextStore::Rows::iterator TextStore::Open(std::int64_t id) {
+  auto found = FindOpen(id);
+  if (found == rows_.end()) found = Load(id);
+  Row& row = found->second;
+  if (row.bytes < kRowBytes || id <= row.texts.rbegin()->first) return found;
+  Row behind;
+  behind.end = std::exchange(row.end, id);
+  return rows_.emplace(id, std::move(behind)).first;
+}
+
+std::string TextStore::Read(std::int64_t id) {
+  const auto row = FindOpen(id);
+  if (row == rows_.end()) return ReadText(db_, id);
+  const auto text = row->second.texts.find(id);
+  return text == row->second.texts.end() ? std::string() : text->second;
+}
+
+void TextStore::Write(std::int64_t id, std::string text) {
+  if (open_bytes_ >= kOpenBytes) Flush();
+  Row& row = Open(id)->second;
+  std::string& kept = row.texts[id];
+  row.bytes += CostOf(text) - CostOf(kept);
+  open_bytes_ += CostOf(text) - CostOf(kept);
+  kept = std::move(text);
+  if (kept.empty()) row.texts.erase(id);
+}
+
+// A row that has grown becomes several.
+void TextStore::WriteOut(std::int64_t key, const Row& row) {
+  if (row.stored) db_->Prepare("DELETE FROM texts WHERE id=?1").Bind(1, key).Run();
+  Statement insert = db_->Prepare("INSERT INTO texts(id,packed) VALUES(?1,?2)");
+  for (auto text = row.texts.begin(); text != row.texts.end();) {
+    const std::int64_t first = text->first;
+    std::string bytes;
+    for (std::int64_t last = first; text != row.texts.end() && bytes.size() < kRowBytes; ++text) {
+      AppendNumber(&bytes, static_cast<std::uint64_t>(text->first - last));
+      AppendNumber(&bytes, text->second.size());
+      bytes += text->second;
+      last = text->first;
+    }
+    const std::string packed = Compress(bytes);
+    insert.Bind(1, first).BindBlob(2, packed).Run();
+  }
+}
+
+void TextStore::Flush() {
+  for (const auto& [key, row] : rows_) WriteOut(key, row);
+  Clear();
+}
+
+void TextStore::Clear() {
+  rows_.clear();
+  open_bytes_ = 0;
+}
+
+}  // namespace quarry::engine
