@@ -2,10 +2,19 @@
 
 #include "common/json.h"
 #include "common/log.h"
+#include "fileindex/queue/event_line.h"
 
 namespace quarry::fileindex {
 
 Event::Event(const std::string& event_raw) {
+  EventLine line;
+  if (ReadEventLine(event_raw, line)) {
+    op = line.op;
+    is_dir = line.is_dir;
+    path = line.path;
+    path_old = line.path_old;
+    return;
+  }
   Json::Value json;
   if (!fromString(json, event_raw)) {
     Fail(QUARRY_SITE("optree"), "!data.fromString(event_raw)", kErrorMalformedEvent,

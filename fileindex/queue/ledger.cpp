@@ -8,7 +8,9 @@ namespace quarry::fileindex {
 namespace {
 
 // Below this, comparing names one by one is faster than hashing.
-constexpr std::size_t kFewChildren = 8;
+constexpr std::uint32_t kFewChildren = 4;
+
+const std::string kUnnamed;
 
 bool IsWork(FileIndexOP kind) {
   return kind == OP_INDEX || kind == OP_ATTR || kind == OP_REINDEX;
@@ -66,74 +68,153 @@ bool IsEmpty(const RecordSet& set) {
 
 }  // namespace
 
-OPNode::ChildIndex& Ledger::Children(OPNode& node) {
-  if (!node.child_index_) node.child_index_ = std::make_unique<OPNode::ChildIndex>();
-  return *node.child_index_;
+OPNode::Books& Ledger::BooksOf(OPNode& node) {
+  if (!node.books_) node.books_ = std::make_unique<OPNode::Books>();
+  return *node.books_;
 }
 
 // `children` is open to everybody: what is found there is accounted for late rather than never.
 void Ledger::Adopt(OPNode& node) {
-  if (node.adopted_ > node.children.size()) {
-    node.adopted_ = 0;
-    node.child_index_.reset();
+  const std::size_t count = node.children.size();
+  if (count == (node.books_ ? node.books_->adopted : 0)) return;
+  OPNode::Books& books = BooksOf(node);
+  if (books.adopted > count) {
+    OPNode::Books anew;
+    anew.records = std::move(books.records);
+    books = std::move(anew);
   }
-  for (; node.adopted_ < node.children.size(); ++node.adopted_) {
-    OPNode& child = *node.children[node.adopted_];
-    child.position_ = node.adopted_;
-    Touch(child);
+  while (books.adopted < count) AdoptNext(node, books);
+}
+
+void Ledger::AdoptNext(OPNode& node, OPNode::Books& books) {
+  const std::uint32_t place = books.adopted++;
+  OPNode& child = *node.children[place];
+  child.place_ = place;
+  child.next_reindexable_ = child.next_movable_ = OPNode::kNone;
+  Touch(child);
+  if (books.adopted <= kFewChildren) return;
+  // Those that were few have not been entered yet.
+  for (std::uint32_t at = place == kFewChildren ? 0 : place; at <= place; ++at) {
+    const std::string& name = node.children[at]->name;
+    const std::uint32_t hash = NameTable::HashOf(name);
+    if (FindEntered(node, name, hash) == OPNode::kNone) books.names.Add(hash, at);
   }
 }
 
-const std::shared_ptr<OPNode>* Ledger::Find(OPNode& node, std::string_view name) {
+std::uint32_t Ledger::FindEntered(const OPNode& node, std::string_view name, std::uint32_t hash) {
+  return node.books_->names.Find(hash,
+                                 [&](std::uint32_t at) { return node.children[at]->name == name; });
+}
+
+std::uint32_t Ledger::Find(const OPNode& node, std::string_view name, std::uint32_t hash) {
   const auto& children = node.children;
-  if (children.size() <= kFewChildren) {
-    const auto found = std::find_if(children.begin(), children.end(),
-                                    [name](const auto& child) { return child->name == name; });
-    return found == children.end() ? nullptr : &*found;
+  if (children.size() > kFewChildren) return FindEntered(node, name, hash);
+  for (std::uint32_t at = 0; at < children.size(); ++at) {
+    if (children[at]->name == name) return at;
   }
-  OPNode::ChildIndex& index = Children(node);
-  for (; index.indexed < children.size(); ++index.indexed) {
-    index.positions.emplace(children[index.indexed]->name, index.indexed);
-  }
-  const auto found = index.positions.find(name);
-  return found == index.positions.end() ? nullptr : &children[found->second];
+  return OPNode::kNone;
 }
 
-std::shared_ptr<OPNode> Ledger::Child(OPNode& node, std::string_view name) {
+const std::shared_ptr<OPNode>& Ledger::Child(OPNode& node, std::string_view name,
+                                             std::uint32_t hash) {
   Adopt(node);
-  if (const std::shared_ptr<OPNode>* found = Find(node, name)) {
-    Touch(**found);
-    return *found;
+  const std::uint32_t found = Find(node, name, hash);
+  if (found != OPNode::kNone) {
+    Touch(*node.children[found]);
+    return node.children[found];
   }
-  node.children.push_back(std::make_shared<OPNode>(node.shared_from_this(), std::string(name)));
-  Adopt(node);
+  node.children.push_back(std::make_shared<OPNode>(node.shared_from_this(), kUnnamed));
+  node.children.back()->name = std::string(name);  // of its very size: assigned it takes more
+  AdoptNext(node, BooksOf(node));
   return node.children.back();
 }
 
+void Ledger::PrefetchDirectory(const OPNode& node) {
+  __builtin_prefetch(&node.children);
+  __builtin_prefetch(&node.books_);
+}
+
+void Ledger::PrefetchBooks(const OPNode& node) {
+  __builtin_prefetch(node.books_.get());
+}
+
+void Ledger::PrefetchName(const OPNode& node, std::uint32_t hash) {
+  if (node.books_) node.books_->names.Prefetch(hash);
+}
+
+std::uint32_t Ledger::Expected(const OPNode& node, std::uint32_t hash) {
+  if (!node.books_) return OPNode::kNone;
+  return node.books_->names.Find(hash, [](std::uint32_t) { return true; });
+}
+
+// A new child comes behind the last one.
+void Ledger::PrefetchPlace(const OPNode& node, std::uint32_t hash) {
+  const std::size_t place = std::min<std::size_t>(Expected(node, hash), node.children.size());
+  __builtin_prefetch(node.children.data() + place);
+}
+
+const OPNode* Ledger::PrefetchChild(const OPNode& node, std::uint32_t hash) {
+  const std::uint32_t place = Expected(node, hash);
+  if (place >= node.children.size()) return nullptr;
+  const OPNode* const child = node.children[place].get();
+  __builtin_prefetch(child);
+  __builtin_prefetch(&child->ops);
+  __builtin_prefetch(&child->place_);
+  return child;
+}
+
+void Ledger::PrefetchList(const OPNode& node) {
+  __builtin_prefetch(node.name.data());
+  __builtin_prefetch(node.ops.data());
+}
+
+void Ledger::PrefetchRecord(const OPNode& node) {
+  if (!node.ops.empty()) __builtin_prefetch(node.ops.front().get());
+}
+
+// Whoever is in a list has all nodes above it in the lists of their parents.
 void Ledger::Touch(OPNode& node) {
   for (OPNode* at = &node; at->parent; at = at->parent.get()) {
-    // Whoever is in a list has all nodes above it in the list of their parents.
-    if (at->reindexable_ && at->movable_) return;
-    OPNode::ChildIndex& index = Children(*at->parent);
-    if (!std::exchange(at->reindexable_, true)) index.reindexable.push_back(at);
-    if (!std::exchange(at->movable_, true)) index.movable.push_back(at);
+    if (at->next_reindexable_ != OPNode::kNone && at->next_movable_ != OPNode::kNone) return;
+    if (!IsInPlace(*at)) return;  // it will be touched when it is adopted
+    OPNode::Books& books = *at->parent->books_;
+    Prepend(*at, books.first_reindexable, &OPNode::next_reindexable_);
+    Prepend(*at, books.first_movable, &OPNode::next_movable_);
   }
+}
+
+// Its place is not that of another, though `children` is open to everybody.
+bool Ledger::IsInPlace(const OPNode& node) {
+  const auto& siblings = node.parent->children;
+  return node.place_ < siblings.size() && siblings[node.place_].get() == &node;
+}
+
+void Ledger::Prepend(OPNode& node, std::uint32_t& first, Link next) {
+  if (node.*next == OPNode::kNone) node.*next = std::exchange(first, node.place_);
+}
+
+std::vector<OPNode*> Ledger::TakeList(OPNode& node, std::uint32_t& first, Link next) {
+  std::vector<OPNode*> taken;
+  std::uint32_t at = std::exchange(first, OPNode::Books::kEnd);
+  while (at < node.children.size()) {
+    taken.push_back(node.children[at].get());
+    at = std::exchange(taken.back()->*next, OPNode::kNone);
+  }
+  return taken;
 }
 
 std::vector<OPNode*> Ledger::TakeReindexable(OPNode& node) {
   Adopt(node);
-  if (!node.child_index_) return {};
-  std::vector<OPNode*> taken = std::exchange(node.child_index_->reindexable, {});
-  for (OPNode* child : taken) child->reindexable_ = false;
-  return taken;
+  if (!node.books_) return {};
+  return TakeList(node, node.books_->first_reindexable, &OPNode::next_reindexable_);
 }
 
 std::vector<OPNode*> Ledger::TakeMovable(OPNode& node) {
   Adopt(node);
-  if (!node.child_index_) return {};
-  std::vector<OPNode*> taken = std::exchange(node.child_index_->movable, {});
-  for (OPNode* child : taken) child->movable_ = false;
-  const auto earlier = [](const OPNode* a, const OPNode* b) { return a->position_ < b->position_; };
+  if (!node.books_) return {};
+  std::vector<OPNode*> taken = TakeList(node, node.books_->first_movable, &OPNode::next_movable_);
+  std::reverse(taken.begin(), taken.end());
+  const auto earlier = [](const OPNode* a, const OPNode* b) { return a->place_ < b->place_; };
   if (!std::is_sorted(taken.begin(), taken.end(), earlier)) {
     std::sort(taken.begin(), taken.end(), earlier);
   }
@@ -168,10 +249,11 @@ void Ledger::Refile(OPNode::RecordIndex::RecordSet& set, FileIndexOP kind) {
 }
 
 OPNode::RecordIndex& Ledger::Sift(OPNode& node, const OP* current) {
-  if (!node.record_index_ || node.record_index_->seen > node.ops.size()) {
-    node.record_index_ = std::make_unique<OPNode::RecordIndex>();
+  std::unique_ptr<OPNode::RecordIndex>& records = BooksOf(node).records;
+  if (!records || records->seen > node.ops.size()) {
+    records = std::make_unique<OPNode::RecordIndex>();
   }
-  OPNode::RecordIndex& index = *node.record_index_;
+  OPNode::RecordIndex& index = *records;
   if (index.unsettled != nullptr && index.unsettled != current) {
     Enter(index, std::exchange(index.unsettled, nullptr));
   }
@@ -228,10 +310,10 @@ Ledger::Bundle Ledger::Take(OPNode& node) {
   Bundle bundle;
   if (!IsShort(node)) {
     SiftSettled(node);
-    bundle.index = std::move(node.record_index_);
+    bundle.index = std::move(node.books_->records);
   }
   bundle.ops = std::exchange(node.ops, {});
-  node.record_index_.reset();
+  if (node.books_) node.books_->records.reset();
   return bundle;
 }
 
@@ -267,7 +349,7 @@ bool Ledger::Receive(OPNode& node, Bundle bundle, const OP* current) {
 
 void Ledger::Settle(OPNode& node) {
   if (!HasFront(node)) return;
-  OPNode::RecordIndex& index = *node.record_index_;
+  OPNode::RecordIndex& index = *node.books_->records;
   index.seen += index.front.size();
   std::reverse(index.front.begin(), index.front.end());
   Append(node.ops, index.front);
@@ -276,18 +358,24 @@ void Ledger::Settle(OPNode& node) {
 
 void Ledger::Forget(OPNode& node) {
   Settle(node);
-  node.record_index_.reset();
+  if (node.books_) node.books_->records.reset();
   Touch(node);
 }
 
+void Ledger::Release(OPNode& node) {
+  node.ops.clear();
+  if (node.parent && node.children.empty() && IsInPlace(node)) {
+    node.parent->children[node.place_].reset();
+  }
+}
+
 void Ledger::Dismantle(OPNode& node, std::vector<std::shared_ptr<OPNode>>& orphans) {
-  orphans.insert(orphans.end(), std::make_move_iterator(node.children.begin()),
-                 std::make_move_iterator(node.children.end()));
+  for (std::shared_ptr<OPNode>& child : node.children) {
+    if (child) orphans.push_back(std::move(child));
+  }
   node.children.clear();
   node.ops.clear();
-  node.child_index_.reset();
-  node.record_index_.reset();
-  node.adopted_ = 0;
+  node.books_.reset();
 }
 
 }  // namespace quarry::fileindex

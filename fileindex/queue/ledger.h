@@ -17,21 +17,10 @@
 #include <utility>
 #include <vector>
 
+#include "fileindex/queue/name_table.h"
 #include "fileindex/queue/optree.h"
 
 namespace quarry::fileindex {
-
-struct OPNode::ChildIndex {
-  std::unordered_map<std::string_view, std::size_t> positions;  // only for nodes of many children
-  std::size_t indexed = 0;  // how many of the children are in `positions`
-
-  // The children at or below which a reindex may find something to cancel, and those where a rename
-  // may find something to move. They may turn out to hold nothing: whoever walks a list empties it,
-  // and a record that is attached later lists the way down to its node again. So each walk costs no
-  // more than the attachments since the last one.
-  std::vector<OPNode*> reindexable;
-  std::vector<OPNode*> movable;
-};
 
 // What is pending in a node's long list. Cancelled records play no part any more and are left out;
 // renames are only counted, for every rule keeps clear of them.
@@ -59,13 +48,43 @@ struct OPNode::RecordIndex {
   OP* unsettled = nullptr;  // in the list, but of a kind that the event being folded may yet change
 };
 
+struct OPNode::Books {
+  // The children at or below which a reindex may find something to cancel, and those where a rename
+  // may find something to move: the places of the first ones, who know the next. They may turn out
+  // to hold nothing: whoever walks a list empties it, and a record that is attached later lists the
+  // way down to its node again. So each walk costs no more than the attachments since the last one.
+  std::uint32_t first_reindexable = kEnd;
+  std::uint32_t first_movable = kEnd;
+  std::uint32_t adopted = 0;  // how many of the children are accounted for
+  NameTable names;            // of those, only where they are many
+
+  std::unique_ptr<RecordIndex> records;  // only for a long list
+
+  static constexpr std::uint32_t kEnd = kNone - 1;  // no place; the last one's next
+};
+
 // All functions cost time in proportion to what they hand out or change, over all calls on a tree.
 // `current` is the record that is being folded: it may be attached already, and its kind is not
 // settled before the event is through.
 class Ledger {
  public:
-  // The child of that name, created if there is none, and touched.
-  static std::shared_ptr<OPNode> Child(OPNode& node, std::string_view name);
+  // The child of that name, created if there is none, and touched. The reference holds until the
+  // next child is created.
+  static const std::shared_ptr<OPNode>& Child(OPNode& node, std::string_view name) {
+    return Child(node, name, NameTable::HashOf(name));
+  }
+  static const std::shared_ptr<OPNode>& Child(OPNode& node, std::string_view name,
+                                              std::uint32_t hash);
+
+  // Ask for the memory that Child and ForEachOwn will look at, each for what the one before has
+  // asked for. What is expected as a child may be null, or another.
+  static void PrefetchDirectory(const OPNode& node);
+  static void PrefetchBooks(const OPNode& node);
+  static void PrefetchName(const OPNode& node, std::uint32_t hash);
+  static void PrefetchPlace(const OPNode& node, std::uint32_t hash);
+  static const OPNode* PrefetchChild(const OPNode& node, std::uint32_t hash);
+  static void PrefetchList(const OPNode& node);
+  static void PrefetchRecord(const OPNode& node);
 
   // Makes sure that walks from above come by this node.
   static void Touch(OPNode& node);
@@ -120,18 +139,33 @@ class Ledger {
   // Forgets what is known about the node's list, for someone else may have changed its records.
   static void Forget(OPNode& node);
 
+  // Drops the node's records, and the node itself, when its tree is taken apart and the node has no
+  // children. The caller holds the node.
+  static void Release(OPNode& node);
+
   // Moves the node's children to `orphans` and drops its records.
   static void Dismantle(OPNode& node, std::vector<std::shared_ptr<OPNode>>& orphans);
 
  private:
   static bool HasFront(const OPNode& node) {
-    return node.record_index_ && !node.record_index_->front.empty();
+    return node.books_ && node.books_->records && !node.books_->records->front.empty();
   }
   // A list with a front is long: only what is longer leaves one, see Receive.
   static bool IsShort(const OPNode& node) { return node.ops.size() <= 32; }
-  static OPNode::ChildIndex& Children(OPNode& node);
-  static const std::shared_ptr<OPNode>* Find(OPNode& node, std::string_view name);
+
+  static OPNode::Books& BooksOf(OPNode& node);
   static void Adopt(OPNode& node);
+  static void AdoptNext(OPNode& node, OPNode::Books& books);
+  static bool IsInPlace(const OPNode& node);
+  // Places among the node's children.
+  static std::uint32_t Find(const OPNode& node, std::string_view name, std::uint32_t hash);
+  static std::uint32_t Expected(const OPNode& node, std::uint32_t hash);
+  static std::uint32_t FindEntered(const OPNode& node, std::string_view name, std::uint32_t hash);
+
+  using Link = std::uint32_t OPNode::*;
+  static void Prepend(OPNode& node, std::uint32_t& first, Link next);
+  static std::vector<OPNode*> TakeList(OPNode& node, std::uint32_t& first, Link next);
+
   static void Enter(OPNode::RecordIndex& index, OP* rec);
   static void Refile(OPNode::RecordIndex::RecordSet& set, FileIndexOP kind);
   static void Merge(OPNode::RecordIndex& index, OPNode::RecordIndex& later);

@@ -9,7 +9,9 @@
 
 #include "common/error.h"
 #include "common/log.h"
+#include "fileindex/queue/event_line.h"
 #include "fileindex/queue/ledger.h"
+#include "fileindex/queue/look_ahead.h"
 #include "fileindex/queue/queue_reader.h"
 #include "fileindex/queue/relocation.h"
 
@@ -104,7 +106,14 @@ OPTree::OPTree(const std::string& path) : OPTree(path, Empty()) {
 }
 
 OPTree::~OPTree() {
-  ops.clear();
+  spare_.reset();
+  // In order of acceptance, in which they lie in memory; the tree's own order is all over the
+  // place.
+  for (std::shared_ptr<OP>& rec : ops) {
+    const std::shared_ptr<OPNode> node = rec->node;
+    rec.reset();
+    if (node) Ledger::Release(*node);
+  }
   std::vector<std::shared_ptr<OPNode>> orphans;
   if (root) orphans.push_back(std::move(root));
   while (!orphans.empty()) {
@@ -130,21 +139,32 @@ void OPTree::BuildTree() {
 }
 
 void OPTree::InsertLines(QueueReader& input) {
-  std::string line;
-  while (input.Next(line)) {
-    InsertLine(line);
-    if (crashed) return;
+  LookAhead ahead;
+  while (ahead.Read(input)) {
+    for (const QueueLine& line : ahead.lines()) {
+      if (log_level == 7) LogLine(QUARRY_SITE("optree"), "Got event: " + std::string(line.text));
+      InsertLine(line, ahead);
+      if (crashed) return;
+    }
   }
 }
 
-void OPTree::InsertLine(const std::string& line) {
-  if (log_level == 7) LogLine(QUARRY_SITE("optree"), "Got event: " + line);
+void OPTree::InsertLine(const QueueLine& line, LookAhead& ahead) {
   try {
-    InsertEvent(std::make_shared<Event>(line));
+    if (!line.is_usual) {
+      InsertEvent(std::make_shared<Event>(std::string(line.text)));
+    } else if (line.directory != nullptr) {
+      Insert(Ledger::Child(*line.directory, line.name, line.hash), line.event,
+             Json::Value::nullSingleton());
+    } else {
+      const std::shared_ptr<OPNode> node = NodeAt(line.event.path);
+      ahead.Learn(line.event.path, *node);
+      Insert(node, line.event, Json::Value::nullSingleton());
+    }
   } catch (const Error& error) {
     ++skipped_lines_;
     LogError(LogSite{"optree.cpp", __LINE__, "BuildTree"},
-             "InsertEvent failed, event_raw=" + line +
+             "InsertEvent failed, event_raw=" + std::string(line.text) +
                  ", code=" + std::to_string(static_cast<std::int32_t>(error.code())) +
                  ", reason=" + error.reason());
   }
@@ -153,40 +173,58 @@ void OPTree::InsertLine(const std::string& line) {
 void OPTree::InsertEvent(std::shared_ptr<Event> event) {
   RefuseNul(event->path);
   RefuseNul(event->path_old);
-  const std::shared_ptr<OPNode> node = GetNodeByPath(event->path);
-  const auto rec = std::make_shared<OP>(node, OP_NONE, "", Json::Value());
-  const auto has = [&event](EventKind kind) { return (event->op & kind) != 0; };
-  const auto has_for_dir = [&](EventKind kind) { return has(kind) && event->is_dir; };
-  const auto has_for_file = [&](EventKind kind) { return has(kind) && !event->is_dir; };
+  const EventLine line{event->op, event->is_dir, event->path, event->path_old};
+  Insert(NodeAt(event->path), line, event->data);
+}
+
+// The path that the node stands for, and the old path, hold no NUL byte.
+void OPTree::Insert(std::shared_ptr<OPNode> node, const EventLine& event, const Json::Value& data) {
+  const std::shared_ptr<OP> rec = NewRecord(node);
+  const auto has = [&event](EventKind kind) { return (event.op & kind) != 0; };
+  const auto has_for_dir = [&](EventKind kind) { return has(kind) && event.is_dir; };
+  const auto has_for_file = [&](EventKind kind) { return has(kind) && !event.is_dir; };
 
   if (has_for_dir(EVENT_CREATE)) HandleReindex(node, rec);
-  if (has_for_file(EVENT_CREATE)) HandleCreate(node, rec);
-  if (has(EVENT_ATTR)) HandleAttr(node, rec);
-  if (has(EVENT_MODIFY)) HandleModify(node, rec);
+  if (has_for_file(EVENT_CREATE)) Fold(node, rec, kCreate);
+  if (has(EVENT_ATTR)) Fold(node, rec, kAttr);
+  if (has(EVENT_MODIFY)) Fold(node, rec, kModify);
   if (has_for_dir(EVENT_DELETE)) HandleReindex(node, rec);
-  if (has_for_file(EVENT_DELETE)) HandleDelete(node, rec);
+  if (has_for_file(EVENT_DELETE)) Fold(node, rec, kDelete);
   if (has(EVENT_RENAME)) {
-    rec->src = event->path_old;
+    rec->src = event.path_old;
     HandleRename(node, rec);
   }
   if (has(EVENT_REINDEX)) HandleReindex(node, rec);
   if (has(EVENT_UPDATE_CFG)) {
-    rec->data = event->data;
-    HandleUpdateCfg(node, rec);
+    rec->data = data;
+    Fold(node, rec, kUpdateCfg);
   }
   if (has(EVENT_OVERFLOW)) crashed = true;
+  if (!rec->attached_) spare_ = rec;
+}
+
+// Most events are absorbed by what is pending already: their records are used again.
+std::shared_ptr<OP> OPTree::NewRecord(const std::shared_ptr<OPNode>& node) {
+  const std::shared_ptr<OP> rec = std::move(spare_);
+  if (!rec) return std::make_shared<OP>(node, OP_NONE, "", Json::Value());
+  rec->node = node;
+  if (!rec->data.isNull()) rec->data = Json::Value();
+  return rec;
 }
 
 std::shared_ptr<OPNode> OPTree::GetNodeByPath(const std::string& path) {
-  std::shared_ptr<OPNode> node = root;
-  for (std::size_t begin = 0; node && begin < path.size();) {
+  return NodeAt(path);
+}
+
+std::shared_ptr<OPNode> OPTree::NodeAt(std::string_view path) {
+  if (!root) throw Error(kErrorTreePath, "GetNodeByPath failed, path=" + std::string(path));
+  const std::shared_ptr<OPNode>* node = &root;
+  for (std::size_t begin = 0; begin < path.size();) {
     const std::size_t end = std::min(path.find('/', begin), path.size());
-    const std::string_view component(path.data() + begin, end - begin);
-    if (!component.empty()) node = Ledger::Child(*node, component);
+    if (end != begin) node = &Ledger::Child(**node, path.substr(begin, end - begin));
     begin = end + 1;
   }
-  if (!node) throw Error(kErrorTreePath, "GetNodeByPath failed, path=" + path);
-  return node;
+  return *node;
 }
 
 void OPTree::Attach(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& rec) {

@@ -12,6 +12,7 @@
 #include <memory>
 #include <ostream>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "common/export.h"
@@ -32,7 +33,10 @@ enum FileIndexOP : std::int32_t {
   OP_FULL_REINDEX = 7,  // events were lost: reindex the whole share
 };
 
+struct EventLine;
+struct QueueLine;
 class OPNode;
+class LookAhead;
 class OPTree;
 class QueueReader;
 struct RuleRow;
@@ -85,15 +89,14 @@ class QUARRY_EXPORT OPNode : public std::enable_shared_from_this<OPNode> {
 
  private:
   friend class Ledger;  // finds children and records without walking long lists
-  struct ChildIndex;
   struct RecordIndex;
+  struct Books;
+  static constexpr std::uint32_t kNone = 0xffffffff;
 
-  std::unique_ptr<ChildIndex> child_index_;
-  std::unique_ptr<RecordIndex> record_index_;
-  std::size_t adopted_ = 0;   // how many of `children` are accounted for
-  std::size_t position_ = 0;  // this node's place among its parent's children
-  bool reindexable_ = false;  // the parent's index lists it, see Ledger
-  bool movable_ = false;
+  std::unique_ptr<Books> books_;            // only where there are children or many records
+  std::uint32_t place_ = kNone;             // among the parent's children
+  std::uint32_t next_reindexable_ = kNone;  // place of the next one in a list of the parent's
+  std::uint32_t next_movable_ = kNone;      // books; kNone for what is not in the list
 };
 
 // "[kind] path, data=JSON", with "old path -> " before the path where there is one.
@@ -167,13 +170,17 @@ class QUARRY_EXPORT OPTree {
   OPTree(const std::string& path, Empty);
 
   void InsertLines(QueueReader& input);
-  void InsertLine(const std::string& line);
+  void InsertLine(const QueueLine& line, LookAhead& ahead);
+  void Insert(std::shared_ptr<OPNode> node, const EventLine& event, const Json::Value& data);
+  std::shared_ptr<OP> NewRecord(const std::shared_ptr<OPNode>& node);
+  std::shared_ptr<OPNode> NodeAt(std::string_view path);
   void Attach(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& rec);
   void Fold(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& rec,
             const RuleRow& rules);
   void Settle();
 
   std::vector<OPNode*> unsettled_;  // nodes whose lists are not in order yet
+  std::shared_ptr<OP> spare_;       // a record that was not attached
   bool building_ = false;           // nobody looks at the lists yet
   std::size_t skipped_lines_ = 0;
 };

@@ -7,6 +7,7 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
+#include <string_view>
 #include <utility>
 
 #include "common/error.h"
@@ -146,10 +147,11 @@ bool QueueMgr::FindQueue(TornLine torn, const std::string& path, const Predicate
     errno = saved_errno;
     return false;
   }
-  std::string line;
+  std::string_view line;
   while (input.Next(line)) {
-    if (torn == TornLine::kIsNone && !input.line_ended() && !IsJson(line)) break;
-    if (predicate(std::make_shared<Event>(line))) return true;
+    const std::string text(line);
+    if (torn == TornLine::kIsNone && !input.line_ended() && !IsJson(text)) break;
+    if (predicate(std::make_shared<Event>(text))) return true;
   }
   if (input.failed()) {
     Fail(QUARRY_SITE("queue_mgr"), "!input_stream", kErrorSystem,

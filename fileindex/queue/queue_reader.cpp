@@ -3,6 +3,7 @@
 #include <fcntl.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 
@@ -16,37 +17,44 @@ constexpr size_t kBufferSize = 64 * 1024;
 QueueReader::QueueReader(const std::string& path)
     : fd_(open(path.c_str(), O_RDONLY | O_CLOEXEC)), failed_(!fd_.valid()), buffer_(kBufferSize) {}
 
-bool QueueReader::Next(std::string& line) {
-  line.clear();
-  line_ended_ = false;
-  while (begin_ != end_ || Fill()) {
-    const char* const start = buffer_.data() + begin_;
-    const void* const newline = std::memchr(start, '\n', end_ - begin_);
-    if (newline != nullptr) {
-      const auto length = static_cast<size_t>(static_cast<const char*>(newline) - start);
-      line.append(start, length);
-      begin_ += length + 1;
-      line_ended_ = true;
-      return true;
-    }
-    line.append(start, end_ - begin_);
-    begin_ = end_;
-  }
-  return !failed_ && !line.empty();
+bool QueueReader::Next(std::string_view& line) {
+  while (newline_ == nullptr && Fill()) FindNewline();
+  line_ended_ = newline_ != nullptr;
+  const char* const start = buffer_.data() + begin_;
+  const char* const stop = line_ended_ ? newline_ : buffer_.data() + end_;
+  line = std::string_view(start, static_cast<size_t>(stop - start));
+  begin_ = searched_ = std::min(begin_ + line.size() + 1, end_);
+  FindNewline();
+  return line_ended_ || (!failed_ && !line.empty());
+}
+
+void QueueReader::FindNewline() {
+  const void* const found = std::memchr(buffer_.data() + searched_, '\n', end_ - searched_);
+  newline_ = static_cast<const char*>(found);
+  searched_ = end_;
+}
+
+// Moves the beginning of a line to the front. A line that fills the buffer gets a larger one.
+void QueueReader::MakeRoom() {
+  std::memmove(buffer_.data(), buffer_.data() + begin_, end_ - begin_);
+  end_ -= begin_;
+  searched_ -= begin_;
+  begin_ = 0;
+  if (end_ == buffer_.size()) buffer_.resize(2 * buffer_.size());
 }
 
 bool QueueReader::Fill() {
   // Once the end was met it stays: what is appended to a live queue now may be the rest of a line
   // that was handed out.
   if (failed_ || at_end_) return false;
+  MakeRoom();
   ssize_t count;
   do {
-    count = read(fd_.get(), buffer_.data(), buffer_.size());
+    count = read(fd_.get(), buffer_.data() + end_, buffer_.size() - end_);
   } while (count < 0 && errno == EINTR);
   failed_ = count < 0;
   at_end_ = count == 0;
-  begin_ = 0;
-  end_ = count > 0 ? static_cast<size_t>(count) : 0;
+  if (count > 0) end_ += static_cast<size_t>(count);
   return count > 0;
 }
 

@@ -4,6 +4,7 @@
 #define QUARRY_FILEINDEX_QUEUE_QUEUE_READER_H_
 
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "common/unique_fd.h"
@@ -17,8 +18,12 @@ class QueueReader {
 
   // The next line without its newline, of any bytes and any length; the last one need not be ended.
   // False at the end of the file, also if it grows thereafter, and when reading fails: then
-  // failed() is true and errno says why.
-  bool Next(std::string& line);
+  // failed() is true and errno says why. The line stays where it is until a call without
+  // has_line().
+  bool Next(std::string_view& line);
+
+  // Whether the next line is at hand, whole.
+  bool has_line() const { return newline_ != nullptr; }
 
   bool failed() const { return failed_; }
 
@@ -26,7 +31,9 @@ class QueueReader {
   bool line_ended() const { return line_ended_; }
 
  private:
+  void FindNewline();
   bool Fill();
+  void MakeRoom();
 
   UniqueFd fd_;
   bool failed_;
@@ -35,6 +42,8 @@ class QueueReader {
   std::vector<char> buffer_;
   size_t begin_ = 0;  // what has not been handed out yet is buffer_[begin_, end_)
   size_t end_ = 0;
+  const char* newline_ = nullptr;  // the first one there
+  size_t searched_ = 0;            // without one, there is none before
 };
 
 }  // namespace quarry::fileindex
