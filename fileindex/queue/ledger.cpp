@@ -87,18 +87,27 @@ void Ledger::Adopt(OPNode& node) {
 }
 
 void Ledger::AdoptNext(OPNode& node, OPNode::Books& books) {
-  const std::uint32_t place = books.adopted++;
-  OPNode& child = *node.children[place];
-  child.place_ = place;
-  child.next_reindexable_ = child.next_movable_ = OPNode::kNone;
-  Touch(child);
+  Place(node, books);
   if (books.adopted <= kFewChildren) return;
   // Those that were few have not been entered yet.
-  for (std::uint32_t at = place == kFewChildren ? 0 : place; at <= place; ++at) {
-    const std::string& name = node.children[at]->name;
-    const std::uint32_t hash = NameTable::HashOf(name);
-    if (FindEntered(node, name, hash) == OPNode::kNone) books.names.Add(hash, at);
+  const std::uint32_t last = books.adopted - 1;
+  for (std::uint32_t at = last == kFewChildren ? 0 : last; at <= last; ++at) {
+    EnterName(node, books, at);
   }
+}
+
+void Ledger::Place(OPNode& node, OPNode::Books& books) {
+  OPNode& child = *node.children[books.adopted];
+  child.place_ = books.adopted++;
+  child.next_reindexable_ = child.next_movable_ = OPNode::kNone;
+  Touch(child);
+}
+
+// Of several children of one name the first is found.
+void Ledger::EnterName(OPNode& node, OPNode::Books& books, std::uint32_t place) {
+  const std::string& name = node.children[place]->name;
+  const std::uint32_t hash = NameTable::HashOf(name);
+  if (FindEntered(node, name, hash) == OPNode::kNone) books.names.Add(hash, place);
 }
 
 std::uint32_t Ledger::FindEntered(const OPNode& node, std::string_view name, std::uint32_t hash) {
@@ -125,7 +134,13 @@ const std::shared_ptr<OPNode>& Ledger::Child(OPNode& node, std::string_view name
   }
   node.children.push_back(std::make_shared<OPNode>(node.shared_from_this(), kUnnamed));
   node.children.back()->name = std::string(name);  // of its very size: assigned it takes more
-  AdoptNext(node, BooksOf(node));
+  OPNode::Books& books = BooksOf(node);
+  if (books.adopted > kFewChildren) {
+    books.names.Add(hash, books.adopted);
+    Place(node, books);
+  } else {
+    AdoptNext(node, books);
+  }
   return node.children.back();
 }
 

@@ -156,6 +156,8 @@ class Ledger {
   static OPNode::Books& BooksOf(OPNode& node);
   static void Adopt(OPNode& node);
   static void AdoptNext(OPNode& node, OPNode::Books& books);
+  static void Place(OPNode& node, OPNode::Books& books);
+  static void EnterName(OPNode& node, OPNode::Books& books, std::uint32_t place);
   static bool IsInPlace(const OPNode& node);
   // Places among the node's children.
   static std::uint32_t Find(const OPNode& node, std::string_view name, std::uint32_t hash);

@@ -29,7 +29,7 @@ bool LookAhead::Read(QueueReader& input) {
     QueueLine line;
     if (!input.Next(line.text)) break;
     line.is_usual = ReadEventLine(line.text, line.event);
-    if (line.is_usual) FindDirectory(line);
+    if (line.is_usual) AskForDirectory(line);
     lines_[count_++] = line;
   } while (count_ < lines_.size() && input.has_line());
   Prefetch();
@@ -40,9 +40,14 @@ std::size_t LookAhead::SlotOf(std::string_view path) {
   return std::hash<std::string_view>()(path) % kDirectories;
 }
 
+void LookAhead::AskForDirectory(QueueLine& line) const {
+  line.slot = SlotOf(SplitPath(line.event.path).directory);
+  __builtin_prefetch(&directories_[line.slot]);
+}
+
 void LookAhead::FindDirectory(QueueLine& line) const {
   const SplitPath split(line.event.path);
-  const Directory& directory = directories_[SlotOf(split.directory)];
+  const Directory& directory = directories_[line.slot];
   if (split.name.empty() || directory.path != split.directory) return;
   line.directory = directory.node;
   line.name = split.name;
@@ -66,6 +71,10 @@ void LookAhead::ForEachKnown(Step step) {
 // Step by step for all lines: each step needs what the one before has asked for, but no line waits
 // for another.
 void LookAhead::Prefetch() {
+  for (const QueueLine& line : lines()) __builtin_prefetch(directories_[line.slot].path.data());
+  for (QueueLine& line : lines()) {
+    if (line.is_usual) FindDirectory(line);
+  }
   ForEachKnown([](QueueLine& line) { Ledger::PrefetchBooks(*line.directory); });
   ForEachKnown([](QueueLine& line) { Ledger::PrefetchName(*line.directory, line.hash); });
   ForEachKnown([](QueueLine& line) { Ledger::PrefetchPlace(*line.directory, line.hash); });

@@ -26,6 +26,7 @@ struct QueueLine {
   std::string_view text;
   bool is_usual = false;         // `event` has been read from it
   EventLine event{};             // of a usual line
+  std::size_t slot = 0;          // where the directory of its path is remembered
   OPNode* directory = nullptr;   // the node above that of the event's path, where it is known
   std::string_view name{};       // then, the last component of the path
   std::uint32_t hash = 0;        // and its hash
@@ -57,6 +58,7 @@ class LookAhead {
   static constexpr std::size_t kLongestPath = 512;
 
   static std::size_t SlotOf(std::string_view path);
+  void AskForDirectory(QueueLine& line) const;
   void FindDirectory(QueueLine& line) const;
   template <typename Step>
   void ForEachKnown(Step step);
