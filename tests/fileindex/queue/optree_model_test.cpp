@@ -237,6 +237,7 @@ INSTANTIATE_TEST_SUITE_P(
     ::testing::Values(Mix{"small", 2, 2, 20, 1500, 3, 6, false, true},
                       Mix{"deep", 2, 5, 40, 500, 3, 6, false, true},
                       Mix{"wide", 12, 2, 60, 200, 4, 8, false, true},
+                      Mix{"crowded", 100, 2, 400, 40, 4, 8, false, true},
                       Mix{"odd", 2, 3, 30, 800, 3, 3, true, true},
                       Mix{"calm", 3, 3, 60, 300, 15, 50, false, true},
                       Mix{"one_place", 1, 1, 300, 60, 6, 4, true, false},
