@@ -12,6 +12,7 @@
 #include <thread>
 
 #include "daemons/common/command_line.h"
+#include "daemons/common/heap.h"
 #include "daemons/common/log.h"
 #include "daemons/common/single_instance.h"
 #include "daemons/common/stop_signal.h"
@@ -61,14 +62,17 @@ void Serve(std::size_t threads, bool full_speed) {
 int main(int argc, char** argv) {
   CLI::App app("Keeps the search indexes of all indexed shares up to date.", kName);
   app.footer(kExamples);
-  std::size_t threads = std::max(1U, std::thread::hardware_concurrency());
-  app.add_option("--threads", threads, "Documents in work at a time (default: the machine's cores)")
+  // While one half is read, the other half is stored.
+  std::size_t threads = std::clamp(2 * std::thread::hardware_concurrency(), 2U, 64U);
+  app.add_option("--threads", threads,
+                 "Documents in work at a time (default: twice the machine's cores)")
       ->check(CLI::Range(1, 64));
   bool full_speed = false;
   app.add_flag("--full-speed", full_speed,
                "Do not leave the processors and disks to others (default: nice 10, idle I/O)");
   if (const auto status = daemon::ParseCommandLine(&app, argc, argv)) return *status;
   daemon::OpenLog(kName, true);
+  daemon::KeepHeapSmall();
   try {
     Serve(threads, full_speed);
   } catch (const std::exception& error) {

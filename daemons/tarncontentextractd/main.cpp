@@ -10,6 +10,7 @@
 #include "common/error.h"
 #include "common/paths.h"
 #include "daemons/common/command_line.h"
+#include "daemons/common/heap.h"
 #include "daemons/common/log.h"
 #include "daemons/common/single_instance.h"
 #include "daemons/common/socket_server.h"
@@ -77,6 +78,7 @@ int RunDaemon(int argc, char** argv) {
       "says what may be asked there.");
   if (const auto status = daemon::ParseCommandLine(&app, argc, argv)) return *status;
   daemon::OpenLog(kName, true);
+  daemon::KeepHeapSmall();
   try {
     return Serve(workers);
   } catch (const Error& error) {

@@ -14,6 +14,7 @@
 #include "common/error.h"
 #include "common/paths.h"
 #include "daemons/common/command_line.h"
+#include "daemons/common/heap.h"
 #include "daemons/common/log.h"
 #include "daemons/common/single_instance.h"
 #include "daemons/common/socket_server.h"
@@ -135,6 +136,7 @@ int Main(int argc, char** argv) {
   app.add_flag("--quiet", settings.quiet, "Log to the system log only");
   if (const auto status = daemon::ParseCommandLine(&app, argc, argv)) return *status;
   daemon::OpenLog(kName, !settings.quiet);
+  daemon::KeepHeapSmall();
   try {
     Serve(settings);
     return EXIT_SUCCESS;
