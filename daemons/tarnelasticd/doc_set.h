@@ -22,6 +22,12 @@ class DocSet {
     bits_[word] |= std::uint64_t{1} << (static_cast<std::uint64_t>(id) % 64);
   }
 
+  void Remove(std::int64_t id) {
+    const auto word = static_cast<std::size_t>(id) / 64;
+    if (word < bits_.size())
+      bits_[word] &= ~(std::uint64_t{1} << (static_cast<std::uint64_t>(id) % 64));
+  }
+
   bool Contains(std::int64_t id) const {
     const auto word = static_cast<std::size_t>(id) / 64;
     return word < bits_.size() && (bits_[word] >> (static_cast<std::uint64_t>(id) % 64) & 1) != 0;

@@ -1,6 +1,9 @@
 #include "daemons/tarnelasticd/fts_buffer.h"
 
+#include <algorithm>
 #include <utility>
+
+#include "daemons/tarnelasticd/text_lengths.h"
 
 namespace quarry::engine {
 namespace {
@@ -63,7 +66,10 @@ void FtsBuffer::Run(const std::string& sql, std::int64_t id,
 }
 
 void FtsBuffer::RunBody(const std::string& sql, std::int64_t id, std::string_view body) {
-  if (!body.empty()) Run(sql, id, UnpackTexts(schema_, body));
+  if (body.empty()) return;
+  Run(sql, id, UnpackTexts(schema_, body));
+  texts_.push_back(id);
+  bytes_ += sizeof id;
 }
 
 void FtsBuffer::InsertLabels(std::int64_t id, const Labels& labels) {
@@ -100,10 +106,18 @@ void FtsBuffer::Flush() {
     RunBody(body_.insert, id, change.now);
   }
   for (const auto& [id, change] : labels_) FlushLabels(id, change);
+  FlushLengths();
   Clear();
 }
 
+void FtsBuffer::FlushLengths() {
+  std::sort(texts_.begin(), texts_.end());
+  texts_.erase(std::unique(texts_.begin(), texts_.end()), texts_.end());
+  UpdateTextLengths(db_, texts_);
+}
+
 void FtsBuffer::Clear() {
+  texts_.clear();
   bodies_.clear();
   labels_.clear();
   bytes_ = 0;

@@ -62,6 +62,7 @@ class FtsBuffer {
   void RunBody(const std::string& sql, std::int64_t id, std::string_view body);
   void InsertLabels(std::int64_t id, const Labels& labels);
   void FlushLabels(std::int64_t id, const Change<std::optional<Labels>>& change);
+  void FlushLengths();
 
   const Schema& schema_;
   Database* db_;
@@ -71,6 +72,7 @@ class FtsBuffer {
   const Table name_;
   std::map<std::int64_t, Change<std::string>> bodies_;
   std::map<std::int64_t, Change<std::optional<Labels>>> labels_;
+  std::vector<std::int64_t> texts_;  // rows whose full text has been put in or taken out
   std::size_t bytes_ = 0;
 };
 

@@ -16,7 +16,7 @@ constexpr int kProgressSteps = 20000;
 IndexReader::IndexReader(const std::string& database_path)
     : db_(database_path), tokenizer_(db_.handle()) {
   db_.Execute("PRAGMA query_only=ON;PRAGMA cache_size=-8192;");
-  RegisterRanking(db_.handle(), &rank_context_);
+  RegisterCounting(db_.handle(), &count_context_);
   sqlite3_progress_handler(db_.handle(), kProgressSteps, &OnProgress, this);
 }
 
@@ -39,7 +39,6 @@ void IndexReader::CheckDeadline() const {
 
 void IndexReader::End() noexcept {
   deadline_ = std::chrono::steady_clock::time_point::max();
-  rank_context_ = nullptr;
   if (db_.InTransaction()) sqlite3_exec(db_.handle(), "ROLLBACK", nullptr, nullptr, nullptr);
 }
 

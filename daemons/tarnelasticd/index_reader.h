@@ -31,8 +31,20 @@ class IndexReader {
 
   Database& db() { return db_; }
   const TextTokenizer& tokenizer() const { return tokenizer_; }
-  // What quarry_score works on; null while no ranking runs.
-  void SetRankContext(RankContext* context) { rank_context_ = context; }
+
+  // Lets quarry_count write to `context` as long as it lives.
+  class Counting {
+   public:
+    Counting(IndexReader* reader, CountContext* context) : reader_(reader) {
+      reader->count_context_ = context;
+    }
+    ~Counting() { reader_->count_context_ = nullptr; }
+    Counting(const Counting&) = delete;
+    Counting& operator=(const Counting&) = delete;
+
+   private:
+    IndexReader* reader_;
+  };
 
  private:
   static int OnProgress(void* self);
@@ -40,7 +52,7 @@ class IndexReader {
 
   Database db_;
   TextTokenizer tokenizer_;
-  RankContext* rank_context_ = nullptr;
+  CountContext* count_context_ = nullptr;
   std::chrono::steady_clock::time_point deadline_ = std::chrono::steady_clock::time_point::max();
 };
 

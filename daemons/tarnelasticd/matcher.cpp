@@ -4,8 +4,8 @@
 #include <utility>
 
 #include "daemons/tarnelasticd/field_names.h"
-#include "daemons/tarnelasticd/fts_buffer.h"
 #include "daemons/tarnelasticd/selection.h"
+#include "daemons/tarnelasticd/word_finder.h"
 #include "fileindex/util/file_type.h"
 
 namespace quarry::engine {
@@ -15,16 +15,8 @@ void Collect(Statement* rows, DocSet* set) {
   while (rows->Step()) set->Add(rows->Int(0));
 }
 
-std::string Quoted(const std::string& text) {
-  return QuoteSql(text, '"');
-}
-
-// A part of a file name; where it is too short to be looked up as one, the whole name, or all of
-// it before a dot.
-std::string NameExpression(const std::string& part) {
-  if (CountCharacters(part) >= kMinPart) return Quoted(part);
-  return Quoted(kNameBegin + part + kNameEnd) + " OR " + Quoted(kNameBegin + part + '.');
-}
+// What the frequencies of one query's terms may take in memory together.
+constexpr std::size_t kMaxFrequencies = std::size_t{32} << 20;
 
 int TypeOf(const std::string& name) {
   if (name == "document") return fileindex::kDocument;
@@ -40,13 +32,14 @@ bool IsAmong(int type, const std::vector<std::string>& names) {
 
 class Finder {
  public:
-  Finder(const Schema& schema, IndexReader* reader) : schema_(schema), db_(&reader->db()) {}
+  Finder(const Schema& schema, IndexReader* reader)
+      : schema_(schema), db_(&reader->db()), words_(schema, reader) {}
 
   // A name: filter for several parts takes them all: "name:*report*.pdf".
   DocSet ByName(const QueryTerm& term) {
-    DocSet found = MatchRows(db_, "names", NameExpression(term.values.front()));
+    DocSet found = words_.InNames(term.values.front());
     for (std::size_t i = 1; i < term.values.size(); ++i) {
-      found.Intersect(MatchRows(db_, "names", NameExpression(term.values[i])));
+      found.Intersect(words_.InNames(term.values[i]));
     }
     return found;
   }
@@ -105,15 +98,15 @@ class Finder {
   }
 
   DocSet ByWords(const QueryTerm& term, TermMatches* matches) {
-    DocSet found;
     if (!term.words.empty()) {
-      const std::string expression = PhraseExpression(term);
-      found = MatchRows(db_, "body", expression);
-      matches->texts = found.Count();
-      matches->labels = MatchRows(db_, "labels", expression);
-      found.Unite(matches->labels);
+      Frequencies frequencies;
+      matches->texts = words_.InTexts(term, &frequencies);
+      KeepFrequencies(std::move(frequencies), matches);
+      matches->labels = words_.InLabels(term);
     }
-    matches->names = MatchRows(db_, "names", NameExpression(term.part));
+    matches->names = words_.InNames(term.part);
+    DocSet found = matches->texts;
+    found.Unite(matches->labels);
     found.Unite(matches->names);
     matches->documents = found.Count();
     matches->term = &term;
@@ -121,6 +114,11 @@ class Finder {
   }
 
  private:
+  void KeepFrequencies(Frequencies frequencies, TermMatches* matches) {
+    frequencies_bytes_ += frequencies.Bytes();
+    if (frequencies_bytes_ <= kMaxFrequencies) matches->frequencies = std::move(frequencies);
+  }
+
   std::string FilesOnly() const {
     const std::string column = schema_.ColumnOf(kFieldIsDir);
     return column.empty() ? "" : " AND " + column + " IS NOT 1";
@@ -135,6 +133,8 @@ class Finder {
 
   const Schema& schema_;
   Database* db_;
+  WordFinder words_;
+  std::size_t frequencies_bytes_ = 0;
 };
 
 DocSet FindTerm(const QueryTerm& term, Finder* finder, Matches* matches) {
@@ -176,19 +176,6 @@ bool IsPlainNegation(const std::vector<QueryTerm>& group) {
 }
 
 }  // namespace
-
-// As typed: the database folds it exactly as it has folded the texts, whatever bytes there are.
-std::string PhraseExpression(const QueryTerm& term) {
-  return Quoted(term.text) + (term.prefix ? "*" : "");
-}
-
-DocSet MatchRows(Database* db, const std::string& table, const std::string& expression) {
-  DocSet found;
-  Statement rows = db->Prepare("SELECT rowid FROM " + table + " WHERE " + table + " MATCH ?1");
-  rows.Bind(1, std::string_view(expression));
-  Collect(&rows, &found);
-  return found;
-}
 
 std::vector<const QueryTerm*> RankedTerms(const Query& query) {
   std::vector<const QueryTerm*> terms;

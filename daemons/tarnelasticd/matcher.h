@@ -4,10 +4,11 @@
 #define QUARRY_DAEMONS_TARNELASTICD_MATCHER_H_
 
 #include <cstddef>
-#include <string>
+#include <optional>
 #include <vector>
 
 #include "daemons/tarnelasticd/doc_set.h"
+#include "daemons/tarnelasticd/frequencies.h"
 #include "daemons/tarnelasticd/index_reader.h"
 #include "daemons/tarnelasticd/query.h"
 #include "daemons/tarnelasticd/schema.h"
@@ -17,9 +18,12 @@ namespace quarry::engine {
 // Where one term of a query is found, as ranking needs it.
 struct TermMatches {
   const QueryTerm* term = nullptr;
-  DocSet labels;              // by a whole word of the file name or of a field that is not listed
-  DocSet names;               // by a part of the file name
-  std::size_t texts = 0;      // documents with it in their full text
+  DocSet texts;   // in the full text
+  DocSet labels;  // by a whole word of the file name or of a field that is not listed
+  DocSet names;   // by a part of the file name
+  // How often in the full text; without a value when that takes too much memory, for all terms
+  // together, to be kept.
+  std::optional<Frequencies> frequencies;
   std::size_t documents = 0;  // documents with it anywhere
 };
 
@@ -35,12 +39,6 @@ Matches FindMatches(const Schema& schema, const Query& query, IndexReader* reade
 
 // The words of the query that count for ranking, in the order of Matches::terms.
 std::vector<const QueryTerm*> RankedTerms(const Query& query);
-
-// The full-text expression for the words of a term.
-std::string PhraseExpression(const QueryTerm& term);
-
-// The rows of a full-text table that match an expression.
-DocSet MatchRows(Database* db, const std::string& table, const std::string& expression);
 
 }  // namespace quarry::engine
 

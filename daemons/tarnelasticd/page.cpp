@@ -1,12 +1,14 @@
 #include "daemons/tarnelasticd/page.h"
 
 #include <algorithm>
+#include <queue>
 #include <tuple>
 #include <utility>
 
 #include "daemons/tarnelasticd/field_names.h"
-#include "daemons/tarnelasticd/fts_buffer.h"
 #include "daemons/tarnelasticd/ranking.h"
+#include "daemons/tarnelasticd/text_lengths.h"
+#include "daemons/tarnelasticd/word_finder.h"
 
 namespace quarry::engine {
 namespace {
@@ -26,11 +28,16 @@ constexpr const char* kNoTime = "-9223372036854775808";
 class Scorer {
  public:
   Scorer(const SearchedIndex& index, const Matches& matches, const std::vector<double>& weights)
-      : index_(index), matches_(matches), weights_(weights), scores_(matches.documents.Bound()) {}
+      : matches_(matches),
+        weights_(weights),
+        words_(*index.schema, index.reader),
+        lengths_(&index.reader->db()),
+        scores_(matches.documents.Bound()) {}
 
-  const std::vector<float>& Run(const std::vector<const QueryTerm*>& terms) {
-    ScoreTexts();
+  // By row id.
+  const std::vector<double>& Run(const std::vector<const QueryTerm*>& terms) {
     for (std::size_t i = 0; i < matches_.terms.size(); ++i) {
+      ScoreTexts(matches_.terms[i], weights_[i]);
       Raise(matches_.terms[i].labels, kLabelFactor * weights_[i]);
       Raise(matches_.terms[i].names, kNameFactor * weights_[i]);
     }
@@ -42,28 +49,28 @@ class Scorer {
   void Raise(const DocSet& documents, double by) {
     DocSet common = documents;
     common.Intersect(matches_.documents);
-    common.ForEach(
-        [&](std::int64_t id) { scores_[static_cast<std::size_t>(id)] += static_cast<float>(by); });
+    common.ForEach([&](std::int64_t id) { scores_[static_cast<std::size_t>(id)] += by; });
   }
 
-  void ScoreTexts() {
-    RankContext context;
-    std::string expression;
-    for (std::size_t i = 0; i < matches_.terms.size(); ++i) {
-      if (matches_.terms[i].texts == 0) continue;
-      if (!expression.empty()) expression += " OR ";
-      expression += PhraseExpression(*matches_.terms[i].term);
-      context.word_weights.push_back(weights_[i]);
+  void ScoreTexts(const TermMatches& term, double weight) {
+    if (term.frequencies) {
+      ScoreTexts(term.texts, *term.frequencies, weight);
+    } else {
+      Frequencies frequencies;
+      words_.InTexts(*term.term, &frequencies);
+      ScoreTexts(term.texts, frequencies, weight);
     }
-    if (expression.empty() || matches_.documents.Empty()) return;
-    context.candidates = &matches_.documents;
-    context.column_weights = index_.schema->Weights();
-    context.scores = &scores_;
-    index_.reader->SetRankContext(&context);
-    Statement rows =
-        index_.reader->db().Prepare("SELECT quarry_score(body) FROM body WHERE body MATCH ?1");
-    rows.Bind(1, std::string_view(expression)).Run();
-    index_.reader->SetRankContext(nullptr);
+  }
+
+  void ScoreTexts(const DocSet& texts, const Frequencies& frequencies, double weight) {
+    DocSet common = texts;
+    common.Intersect(matches_.documents);
+    if (common.Empty()) return;
+    const double average = words_.AverageTextLength();
+    common.ForEach([&](std::int64_t id) {
+      const double norm = LengthNorm(lengths_.Of(id), average);
+      scores_[static_cast<std::size_t>(id)] += weight * WordScore(frequencies.Of(id), norm);
+    });
   }
 
   void ScoreWholeNames(const std::vector<const QueryTerm*>& terms) {
@@ -73,15 +80,15 @@ class Scorer {
       name += term->part;
     }
     if (name.empty()) return;
-    const auto quoted = [&](char end) { return QuoteSql(kNameBegin + name + end, '"'); };
-    Raise(MatchRows(&index_.reader->db(), "names", quoted(kNameEnd)), kWholeName);
-    Raise(MatchRows(&index_.reader->db(), "names", quoted('.')), kNameBeforeDot);
+    Raise(words_.ByWholeName(name, false), kWholeName);
+    Raise(words_.ByWholeName(name, true), kNameBeforeDot);
   }
 
-  const SearchedIndex& index_;
   const Matches& matches_;
   const std::vector<double>& weights_;
-  std::vector<float> scores_;
+  WordFinder words_;
+  TextLengths lengths_;
+  std::vector<double> scores_;
 };
 
 void KeepFirst(std::vector<Ranked>* ranked, SortOrder order, std::size_t count) {
@@ -93,19 +100,23 @@ void KeepFirst(std::vector<Ranked>* ranked, SortOrder order, std::size_t count) 
   ranked->erase(end, ranked->end());
 }
 
-std::vector<Ranked> BestScored(const Matches& matches, const std::vector<float>& scores,
+std::vector<Ranked> BestScored(const Matches& matches, const std::vector<double>& scores,
                                std::size_t count) {
-  // Only the number and the score of each, since there may be a million.
-  std::vector<std::pair<float, std::int64_t>> all;
-  matches.documents.ForEach(
-      [&](std::int64_t id) { all.emplace_back(-scores[static_cast<std::size_t>(id)], id); });
-  const auto end = all.begin() + static_cast<std::ptrdiff_t>(std::min(count, all.size()));
-  std::partial_sort(all.begin(), end, all.end());
-  std::vector<Ranked> best;
-  for (auto item = all.begin(); item != end; ++item) {
-    best.push_back({0, item->second, -static_cast<double>(item->first), 0, {}});
+  // Only the best so far are held, the worst of them on top, since there may be a million.
+  std::priority_queue<std::pair<float, std::int64_t>> best;
+  matches.documents.ForEach([&](std::int64_t id) {
+    const auto score = static_cast<float>(scores[static_cast<std::size_t>(id)]);
+    // Of equals the one that was stored first.
+    if (best.size() == count && (count == 0 || -score >= best.top().first)) return;
+    best.emplace(-score, id);
+    if (best.size() > count) best.pop();
+  });
+  std::vector<Ranked> ranked(best.size());
+  for (auto place = ranked.rbegin(); place != ranked.rend(); ++place) {
+    *place = {0, best.top().second, -static_cast<double>(best.top().first), 0, {}};
+    best.pop();
   }
-  return best;
+  return ranked;
 }
 
 std::vector<Ranked> LookUp(Database* db, const DocSet& documents, const std::string& columns,

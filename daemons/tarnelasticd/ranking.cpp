@@ -13,21 +13,13 @@ namespace {
 constexpr double kSaturation = 1.2;
 constexpr double kLengthShare = 0.75;
 
-double AverageLength(const Fts5ExtensionApi* api, Fts5Context* fts) {
-  sqlite3_int64 rows = 0;
-  sqlite3_int64 words = 0;
-  if (api->xRowCount(fts, &rows) != SQLITE_OK || rows == 0) return 1;
-  if (api->xColumnTotalSize(fts, -1, &words) != SQLITE_OK || words == 0) return 1;
-  return static_cast<double>(words) / static_cast<double>(rows);
-}
-
-double Frequency(const Fts5ExtensionApi* api, Fts5Context* fts, int phrase,
+double Frequency(const Fts5ExtensionApi* api, Fts5Context* fts,
                  const std::vector<double>& column_weights) {
   double frequency = 0;
   Fts5PhraseIter iterator;
   int column = 0;
   int offset = 0;
-  if (api->xPhraseFirst(fts, phrase, &iterator, &column, &offset) != SQLITE_OK) return 0;
+  if (api->xPhraseFirst(fts, 0, &iterator, &column, &offset) != SQLITE_OK) return 0;
   for (; column >= 0; api->xPhraseNext(fts, &iterator, &column, &offset)) {
     const auto index = static_cast<std::size_t>(column);
     frequency += index < column_weights.size() ? column_weights[index] : 1;
@@ -35,22 +27,17 @@ double Frequency(const Fts5ExtensionApi* api, Fts5Context* fts, int phrase,
   return frequency;
 }
 
-void Score(const Fts5ExtensionApi* api, Fts5Context* fts, sqlite3_context* /*result*/,
+void Count(const Fts5ExtensionApi* api, Fts5Context* fts, sqlite3_context* result,
            int /*argument_count*/, sqlite3_value** /*arguments*/) {
-  RankContext* context = *static_cast<RankContext**>(api->xUserData(fts));
+  CountContext* context = *static_cast<CountContext**>(api->xUserData(fts));
+  if (context == nullptr) return;
   const sqlite3_int64 id = api->xRowid(fts);
-  if (context == nullptr || !context->candidates->Contains(id)) return;
-  if (context->average_length <= 0) context->average_length = AverageLength(api, fts);
-  int length = 0;
-  api->xColumnSize(fts, -1, &length);
-  const double share = length / context->average_length;
-  const double norm = kSaturation * (1 - kLengthShare + kLengthShare * share);
-  double score = 0;
-  for (std::size_t phrase = 0; phrase < context->word_weights.size(); ++phrase) {
-    const double frequency = Frequency(api, fts, static_cast<int>(phrase), context->column_weights);
-    score += context->word_weights[phrase] * frequency * (kSaturation + 1) / (frequency + norm);
+  try {
+    context->documents->Add(id);
+    context->frequencies->Add(id, static_cast<float>(Frequency(api, fts, context->column_weights)));
+  } catch (...) {  // exceptions must not cross SQLite's frames
+    sqlite3_result_error_nomem(result);
   }
-  (*context->scores)[static_cast<std::size_t>(id)] += static_cast<float>(score);
 }
 
 }  // namespace
@@ -61,10 +48,19 @@ double WordWeight(std::size_t documents_with, std::size_t documents) {
   return std::log(1 + (without + 0.5) / (with + 0.5));
 }
 
-void RegisterRanking(sqlite3* db, RankContext** slot) {
+double LengthNorm(std::size_t length, double average_length) {
+  return 1 - kLengthShare + kLengthShare * static_cast<double>(length) / average_length;
+}
+
+double WordScore(double frequency, double length_norm) {
+  return frequency * (kSaturation + 1) / (frequency + kSaturation * length_norm);
+}
+
+void RegisterCounting(sqlite3* db, CountContext** slot) {
+  static_assert(kMostOfWord == kSaturation + 1);
   fts5_api* api = Fts5Api(db);
   const int result =
-      api->xCreateFunction(api, "quarry_score", static_cast<void*>(slot), &Score, nullptr);
+      api->xCreateFunction(api, "quarry_count", static_cast<void*>(slot), &Count, nullptr);
   if (result != SQLITE_OK) ThrowSqlite(db, result, "Cannot register the ranking");
 }
 

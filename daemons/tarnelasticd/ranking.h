@@ -1,4 +1,4 @@
-// How well a document's full text answers a query.
+// How well a document's full text answers a query: BM25.
 
 #ifndef QUARRY_DAEMONS_TARNELASTICD_RANKING_H_
 #define QUARRY_DAEMONS_TARNELASTICD_RANKING_H_
@@ -9,25 +9,32 @@
 #include <vector>
 
 #include "daemons/tarnelasticd/doc_set.h"
+#include "daemons/tarnelasticd/frequencies.h"
 
 namespace quarry::engine {
 
-// The BM25 weight of a word that `documents_with` of `documents` have.
+// The weight of a word that `documents_with` of `documents` have.
 double WordWeight(std::size_t documents_with, std::size_t documents);
 
-// What quarry_score works on while a statement runs. Scores are added up per document, and only for
-// documents that count: reading how long a document is costs more than finding it.
-struct RankContext {
-  const DocSet* candidates = nullptr;
-  std::vector<double> word_weights;  // one per phrase of the MATCH expression
+// How much a text's length counts against it: 1 for one of average length, more for a longer one.
+double LengthNorm(std::size_t length, double average_length);
+
+// What a word of weight 1 adds to the score of a text that has it so often; at most
+// kMostOfWord.
+double WordScore(double frequency, double length_norm);
+constexpr double kMostOfWord = 2.2;
+
+// What quarry_count writes to while a statement runs: the documents that match the first phrase of
+// the MATCH expression, and how often they have it.
+struct CountContext {
   std::vector<double> column_weights;
-  std::vector<float>* scores = nullptr;  // by row id; large enough for all candidates
-  double average_length = 0;             // of the texts, in words; found out at the first of them
+  DocSet* documents = nullptr;
+  Frequencies* frequencies = nullptr;
 };
 
-// Gives the connection quarry_score(TABLE), for use in a statement with MATCH over TABLE; it
+// Gives the connection quarry_count(TABLE), for use in a statement with MATCH over TABLE; it
 // returns nothing. `*slot` is read while such statements run, and belongs to the caller.
-void RegisterRanking(sqlite3* db, RankContext** slot);
+void RegisterCounting(sqlite3* db, CountContext** slot);
 
 }  // namespace quarry::engine
 

@@ -4,6 +4,7 @@
 #include "daemons/tarnelasticd/engine_error.h"
 #include "daemons/tarnelasticd/field_names.h"
 #include "daemons/tarnelasticd/terms.h"
+#include "daemons/tarnelasticd/text_lengths.h"
 #include "daemons/tarnelasticd/text_tokenizer.h"
 
 namespace quarry::engine {
@@ -163,7 +164,7 @@ std::string Schema::CreateStatements() const {
   add_words("body", ColumnList("t", std::max<std::size_t>(text_columns_, 1)), kTextTokenizer);
   add_words("labels", "name,extra", kTextTokenizer);
   add_words("names", "name", "trigram case_sensitive 1");
-  return sql + CreateTermTables();
+  return sql + CreateLengthTable() + CreateTermTables();
 }
 
 }  // namespace quarry::engine

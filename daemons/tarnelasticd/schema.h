@@ -8,6 +8,7 @@
 //   body    FTS5 over the full text, a column per field; without content of its own
 //   labels  FTS5 over the words of the file name and the texts of fields that are not listed
 //   names   FTS5 over all three letters in a row of the file name
+//   text_lengths  how many words the full texts have; text_lengths.h says more
 //   terms   words to suggest, with the number of documents that have them; terms.h says more
 
 #ifndef QUARRY_DAEMONS_TARNELASTICD_SCHEMA_H_
@@ -24,7 +25,7 @@
 namespace quarry::engine {
 
 // The version of the layout. A database of another version counts as damaged: it is made anew.
-constexpr int kLayoutVersion = 3;
+constexpr int kLayoutVersion = 4;
 
 // How a field's values are kept.
 enum class Storage {

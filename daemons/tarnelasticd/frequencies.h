@@ -1,0 +1,36 @@
+// How often the documents of one index have a word.
+
+#ifndef QUARRY_DAEMONS_TARNELASTICD_FREQUENCIES_H_
+#define QUARRY_DAEMONS_TARNELASTICD_FREQUENCIES_H_
+
+#include <algorithm>
+#include <cstddef>
+#include <cstdint>
+#include <vector>
+
+namespace quarry::engine {
+
+// A number per row id: ids are small and dense.
+class Frequencies {
+ public:
+  // `id` is not negative.
+  void Add(std::int64_t id, float frequency) {
+    const auto index = static_cast<std::size_t>(id);
+    if (index >= all_.size()) all_.resize(std::max(index + 1, all_.size() * 3 / 2));
+    all_[index] += frequency;
+  }
+
+  float Of(std::int64_t id) const {
+    const auto index = static_cast<std::size_t>(id);
+    return index < all_.size() ? all_[index] : 0;
+  }
+
+  std::size_t Bytes() const { return all_.capacity() * sizeof(float); }
+
+ private:
+  std::vector<float> all_;
+};
+
+}  // namespace quarry::engine
+
+#endif  // QUARRY_DAEMONS_TARNELASTICD_FREQUENCIES_H_

@@ -1,0 +1,199 @@
+#include "daemons/tarnelasticd/posting_lists.h"
+
+#include <algorithm>
+#include <cstring>
+#include <memory>
+#include <utility>
+
+#include "daemons/tarnelasticd/doc_set.h"
+#include "daemons/tarnelasticd/engine_error.h"
+
+namespace quarry::engine {
+namespace {
+
+constexpr char kMainIndex = '0';
+constexpr int kUnderstoodVersion = 4;
+constexpr std::int64_t kAveragesRow = 1;
+constexpr std::int64_t kStructureRow = 10;
+constexpr std::size_t kCookie = 4;  // bytes before the structure
+constexpr std::size_t kBatch = 1024;
+
+constexpr std::uint64_t kOnes = 0x0101010101010101U;
+constexpr std::uint64_t kHighBits = 0x8080808080808080U;
+
+// Whether one of eight bytes is 1. Sometimes says so wrongly.
+bool MayHaveOne(std::uint64_t bytes) {
+  const std::uint64_t difference = bytes ^ kOnes;
+  return ((difference - kOnes) & ~difference & kHighBits) != 0;
+}
+
+std::size_t CountLastBytes(std::uint64_t bytes) {
+  return static_cast<std::size_t>(((~bytes & kHighBits) >> 7) * kOnes >> 56);
+}
+
+// The numbers in `bytes`, or none when one of them may begin another column.
+std::size_t CountNumbers(std::string_view bytes) {
+  std::size_t count = 0;
+  while (!bytes.empty()) {
+    std::uint64_t some = kHighBits;  // bytes that end no number
+    const std::size_t size = std::min(bytes.size(), sizeof some);
+    std::memcpy(&some, bytes.data(), size);
+    if (MayHaveOne(some)) return 0;
+    count += CountLastBytes(some);
+    bytes.remove_prefix(size);
+  }
+  return count;
+}
+
+double WeightOf(std::uint64_t column, const std::vector<double>& weights) {
+  return column < weights.size() ? weights[static_cast<std::size_t>(column)] : 1;
+}
+
+double WeighOneByOne(std::string_view positions, const std::vector<double>& weights) {
+  const char* at = positions.data();
+  const char* const end = at + positions.size();
+  double weight = WeightOf(0, weights);
+  double sum = 0;
+  while (at < end) {
+    if (TakeVarint(&at, end) == 1) {
+      weight = WeightOf(TakeVarint(&at, end), weights);
+    } else {
+      sum += weight;
+    }
+  }
+  return sum;
+}
+
+// Gathers postings, and knows which documents newer segments have spoken for.
+class Gatherer {
+ public:
+  // What lies behind `last_id` has been deleted, or is damage that must not take memory.
+  Gatherer(const std::vector<double>& weights, std::int64_t last_id,
+           const PostingLists::Visitor& visit)
+      : weights_(weights), last_id_(last_id), visit_(visit) {
+    batch_.reserve(kBatch);
+  }
+
+  void BeginWord() {
+    for (const std::int64_t id : replaced_) settled_.Remove(id);
+    replaced_.clear();
+  }
+
+  // To be called with a word's entries in the newest segment first.
+  void Add(const Entry& entry) {
+    if (entry.id > last_id_) return;
+    if (!replaced_.empty() && settled_.Contains(entry.id)) return;
+    if (entry.replaces) {
+      settled_.Add(entry.id);
+      replaced_.push_back(entry.id);
+    }
+    if (entry.positions.empty()) return;
+    batch_.push_back({entry.id, static_cast<float>(WeighPositions(entry.positions, weights_))});
+    if (batch_.size() == kBatch) Flush();
+  }
+
+  void Flush() {
+    visit_(batch_);
+    batch_.clear();
+  }
+
+ private:
+  const std::vector<double>& weights_;
+  const std::int64_t last_id_;
+  const PostingLists::Visitor& visit_;
+  std::vector<Posting> batch_;
+  DocSet settled_;
+  std::vector<std::int64_t> replaced_;
+};
+
+}  // namespace
+
+// Nearly always all places are in one column, the content, and their differences small.
+double WeighPositions(std::string_view positions, const std::vector<double>& weights) {
+  std::string_view rest = positions;
+  std::uint64_t column = 0;
+  if (rest.size() > 2 && rest[0] == 1 && static_cast<unsigned char>(rest[1]) < 0x80) {
+    column = static_cast<unsigned char>(rest[1]);
+    rest.remove_prefix(2);
+  }
+  const std::size_t count = CountNumbers(rest);
+  if (count == 0) return WeighOneByOne(positions, weights);
+  return static_cast<double>(count) * WeightOf(column, weights);
+}
+
+PostingLists::PostingLists(Database* db, std::string table, std::vector<double> weights,
+                           std::function<void()> check)
+    : db_(db), table_(std::move(table)), weights_(std::move(weights)), check_(std::move(check)) {
+  Statement version = db_->Prepare("SELECT v FROM " + table_ + "_config WHERE k='version'");
+  if (!version.Step() || version.Int(0) != kUnderstoodVersion) return;
+  Statement row = db_->Prepare("SELECT block FROM " + table_ + "_data WHERE id=?1");
+  row.Bind(1, kStructureRow);
+  if (row.Step()) ReadStructure(row.Blob(0));
+  Statement last = db_->Prepare("SELECT max(id) FROM docs");
+  if (last.Step()) last_id_ = last.Int(0);
+}
+
+void PostingLists::ReadStructure(std::string_view record) {
+  // The second form of this record, with a byte that no first one has here, is another version's.
+  if (record.size() <= kCookie || static_cast<unsigned char>(record[kCookie]) == 0xff) return;
+  const char* at = record.data() + kCookie;
+  const char* const end = record.data() + record.size();
+  const auto take = [&] { return static_cast<std::int64_t>(TakeVarint(&at, end)); };
+  const std::int64_t levels = take();
+  take();  // how many segments there are in all
+  take();  // how many leaves have ever been written
+  for (std::int64_t level = 0; level < levels; ++level) {
+    take();  // how many of them are being merged
+    const std::int64_t count = take();
+    std::vector<Segment> segments;
+    for (std::int64_t i = 0; i < count; ++i) {
+      Segment segment;
+      segment.id = take();
+      segment.first_leaf = take();
+      segment.last_leaf = take();
+      if (segment.first_leaf > 0) segments.push_back(segment);
+    }
+    segments_.insert(segments_.end(), segments.rbegin(), segments.rend());
+  }
+  is_readable_ = true;
+}
+
+void PostingLists::ForEach(std::string_view word, bool prefix, const Visitor& visit) {
+  const std::string key = kMainIndex + std::string(word);
+  const auto is_meant = [&](const std::string& found) {
+    return prefix ? found.compare(0, key.size(), key) == 0 : found == key;
+  };
+  std::vector<std::unique_ptr<SegmentReader>> readers;  // at a word that is meant
+  for (const Segment& segment : segments_) {
+    auto reader = std::make_unique<SegmentReader>(db_, table_, segment, check_);
+    if (reader->Seek(key) && is_meant(reader->key())) readers.push_back(std::move(reader));
+  }
+  Gatherer gatherer(weights_, last_id_, visit);
+  while (!readers.empty()) {
+    std::string next = readers.front()->key();
+    for (const auto& reader : readers) next = std::min(next, reader->key());
+    gatherer.BeginWord();
+    for (auto& reader : readers) {
+      if (reader->key() != next) continue;
+      reader->ReadList([&](const Entry& entry) { gatherer.Add(entry); });
+      if (!prefix || !reader->Next() || !is_meant(reader->key())) reader.reset();
+    }
+    std::erase(readers, nullptr);
+  }
+  gatherer.Flush();
+}
+
+double PostingLists::AverageLength() {
+  Statement row = db_->Prepare("SELECT block FROM " + table_ + "_data WHERE id=?1");
+  row.Bind(1, kAveragesRow);
+  if (!row.Step() || row.Blob(0).empty()) return 1;
+  const std::string_view record = row.Blob(0);
+  const char* at = record.data();
+  const char* const end = at + record.size();
+  const auto rows = static_cast<double>(TakeVarint(&at, end));
+  double words = 0;
+  while (at < end) words += static_cast<double>(TakeVarint(&at, end));
+  return rows > 0 && words > 0 ? words / rows : 1;
+}
+
+}  // namespace quarry::engine
