@@ -9,6 +9,7 @@
 
 #include "bench/private_root.h"
 #include "common/json.h"
+#include "daemons/fileindexd/folder_rules.h"
 #include "fileindex/config/folder_mgr.h"
 
 namespace quarry::fileindex {
@@ -66,6 +67,21 @@ void BM_IsFullPathNeedMeta(benchmark::State& state) {
   state.SetItemsProcessed(state.iterations());
 }
 BENCHMARK(BM_IsFullPathNeedMeta);
+
+// What the index daemon asks of each file it meets, several times.
+void BM_Governing(benchmark::State& state) {
+  std::vector<fileindexd::FolderRule> rules(kFileIndexFoldersMax);
+  for (std::size_t i = 0; i < rules.size(); ++i) rules[i].full_path = volume + FolderPath(i);
+  const fileindexd::FolderRules folders(rules);
+  const std::vector<std::string> files = Files();
+  std::size_t next = 0;
+  for (auto _ : state) {
+    benchmark::DoNotOptimize(folders.Governing(files[next]));
+    next = (next + 1) % files.size();
+  }
+  state.SetItemsProcessed(state.iterations());
+}
+BENCHMARK(BM_Governing);
 
 // From the file to the first answer: each folder asks the platform where its share is.
 void BM_LoadAndAskOnce(benchmark::State& state) {

@@ -8,6 +8,8 @@
 #include <cstdint>
 #include <vector>
 
+#include "daemons/tarnelasticd/doc_set.h"
+
 namespace quarry::engine {
 
 // A number per row id: ids are small and dense.
@@ -23,6 +25,15 @@ class Frequencies {
   float Of(std::int64_t id) const {
     const auto index = static_cast<std::size_t>(id);
     return index < all_.size() ? all_[index] : 0;
+  }
+
+  // All with more than 0.
+  DocSet Documents() const {
+    DocSet documents;
+    for (std::size_t i = 0; i < all_.size(); ++i) {
+      if (all_[i] > 0) documents.Add(static_cast<std::int64_t>(i));
+    }
+    return documents;
   }
 
   std::size_t Bytes() const { return all_.capacity() * sizeof(float); }

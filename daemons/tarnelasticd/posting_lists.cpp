@@ -18,6 +18,19 @@ constexpr std::int64_t kStructureRow = 10;
 constexpr std::size_t kCookie = 4;  // bytes before the structure
 constexpr std::size_t kBatch = 1024;
 
+constexpr std::int64_t kMaxSegmentId = (std::int64_t{1} << 16) - 1;
+constexpr std::int64_t kMaxLeaf = (std::int64_t{1} << 31) - 1;
+
+void CheckSegment(const Segment& segment) {
+  const auto is_within = [](std::int64_t value, std::int64_t most) {
+    return value >= 0 && value <= most;
+  };
+  if (!is_within(segment.id, kMaxSegmentId) || !is_within(segment.first_leaf, kMaxLeaf) ||
+      !is_within(segment.last_leaf, kMaxLeaf)) {
+    throw Error(kDamagedIndex, "The full text is not as it should be");
+  }
+}
+
 constexpr std::uint64_t kOnes = 0x0101010101010101U;
 constexpr std::uint64_t kHighBits = 0x8080808080808080U;
 
@@ -34,13 +47,15 @@ std::size_t CountLastBytes(std::uint64_t bytes) {
 // The numbers in `bytes`, or none when one of them may begin another column.
 std::size_t CountNumbers(std::string_view bytes) {
   std::size_t count = 0;
-  while (!bytes.empty()) {
-    std::uint64_t some = kHighBits;  // bytes that end no number
-    const std::size_t size = std::min(bytes.size(), sizeof some);
-    std::memcpy(&some, bytes.data(), size);
+  for (; bytes.size() >= sizeof(std::uint64_t); bytes.remove_prefix(sizeof(std::uint64_t))) {
+    std::uint64_t some = 0;
+    std::memcpy(&some, bytes.data(), sizeof some);
     if (MayHaveOne(some)) return 0;
     count += CountLastBytes(some);
-    bytes.remove_prefix(size);
+  }
+  for (const char c : bytes) {
+    if (c == 1) return 0;
+    if (static_cast<unsigned char>(c) < 0x80) ++count;
   }
   return count;
 }
@@ -64,12 +79,26 @@ double WeighOneByOne(std::string_view positions, const std::vector<double>& weig
   return sum;
 }
 
+}  // namespace
+
+// Nearly always all places are in one column, the content, and their differences small.
+double WeighPositions(std::string_view positions, const std::vector<double>& weights) {
+  std::string_view rest = positions;
+  std::uint64_t column = 0;
+  if (rest.size() > 2 && rest[0] == 1 && static_cast<unsigned char>(rest[1]) < 0x80) {
+    column = static_cast<unsigned char>(rest[1]);
+    rest.remove_prefix(2);
+  }
+  const std::size_t count = CountNumbers(rest);
+  if (count == 0) return WeighOneByOne(positions, weights);
+  return static_cast<double>(count) * WeightOf(column, weights);
+}
+
 // Gathers postings, and knows which documents newer segments have spoken for.
-class Gatherer {
+class PostingLists::Gatherer {
  public:
   // What lies behind `last_id` has been deleted, or is damage that must not take memory.
-  Gatherer(const std::vector<double>& weights, std::int64_t last_id,
-           const PostingLists::Visitor& visit)
+  Gatherer(const std::vector<double>& weights, std::int64_t last_id, const Visitor& visit)
       : weights_(weights), last_id_(last_id), visit_(visit) {
     batch_.reserve(kBatch);
   }
@@ -100,26 +129,11 @@ class Gatherer {
  private:
   const std::vector<double>& weights_;
   const std::int64_t last_id_;
-  const PostingLists::Visitor& visit_;
+  const Visitor& visit_;
   std::vector<Posting> batch_;
   DocSet settled_;
   std::vector<std::int64_t> replaced_;
 };
-
-}  // namespace
-
-// Nearly always all places are in one column, the content, and their differences small.
-double WeighPositions(std::string_view positions, const std::vector<double>& weights) {
-  std::string_view rest = positions;
-  std::uint64_t column = 0;
-  if (rest.size() > 2 && rest[0] == 1 && static_cast<unsigned char>(rest[1]) < 0x80) {
-    column = static_cast<unsigned char>(rest[1]);
-    rest.remove_prefix(2);
-  }
-  const std::size_t count = CountNumbers(rest);
-  if (count == 0) return WeighOneByOne(positions, weights);
-  return static_cast<double>(count) * WeightOf(column, weights);
-}
 
 PostingLists::PostingLists(Database* db, std::string table, std::vector<double> weights,
                            std::function<void()> check)
@@ -151,6 +165,7 @@ void PostingLists::ReadStructure(std::string_view record) {
       segment.id = take();
       segment.first_leaf = take();
       segment.last_leaf = take();
+      CheckSegment(segment);
       if (segment.first_leaf > 0) segments.push_back(segment);
     }
     segments_.insert(segments_.end(), segments.rbegin(), segments.rend());
@@ -160,27 +175,44 @@ void PostingLists::ReadStructure(std::string_view record) {
 
 void PostingLists::ForEach(std::string_view word, bool prefix, const Visitor& visit) {
   const std::string key = kMainIndex + std::string(word);
-  const auto is_meant = [&](const std::string& found) {
-    return prefix ? found.compare(0, key.size(), key) == 0 : found == key;
+  Gatherer gatherer(weights_, last_id_, visit);
+  if (prefix) {
+    GatherBeginning(key, &gatherer);
+  } else {
+    GatherWord(key, &gatherer);
+  }
+  gatherer.Flush();
+}
+
+void PostingLists::GatherWord(const std::string& key, Gatherer* gatherer) {
+  for (const Segment& segment : segments_) {
+    SegmentReader reader(db_, table_, segment, check_);
+    if (!reader.Seek(key) || reader.key() != key) continue;
+    reader.ReadList([gatherer](const Entry& entry) { gatherer->Add(entry); });
+  }
+}
+
+// Word by word through all segments at once: what a newer one says of a word holds.
+void PostingLists::GatherBeginning(const std::string& key, Gatherer* gatherer) {
+  const auto is_meant = [&key](const SegmentReader& reader) {
+    return reader.key().compare(0, key.size(), key) == 0;
   };
   std::vector<std::unique_ptr<SegmentReader>> readers;  // at a word that is meant
   for (const Segment& segment : segments_) {
     auto reader = std::make_unique<SegmentReader>(db_, table_, segment, check_);
-    if (reader->Seek(key) && is_meant(reader->key())) readers.push_back(std::move(reader));
+    if (reader->Seek(key) && is_meant(*reader)) readers.push_back(std::move(reader));
   }
-  Gatherer gatherer(weights_, last_id_, visit);
   while (!readers.empty()) {
     std::string next = readers.front()->key();
     for (const auto& reader : readers) next = std::min(next, reader->key());
-    gatherer.BeginWord();
+    gatherer->BeginWord();
     for (auto& reader : readers) {
       if (reader->key() != next) continue;
-      reader->ReadList([&](const Entry& entry) { gatherer.Add(entry); });
-      if (!prefix || !reader->Next() || !is_meant(reader->key())) reader.reset();
+      reader->ReadList([gatherer](const Entry& entry) { gatherer->Add(entry); });
+      if (!reader->Next() || !is_meant(*reader)) reader.reset();
     }
     std::erase(readers, nullptr);
   }
-  gatherer.Flush();
 }
 
 double PostingLists::AverageLength() {

@@ -43,7 +43,11 @@ class PostingLists {
   double AverageLength();
 
  private:
+  class Gatherer;
+
   void ReadStructure(std::string_view record);
+  void GatherWord(const std::string& key, Gatherer* gatherer);
+  void GatherBeginning(const std::string& key, Gatherer* gatherer);
 
   Database* db_;
   const std::string table_;

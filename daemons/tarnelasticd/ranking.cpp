@@ -40,6 +40,16 @@ void Count(const Fts5ExtensionApi* api, Fts5Context* fts, sqlite3_context* resul
   }
 }
 
+void Add(sqlite3_context* result, int /*argument_count*/, sqlite3_value** arguments) {
+  CountContext* context = *static_cast<CountContext**>(sqlite3_user_data(result));
+  if (context == nullptr) return;
+  try {
+    context->documents->Add(sqlite3_value_int64(arguments[0]));
+  } catch (...) {
+    sqlite3_result_error_nomem(result);
+  }
+}
+
 }  // namespace
 
 double WordWeight(std::size_t documents_with, std::size_t documents) {
@@ -59,8 +69,11 @@ double WordScore(double frequency, double length_norm) {
 void RegisterCounting(sqlite3* db, CountContext** slot) {
   static_assert(kMostOfWord == kSaturation + 1);
   fts5_api* api = Fts5Api(db);
-  const int result =
-      api->xCreateFunction(api, "quarry_count", static_cast<void*>(slot), &Count, nullptr);
+  int result = api->xCreateFunction(api, "quarry_count", static_cast<void*>(slot), &Count, nullptr);
+  if (result == SQLITE_OK) {
+    result = sqlite3_create_function_v2(db, "quarry_add", 1, SQLITE_UTF8, static_cast<void*>(slot),
+                                        &Add, nullptr, nullptr, nullptr);
+  }
   if (result != SQLITE_OK) ThrowSqlite(db, result, "Cannot register the ranking");
 }
 

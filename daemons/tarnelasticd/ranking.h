@@ -24,16 +24,17 @@ double LengthNorm(std::size_t length, double average_length);
 double WordScore(double frequency, double length_norm);
 constexpr double kMostOfWord = 2.2;
 
-// What quarry_count writes to while a statement runs: the documents that match the first phrase of
-// the MATCH expression, and how often they have it.
+// What the functions below write to while a statement runs: documents, and how often they have the
+// first phrase of the MATCH expression.
 struct CountContext {
   std::vector<double> column_weights;
   DocSet* documents = nullptr;
   Frequencies* frequencies = nullptr;
 };
 
-// Gives the connection quarry_count(TABLE), for use in a statement with MATCH over TABLE; it
-// returns nothing. `*slot` is read while such statements run, and belongs to the caller.
+// Gives the connection quarry_count(TABLE), for use in a statement with MATCH over TABLE, and
+// quarry_add(ID), which notes the document alone; they return nothing. `*slot` is read while such
+// statements run, and belongs to the caller.
 void RegisterCounting(sqlite3* db, CountContext** slot);
 
 }  // namespace quarry::engine

@@ -1,5 +1,6 @@
 #include "daemons/tarnelasticd/segment_reader.h"
 
+#include <algorithm>
 #include <utility>
 
 #include "daemons/tarnelasticd/engine_error.h"
@@ -38,24 +39,26 @@ std::uint64_t TakeVarint(const char** at, const char* end) {
 
 SegmentReader::SegmentReader(Database* db, const std::string& table, const Segment& segment,
                              std::function<void()> check)
-    : leaves_(db->Prepare("SELECT block FROM " + table + "_data WHERE id BETWEEN ?1 AND ?2")),
-      places_(db->Prepare("SELECT pgno>>1 FROM " + table +
-                          "_idx WHERE segid=?1 AND term<=?2 ORDER BY term DESC LIMIT 1")),
+    : db_(db),
+      table_(table),
+      leaves_(db->Prepare("SELECT block FROM " + table + "_data WHERE id BETWEEN ?1 AND ?2")),
       segment_(segment),
       check_(std::move(check)) {}
 
+// The leaf that the word is on, if it is there.
+std::int64_t SegmentReader::FindLeaf(std::string_view key) {
+  Statement place = db_->Prepare("SELECT pgno>>1 FROM " + table_ +
+                                 "_idx WHERE segid=?1 AND term<=?2 ORDER BY term DESC LIMIT 1");
+  place.Bind(1, segment_.id).BindBlob(2, key);
+  return place.Step() ? std::max(segment_.first_leaf, place.Int(0)) : segment_.first_leaf;
+}
+
 bool SegmentReader::Seek(std::string_view key) {
-  places_.Bind(1, segment_.id).BindBlob(2, key);
-  std::int64_t leaf = segment_.first_leaf;
-  if (places_.Step()) leaf = std::max(leaf, places_.Int(0));
-  places_.Reset();
   const std::int64_t base = segment_.id << kLeafBits;
-  leaves_.Bind(1, base + leaf).Bind(2, base + segment_.last_leaf);
+  leaves_.Bind(1, base + FindLeaf(key)).Bind(2, base + segment_.last_leaf);
   while (NextLeaf()) {
-    for (; next_word_ < words_.size();) {
-      at_ = leaf_.data() + words_[next_word_];
-      const std::size_t kept = next_word_ == 0 ? 0 : static_cast<std::size_t>(TakeNumber());
-      ReadKey(kept);
+    while (next_word_ < words_.size()) {
+      ReadKey();
       if (key_ >= key) return true;
     }
   }
@@ -66,14 +69,15 @@ bool SegmentReader::Next() {
   while (next_word_ >= words_.size()) {
     if (!NextLeaf()) return false;
   }
-  at_ = leaf_.data() + words_[next_word_];
-  ReadKey(next_word_ == 0 ? 0 : static_cast<std::size_t>(TakeNumber()));
+  ReadKey();
   return true;
 }
 
 bool SegmentReader::NextLeaf() {
   if (++leaves_read_ % kLeavesBetweenChecks == 0) check_();
-  if (!leaves_.Step()) return false;
+  // A statement that is at its end would begin anew.
+  is_at_end_ = is_at_end_ || !leaves_.Step();
+  if (is_at_end_) return false;
   leaf_ = leaves_.Blob(0);
   if (leaf_.size() < kHeader) FailDamaged();
   const std::size_t end = Number16(leaf_, 2);
@@ -94,10 +98,12 @@ bool SegmentReader::NextLeaf() {
 }
 
 // Words share the beginning of the one before, on the same leaf.
-void SegmentReader::ReadKey(std::size_t kept) {
+void SegmentReader::ReadKey() {
+  at_ = leaf_.data() + words_[next_word_];
+  const std::uint64_t kept = next_word_ == 0 ? 0 : TakeNumber();
   const std::uint64_t size = TakeNumber();
   if (kept > key_.size() || size > static_cast<std::size_t>(contents_end_ - at_)) FailDamaged();
-  key_.resize(kept);
+  key_.resize(static_cast<std::size_t>(kept));
   key_.append(at_, static_cast<std::size_t>(size));
   at_ += size;
   ++next_word_;

@@ -43,8 +43,8 @@ struct Entry {
 // Error kDamagedIndex when `bytes` end within the number.
 std::uint64_t TakeVarint(const char** at, const char* end);
 
-// [at the word of a list] One thread at a time, as its database. All that fails throws Error as
-// Database does.
+// Goes through a segment's words once. One thread at a time, as its database. All that fails throws
+// Error as Database does.
 class SegmentReader {
  public:
   // `check` is called now and then, and may throw to end the work. Nothing is read yet.
@@ -68,18 +68,21 @@ class SegmentReader {
   }
 
  private:
+  std::int64_t FindLeaf(std::string_view key);
   bool NextLeaf();
-  void ReadKey(std::size_t kept);
+  void ReadKey();
   bool TakeEntry(Entry* entry);
   std::string_view TakePositions(std::uint64_t size);
   const char* Limit() const;
   std::uint64_t TakeNumber() { return TakeVarint(&at_, contents_end_); }
 
+  Database* db_;
+  const std::string table_;
   Statement leaves_;
-  Statement places_;
   const Segment segment_;
   const std::function<void()> check_;
   std::size_t leaves_read_ = 0;
+  bool is_at_end_ = false;
 
   std::string_view leaf_;
   const char* at_ = nullptr;

@@ -34,16 +34,13 @@ WordFinder::WordFinder(const Schema& schema, IndexReader* reader)
       names_(&reader->db(), "names", {}, [reader] { reader->CheckDeadline(); }) {}
 
 DocSet WordFinder::InTexts(const QueryTerm& term, Frequencies* frequencies) {
-  DocSet found;
   if (term.words.size() == 1 && body_.IsReadable()) {
     body_.ForEach(term.words.front(), term.prefix, [&](const std::vector<Posting>& some) {
-      for (const Posting& posting : some) {
-        found.Add(posting.id);
-        frequencies->Add(posting.id, posting.frequency);
-      }
+      for (const Posting& posting : some) frequencies->Add(posting.id, posting.frequency);
     });
-    return found;
+    return frequencies->Documents();
   }
+  DocSet found;
   CountContext context{schema_.Weights(), &found, frequencies};
   const IndexReader::Counting counting(reader_, &context);
   Statement rows = reader_->db().Prepare("SELECT quarry_count(body) FROM body WHERE body MATCH ?1");

@@ -1,0 +1,251 @@
+// The lists that FTS5 has written, read without it, against a model that counts words.
+
+#include "daemons/tarnelasticd/posting_lists.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <array>
+#include <fstream>
+#include <map>
+#include <random>
+#include <string>
+#include <vector>
+
+#include "daemons/tarnelasticd/engine_error.h"
+#include "tests/support/temp_dir.h"
+
+namespace quarry::engine {
+namespace {
+
+const std::vector<double> kWeights = {6, 1, 0.5};
+
+class PostingListsTest : public testing::Test {
+ protected:
+  using Texts = std::array<std::vector<std::string>, 3>;
+  using Counts = std::map<std::int64_t, float>;
+
+  PostingListsTest() {
+    const std::string path = dir_ / "test.db";
+    std::ofstream(path).close();
+    db_ = std::make_unique<Database>(path);
+    db_->Execute(
+        "PRAGMA synchronous=OFF;PRAGMA journal_mode=MEMORY;"
+        "CREATE TABLE docs(id INTEGER PRIMARY KEY);"
+        "CREATE VIRTUAL TABLE body USING fts5(a,b,c, content='');");
+  }
+
+  void Insert(std::int64_t id, const Texts& texts) {
+    db_->Prepare("INSERT OR REPLACE INTO docs(id) VALUES(?1)").Bind(1, id).Run();
+    Write("INSERT INTO body(rowid,a,b,c) VALUES(?1,?2,?3,?4)", id, texts);
+    model_[id] = texts;
+  }
+  void Remove(std::int64_t id) {
+    const auto document = model_.find(id);
+    Write("INSERT INTO body(body,rowid,a,b,c) VALUES('delete',?1,?2,?3,?4)", id, document->second);
+    db_->Prepare("DELETE FROM docs WHERE id=?1").Bind(1, id).Run();
+    model_.erase(document);
+  }
+  // One of FTS5's own commands.
+  void Tell(const std::string& command, std::int64_t rank) {
+    db_->Prepare("INSERT INTO body(body,rank) VALUES(?1,?2)")
+        .Bind(1, std::string_view(command))
+        .Bind(2, rank)
+        .Run();
+  }
+
+  PostingLists Lists() {
+    return {db_.get(), "body", kWeights, [] {}};
+  }
+  Counts Read(const std::string& word, bool prefix = false) {
+    Counts counts;
+    Lists().ForEach(word, prefix, [&counts](const std::vector<Posting>& some) {
+      for (const Posting& posting : some) counts[posting.id] += posting.frequency;
+    });
+    return counts;
+  }
+  Counts Expected(const std::string& word, bool prefix) const {
+    Counts counts;
+    for (const auto& [id, texts] : model_) {
+      for (std::size_t column = 0; column < texts.size(); ++column) {
+        for (const std::string& one : texts[column]) {
+          const bool is_meant = prefix ? one.rfind(word, 0) == 0 : one == word;
+          if (is_meant) counts[id] += static_cast<float>(kWeights[column]);
+        }
+      }
+    }
+    return counts;
+  }
+  double ExpectedAverage() const {
+    double words = 0;
+    for (const auto& [id, texts] : model_) {
+      for (const auto& text : texts) words += static_cast<double>(text.size());
+    }
+    return words > 0 ? words / static_cast<double>(model_.size()) : 1;
+  }
+
+  test::TempDir dir_;
+  std::unique_ptr<Database> db_;
+  std::map<std::int64_t, Texts> model_;
+
+ private:
+  static std::string Join(const std::vector<std::string>& words) {
+    std::string text;
+    for (const std::string& word : words) text += word + ' ';
+    return text;
+  }
+  void Write(const std::string& sql, std::int64_t id, const Texts& texts) {
+    const std::string joined[] = {Join(texts[0]), Join(texts[1]), Join(texts[2])};
+    Statement row = db_->Prepare(sql);
+    row.Bind(1, id);
+    for (int i = 0; i < 3; ++i) row.Bind(i + 2, std::string_view(joined[i]));
+    row.Run();
+  }
+};
+
+TEST_F(PostingListsTest, FindNothingInAnEmptyTable) {
+  EXPECT_TRUE(Lists().IsReadable());
+  EXPECT_TRUE(Read("a").empty());
+  EXPECT_TRUE(Read("", true).empty());
+  EXPECT_EQ(Lists().AverageLength(), 1);
+}
+
+TEST_F(PostingListsTest, WeighColumns) {
+  Insert(3, Texts{{{"one"}, {"one", "two", "one"}, {}}});
+  Insert(7, Texts{{{}, {}, {"one", "once"}}});
+  EXPECT_EQ(Read("one"), (Counts{{3, 8.0F}, {7, 0.5F}}));
+  EXPECT_EQ(Read("two"), (Counts{{3, 1.0F}}));
+  EXPECT_EQ(Read("on", true), (Counts{{3, 8.0F}, {7, 1.0F}}));
+  EXPECT_TRUE(Read("on").empty());
+  EXPECT_EQ(Lists().AverageLength(), 3);
+}
+
+TEST_F(PostingListsTest, LeaveTheFormOfAnotherVersionToTheLibrary) {
+  db_->Execute("UPDATE body_config SET v=5 WHERE k='version'");
+  EXPECT_FALSE(Lists().IsReadable());
+  db_->Execute("UPDATE body_config SET v=4 WHERE k='version'");
+  EXPECT_TRUE(Lists().IsReadable());
+  db_->Execute("UPDATE body_data SET block=x'00000000ff000001010000' WHERE id=10");
+  EXPECT_FALSE(Lists().IsReadable());
+}
+
+TEST_F(PostingListsTest, StopWhereTheCheckSaysSo) {
+  Tell("pgsz", 64);
+  db_->Execute("BEGIN");
+  for (std::int64_t id = 1; id < 5000; ++id) Insert(id, Texts{{{"word"}, {}, {}}});
+  db_->Execute("COMMIT");
+  PostingLists lists(db_.get(), "body", kWeights,
+                     [] { throw Error(kSearchTooLong, "The search took too long"); });
+  EXPECT_THROW(lists.ForEach("word", false, [](const std::vector<Posting>&) {}), Error);
+}
+
+// Whatever a leaf holds, reading it ends, and within its bounds.
+TEST_F(PostingListsTest, TakeDamageForDamage) {
+  Tell("pgsz", 128);
+  std::mt19937 random(5);
+  db_->Execute("BEGIN");
+  for (std::int64_t id = 1; id < 300; ++id) {
+    Insert(id, Texts{{{"all", "w" + std::to_string(id % 40)}, {}, {"all", "all"}}});
+  }
+  db_->Execute("COMMIT;BEGIN");
+  std::vector<std::pair<std::int64_t, std::string>> leaves;
+  {
+    Statement rows = db_->Prepare("SELECT id,block FROM body_data");
+    while (rows.Step()) leaves.emplace_back(rows.Int(0), std::string(rows.Blob(1)));
+  }
+  int damaged = 0;
+  for (int round = 0; round < 1000; ++round) {
+    const auto& [id, block] = leaves[random() % leaves.size()];
+    std::string bad = block;
+    if (random() % 4 == 0) bad.resize(random() % (bad.size() + 1));
+    if (!bad.empty()) bad[random() % bad.size()] = static_cast<char>(random());
+    const auto write = [&](const std::string& bytes) {
+      db_->Prepare("UPDATE body_data SET block=?2 WHERE id=?1")
+          .Bind(1, id)
+          .BindBlob(2, bytes)
+          .Run();
+    };
+    write(bad);
+    try {
+      for (const char* word : {"all", "w17"}) Read(word);
+      Read("w", true);
+      Lists().AverageLength();
+    } catch (const Error& error) {
+      EXPECT_TRUE(HasCode(error, kDamagedIndex)) << error.reason();
+      ++damaged;
+    }
+    write(block);
+  }
+  EXPECT_GT(damaged, 100);
+}
+
+class PostingListsModelTest : public PostingListsTest,
+                              public testing::WithParamInterface<unsigned> {
+ protected:
+  std::size_t Number(std::size_t below) {
+    return std::uniform_int_distribution<std::size_t>(0, below - 1)(random_);
+  }
+  std::string Word() {
+    // Few are frequent, and many begin alike.
+    const std::size_t kind = Number(6);
+    if (kind < 2) return "the";
+    if (kind < 4) return "w" + std::to_string(Number(30));
+    return std::string(1, static_cast<char>('a' + Number(26))) + std::to_string(Number(300));
+  }
+  Texts RandomTexts() {
+    Texts texts;
+    // A long one now and then, whose positions take several leaves and large steps.
+    const std::size_t most = Number(40) == 0 ? 3000 : 12;
+    for (auto& text : texts) {
+      for (std::size_t left = Number(most); left > 0; --left) text.push_back(Word());
+    }
+    return texts;
+  }
+  void Change() {
+    const auto id = static_cast<std::int64_t>(1 + Number(900));
+    const bool exists = model_.count(id) > 0;
+    if (exists) Remove(id);
+    if (!exists || Number(3) > 0) Insert(id, RandomTexts());
+  }
+  void Tend() {
+    switch (Number(6)) {
+      case 0:
+        return Tell("merge", static_cast<std::int64_t>(1 + Number(20)));
+      case 1:
+        return Tell("merge", -static_cast<std::int64_t>(1 + Number(20)));
+      case 2:
+        return Tell("automerge", static_cast<std::int64_t>(Number(9)));
+      case 3:
+        return Number(4) == 0 ? Tell("optimize", 0) : void();
+      default:
+        return;
+    }
+  }
+  void Compare() {
+    for (const char* word : {"the", "w1", "w17", "a", "a1", "k299", "none", "zzz"}) {
+      ASSERT_EQ(Read(word), Expected(word, false)) << word;
+    }
+    for (const char* word : {"", "t", "w", "w1", "k2", "none", "z"}) {
+      ASSERT_EQ(Read(word, true), Expected(word, true)) << word << '*';
+    }
+    ASSERT_DOUBLE_EQ(Lists().AverageLength(), ExpectedAverage());
+  }
+
+  std::mt19937 random_{GetParam()};
+};
+
+TEST_P(PostingListsModelTest, HoldWhatTheModelHolds) {
+  Tell("pgsz", std::array<std::int64_t, 3>{64, 300, 4050}[GetParam() % 3]);
+  for (int round = 0; round < 25; ++round) {
+    db_->Execute("BEGIN");
+    for (std::size_t left = Number(120); left > 0; --left) Change();
+    db_->Execute("COMMIT");
+    Tend();
+    ASSERT_NO_FATAL_FAILURE(Compare());
+  }
+}
+
+INSTANTIATE_TEST_SUITE_P(Seeds, PostingListsModelTest, testing::Range(1U, 10U));
+
+}  // namespace
+}  // namespace quarry::engine
