@@ -8,21 +8,26 @@
 namespace quarry::fileindexd {
 
 FolderRules::FolderRules(const std::vector<FolderRule>& folders) {
-  for (const FolderRule& folder : folders) folders_.emplace(folder.full_path, folder);
+  for (const FolderRule& folder : folders) {
+    const std::size_t length = folder.full_path.size();
+    folders_.emplace(folder.full_path, folder);
+    if (length >= lengths_.size()) lengths_.resize(length + 1);
+    lengths_[length] = true;
+  }
 }
 
-const FolderRule* FolderRules::At(const std::string& path) const {
+const FolderRule* FolderRules::At(std::string_view path) const {
+  if (path.size() >= lengths_.size() || !lengths_[path.size()]) return nullptr;
   const auto found = folders_.find(path);
   return found == folders_.end() ? nullptr : &found->second;
 }
 
-const FolderRule* FolderRules::Governing(const std::string& path) const {
-  std::string place = path;
-  while (!place.empty()) {
-    if (const FolderRule* folder = At(place)) return folder;
-    const std::size_t slash = place.rfind('/');
-    if (slash == std::string::npos) return nullptr;
-    place.resize(slash);
+const FolderRule* FolderRules::Governing(std::string_view path) const {
+  while (!path.empty()) {
+    if (const FolderRule* folder = At(path)) return folder;
+    const std::size_t slash = path.rfind('/');
+    if (slash == std::string_view::npos) return nullptr;
+    path = path.substr(0, slash);
   }
   return nullptr;
 }

@@ -3,8 +3,10 @@
 #ifndef QUARRY_DAEMONS_FILEINDEXD_FOLDER_RULES_H_
 #define QUARRY_DAEMONS_FILEINDEXD_FOLDER_RULES_H_
 
+#include <functional>
 #include <map>
 #include <string>
+#include <string_view>
 #include <vector>
 
 namespace quarry::fileindexd {
@@ -32,11 +34,12 @@ class FolderRules {
   explicit FolderRules(const std::vector<FolderRule>& folders);
 
   // All folders, in ascending order of place.
-  const std::map<std::string, FolderRule>& folders() const { return folders_; }
+  using Folders = std::map<std::string, FolderRule, std::less<>>;
+  const Folders& folders() const { return folders_; }
 
   // The folder exactly at the place, or that governs it; null when there is none.
-  const FolderRule* At(const std::string& path) const;
-  const FolderRule* Governing(const std::string& path) const;
+  const FolderRule* At(std::string_view path) const;
+  const FolderRule* Governing(std::string_view path) const;
 
   // Whether a folder lies below the place, itself not counted.
   bool HasFolderBelow(const std::string& path) const;
@@ -55,7 +58,10 @@ class FolderRules {
   bool operator==(const FolderRules&) const = default;
 
  private:
-  std::map<std::string, FolderRule> folders_;
+  Folders folders_;
+  // By length of a place whether there is a folder of such a place: every file asks for all places
+  // above its own, and hardly any is as long as a folder's.
+  std::vector<bool> lengths_;
 };
 
 }  // namespace quarry::fileindexd
