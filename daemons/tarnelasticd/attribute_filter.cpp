@@ -30,7 +30,8 @@ bool IsAmong(const std::string& file_name, const std::vector<std::string>& types
 constexpr const char* kNoExtension = "x";
 
 bool IsInside(std::string_view path, std::string_view folder) {
-  if (folder == "/" || path == folder) return true;
+  if (path == folder) return true;
+  if (folder == "/") return !path.empty() && path.front() == '/';
   return path.size() > folder.size() && path[folder.size()] == '/' &&
          path.substr(0, folder.size()) == folder;
 }

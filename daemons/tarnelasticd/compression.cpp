@@ -14,6 +14,10 @@ constexpr int kLevel = 3;
 // A request cannot bring more; a frame that claims more is damaged.
 constexpr unsigned long long kMaxBytes = 1ULL << 30;
 
+void CheckCompressed(std::size_t result) {
+  if (ZSTD_isError(result) != 0) throw Error(kErrorEngineBusyMemory, ZSTD_getErrorName(result));
+}
+
 struct FreeContext {
   void operator()(ZSTD_CCtx* context) const { ZSTD_freeCCtx(context); }
   void operator()(ZSTD_DCtx* context) const { ZSTD_freeDCtx(context); }
@@ -30,12 +34,16 @@ Context* ThreadContext() {
 
 }  // namespace
 
+// A text that comes back changed could not be taken out of the full text again, so each carries a
+// checksum.
 std::string Compress(std::string_view bytes) {
+  ZSTD_CCtx* const context = ThreadContext<ZSTD_CCtx, ZSTD_createCCtx>();
+  CheckCompressed(ZSTD_CCtx_setParameter(context, ZSTD_c_compressionLevel, kLevel));
+  CheckCompressed(ZSTD_CCtx_setParameter(context, ZSTD_c_checksumFlag, 1));
   std::string result(ZSTD_compressBound(bytes.size()), '\0');
   const std::size_t size =
-      ZSTD_compressCCtx(ThreadContext<ZSTD_CCtx, ZSTD_createCCtx>(), result.data(), result.size(),
-                        bytes.data(), bytes.size(), kLevel);
-  if (ZSTD_isError(size) != 0) throw Error(kErrorEngineBusyMemory, ZSTD_getErrorName(size));
+      ZSTD_compress2(context, result.data(), result.size(), bytes.data(), bytes.size());
+  CheckCompressed(size);
   result.resize(size);
   return result;
 }
@@ -43,14 +51,15 @@ std::string Compress(std::string_view bytes) {
 std::string Decompress(std::string_view compressed) {
   const auto size = ZSTD_getFrameContentSize(compressed.data(), compressed.size());
   if (size > kMaxBytes) throw Error(kDamagedIndex, "A stored text is damaged");
-  std::string result(size, '\0');
+  // Not filled: where a damaged frame claims too much, what is not written to takes no memory.
+  const std::unique_ptr<char[]> buffer(new char[size]);
   const std::size_t got =
-      ZSTD_decompressDCtx(ThreadContext<ZSTD_DCtx, ZSTD_createDCtx>(), result.data(), result.size(),
+      ZSTD_decompressDCtx(ThreadContext<ZSTD_DCtx, ZSTD_createDCtx>(), buffer.get(), size,
                           compressed.data(), compressed.size());
   if (ZSTD_isError(got) != 0 || got != size) {
     throw Error(kDamagedIndex, "A stored text is damaged");
   }
-  return result;
+  return std::string(buffer.get(), got);
 }
 
 }  // namespace quarry::engine

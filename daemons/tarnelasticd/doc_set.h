@@ -9,14 +9,26 @@
 #include <cstdint>
 #include <vector>
 
+#include "daemons/tarnelasticd/engine_error.h"
+
 namespace quarry::engine {
+
+// Documents are numbered as they come, from 1. What is kept by number would take any amount of
+// memory for a larger number. An index that has given out all of them counts as damaged, and so is
+// made anew with small ones.
+constexpr std::int64_t kMaxId = std::int64_t{1} << 28;
+
+inline void CheckId(std::int64_t id) {
+  if (id <= 0 || id > kMaxId) throw Error(kDamagedIndex, "The number of a document is damaged");
+}
 
 // One bit per row id: ids are small and dense, so a set over a million documents takes 125 KB
 // however many it holds, and sets are combined a word at a time.
 class DocSet {
  public:
-  // `id` is positive.
+  // Throws Error kDamagedIndex for an id that no document can have.
   void Add(std::int64_t id) {
+    CheckId(id);
     const auto word = static_cast<std::size_t>(id) / 64;
     if (word >= bits_.size()) bits_.resize(std::max(word + 1, bits_.size() * 3 / 2));
     bits_[word] |= std::uint64_t{1} << (static_cast<std::uint64_t>(id) % 64);

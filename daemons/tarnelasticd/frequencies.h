@@ -15,8 +15,9 @@ namespace quarry::engine {
 // A number per row id: ids are small and dense.
 class Frequencies {
  public:
-  // `id` is not negative.
+  // Throws as DocSet::Add() does.
   void Add(std::int64_t id, float frequency) {
+    CheckId(id);
     const auto index = static_cast<std::size_t>(id);
     if (index >= all_.size()) all_.resize(std::max(index + 1, all_.size() * 3 / 2));
     all_[index] += frequency;

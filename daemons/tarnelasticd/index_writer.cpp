@@ -5,6 +5,7 @@
 #include <utility>
 #include <vector>
 
+#include "daemons/tarnelasticd/doc_set.h"
 #include "daemons/tarnelasticd/engine_error.h"
 #include "daemons/tarnelasticd/request.h"
 #include "daemons/tarnelasticd/terms.h"
@@ -101,7 +102,7 @@ IndexWriter::~IndexWriter() {
 
 void IndexWriter::LoadCounters() {
   Statement last = db_.Prepare("SELECT max(id) FROM docs");
-  last.Step();
+  if (last.Step() && !last.IsNull(0)) CheckId(last.Int(0));
   next_id_ = last.Int(0) + 1;
   Statement count = db_.Prepare("SELECT value FROM meta WHERE key='documents'");
   documents_ = count.Step() ? count.Int(0) : 0;
@@ -227,6 +228,7 @@ void IndexWriter::ChangeText(std::int64_t id, std::string body) {
 }
 
 void IndexWriter::Insert(StoredDocument document) {
+  CheckId(next_id_);
   const std::int64_t id = next_id_++;
   WriteRow(insert_sql_, id, document);
   buffer_.Insert(id, document.labels, document.body);

@@ -94,7 +94,7 @@ double WeighPositions(std::string_view positions, const std::vector<double>& wei
   return static_cast<double>(count) * WeightOf(column, weights);
 }
 
-// Gathers postings, and knows which documents newer segments have spoken for.
+// Gathers postings: of each document what the newest segment says.
 class PostingLists::Gatherer {
  public:
   // What lies behind `last_id` has been deleted, or is damage that must not take memory.
@@ -104,17 +104,18 @@ class PostingLists::Gatherer {
   }
 
   void BeginWord() {
-    for (const std::int64_t id : replaced_) settled_.Remove(id);
-    replaced_.clear();
+    for (const std::int64_t id : settled_ids_) settled_.Remove(id);
+    settled_ids_.clear();
   }
 
-  // To be called with a word's entries in the newest segment first.
-  void Add(const Entry& entry) {
+  // To be called with a word's entries in the newest segment first: what it says of a document
+  // holds. `has_older` tells whether other segments may follow.
+  void Add(const Entry& entry, bool has_older) {
     if (entry.id > last_id_) return;
-    if (!replaced_.empty() && settled_.Contains(entry.id)) return;
-    if (entry.replaces) {
+    if (!settled_ids_.empty() && settled_.Contains(entry.id)) return;
+    if (has_older) {
       settled_.Add(entry.id);
-      replaced_.push_back(entry.id);
+      settled_ids_.push_back(entry.id);
     }
     if (entry.positions.empty()) return;
     batch_.push_back({entry.id, static_cast<float>(WeighPositions(entry.positions, weights_))});
@@ -131,8 +132,8 @@ class PostingLists::Gatherer {
   const std::int64_t last_id_;
   const Visitor& visit_;
   std::vector<Posting> batch_;
-  DocSet settled_;
-  std::vector<std::int64_t> replaced_;
+  DocSet settled_;  // documents that newer segments have spoken for
+  std::vector<std::int64_t> settled_ids_;
 };
 
 PostingLists::PostingLists(Database* db, std::string table, std::vector<double> weights,
@@ -188,7 +189,8 @@ void PostingLists::GatherWord(const std::string& key, Gatherer* gatherer) {
   for (const Segment& segment : segments_) {
     SegmentReader reader(db_, table_, segment, check_);
     if (!reader.Seek(key) || reader.key() != key) continue;
-    reader.ReadList([gatherer](const Entry& entry) { gatherer->Add(entry); });
+    const bool has_older = &segment != &segments_.back();
+    reader.ReadList([&](const Entry& entry) { gatherer->Add(entry, has_older); });
   }
 }
 
@@ -208,7 +210,8 @@ void PostingLists::GatherBeginning(const std::string& key, Gatherer* gatherer) {
     gatherer->BeginWord();
     for (auto& reader : readers) {
       if (reader->key() != next) continue;
-      reader->ReadList([gatherer](const Entry& entry) { gatherer->Add(entry); });
+      const bool has_older = &reader != &readers.back();
+      reader->ReadList([&](const Entry& entry) { gatherer->Add(entry, has_older); });
       if (!reader->Next() || !is_meant(*reader)) reader.reset();
     }
     std::erase(readers, nullptr);

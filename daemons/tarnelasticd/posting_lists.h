@@ -34,6 +34,10 @@ class PostingLists {
   // library to come may be, FTS5 must be asked.
   bool IsReadable() const { return is_readable_; }
 
+  // No document has a number above this; a list that has one says so of a document that is gone, or
+  // is damaged.
+  std::int64_t last_id() const { return last_id_; }
+
   // Calls `visit` with the documents that have `word`, or a word that begins with it; no document
   // twice with one word, in no certain order. `word` is one that the table's tokenizer makes.
   using Visitor = std::function<void(const std::vector<Posting>& some)>;

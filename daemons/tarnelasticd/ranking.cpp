@@ -3,6 +3,7 @@
 #include <cmath>
 
 #include "daemons/tarnelasticd/database.h"
+#include "daemons/tarnelasticd/engine_error.h"
 #include "daemons/tarnelasticd/text_tokenizer.h"
 
 namespace quarry::engine {
@@ -27,27 +28,33 @@ double Frequency(const Fts5ExtensionApi* api, Fts5Context* fts,
   return frequency;
 }
 
+// Exceptions must not cross SQLite's frames.
+template <typename Action>
+void Guarded(sqlite3_context* result, Action action) {
+  try {
+    action();
+  } catch (const Error&) {
+    sqlite3_result_error_code(result, SQLITE_CORRUPT);
+  } catch (...) {
+    sqlite3_result_error_nomem(result);
+  }
+}
+
 void Count(const Fts5ExtensionApi* api, Fts5Context* fts, sqlite3_context* result,
            int /*argument_count*/, sqlite3_value** /*arguments*/) {
   CountContext* context = *static_cast<CountContext**>(api->xUserData(fts));
   if (context == nullptr) return;
   const sqlite3_int64 id = api->xRowid(fts);
-  try {
+  Guarded(result, [&] {
     context->documents->Add(id);
     context->frequencies->Add(id, static_cast<float>(Frequency(api, fts, context->column_weights)));
-  } catch (...) {  // exceptions must not cross SQLite's frames
-    sqlite3_result_error_nomem(result);
-  }
+  });
 }
 
 void Add(sqlite3_context* result, int /*argument_count*/, sqlite3_value** arguments) {
   CountContext* context = *static_cast<CountContext**>(sqlite3_user_data(result));
   if (context == nullptr) return;
-  try {
-    context->documents->Add(sqlite3_value_int64(arguments[0]));
-  } catch (...) {
-    sqlite3_result_error_nomem(result);
-  }
+  Guarded(result, [&] { context->documents->Add(sqlite3_value_int64(arguments[0])); });
 }
 
 }  // namespace

@@ -41,7 +41,7 @@ SegmentReader::SegmentReader(Database* db, const std::string& table, const Segme
                              std::function<void()> check)
     : db_(db),
       table_(table),
-      leaves_(db->Prepare("SELECT block FROM " + table + "_data WHERE id BETWEEN ?1 AND ?2")),
+      leaves_(db->Prepare("SELECT block,id FROM " + table + "_data WHERE id BETWEEN ?1 AND ?2")),
       segment_(segment),
       check_(std::move(check)) {}
 
@@ -55,7 +55,8 @@ std::int64_t SegmentReader::FindLeaf(std::string_view key) {
 
 bool SegmentReader::Seek(std::string_view key) {
   const std::int64_t base = segment_.id << kLeafBits;
-  leaves_.Bind(1, base + FindLeaf(key)).Bind(2, base + segment_.last_leaf);
+  next_leaf_ = base + FindLeaf(key);
+  leaves_.Bind(1, next_leaf_).Bind(2, base + segment_.last_leaf);
   while (NextLeaf()) {
     while (next_word_ < words_.size()) {
       ReadKey();
@@ -77,7 +78,11 @@ bool SegmentReader::NextLeaf() {
   if (++leaves_read_ % kLeavesBetweenChecks == 0) check_();
   // A statement that is at its end would begin anew.
   is_at_end_ = is_at_end_ || !leaves_.Step();
-  if (is_at_end_) return false;
+  if (is_at_end_) {
+    CheckAllRead();
+    return false;
+  }
+  if (leaves_.Int(1) != next_leaf_++) FailDamaged();
   leaf_ = leaves_.Blob(0);
   if (leaf_.size() < kHeader) FailDamaged();
   const std::size_t end = Number16(leaf_, 2);
@@ -97,16 +102,21 @@ bool SegmentReader::NextLeaf() {
   return true;
 }
 
+// A leaf that is missing must not pass for the end of a list.
+void SegmentReader::CheckAllRead() const {
+  if (next_leaf_ <= (segment_.id << kLeafBits) + segment_.last_leaf) FailDamaged();
+}
+
 // Words share the beginning of the one before, on the same leaf.
 void SegmentReader::ReadKey() {
-  at_ = leaf_.data() + words_[next_word_];
-  const std::uint64_t kept = next_word_ == 0 ? 0 : TakeNumber();
+  const bool is_first_word = next_word_ == 0;
+  at_ = leaf_.data() + words_[next_word_++];
+  const std::uint64_t kept = is_first_word ? 0 : TakeNumber();
   const std::uint64_t size = TakeNumber();
-  if (kept > key_.size() || size > static_cast<std::size_t>(contents_end_ - at_)) FailDamaged();
+  if (kept > key_.size() || size > static_cast<std::size_t>(Limit() - at_)) FailDamaged();
   key_.resize(static_cast<std::size_t>(kept));
   key_.append(at_, static_cast<std::size_t>(size));
   at_ += size;
-  ++next_word_;
   row_ = 0;
 }
 
@@ -127,7 +137,6 @@ bool SegmentReader::TakeEntry(Entry* entry) {
   is_first_ = false;
   const std::uint64_t size = TakeNumber();
   entry->id = row_;
-  entry->replaces = (size & 1) != 0;
   entry->positions = TakePositions(size >> 1);
   return true;
 }

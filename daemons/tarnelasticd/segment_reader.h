@@ -8,8 +8,8 @@
 // where on it the first row id of a list lies that has begun on an earlier leaf (0: nowhere), and
 // where its contents end. Behind these are the places of the words that begin on it. A list is row
 // ids, the first one on each leaf whole and the others as differences, each with its positions'
-// length (doubled; odd when an older segment's entry of the same word and row no longer holds) and
-// the positions. What is not so is damage.
+// length (doubled, and odd where the row was deleted before) and the positions. Whatever an older
+// segment has of the same word and row no longer holds. What is not so is damage.
 
 #ifndef QUARRY_DAEMONS_TARNELASTICD_SEGMENT_READER_H_
 #define QUARRY_DAEMONS_TARNELASTICD_SEGMENT_READER_H_
@@ -35,7 +35,6 @@ struct Segment {
 // One document in a word's list.
 struct Entry {
   std::int64_t id = 0;
-  bool replaces = false;       // what older segments have of this word and document is void
   std::string_view positions;  // empty when the document no longer has the word
 };
 
@@ -70,17 +69,19 @@ class SegmentReader {
  private:
   std::int64_t FindLeaf(std::string_view key);
   bool NextLeaf();
+  void CheckAllRead() const;
   void ReadKey();
   bool TakeEntry(Entry* entry);
   std::string_view TakePositions(std::uint64_t size);
   const char* Limit() const;
-  std::uint64_t TakeNumber() { return TakeVarint(&at_, contents_end_); }
+  std::uint64_t TakeNumber() { return TakeVarint(&at_, Limit()); }
 
   Database* db_;
   const std::string table_;
   Statement leaves_;
   const Segment segment_;
   const std::function<void()> check_;
+  std::int64_t next_leaf_ = 0;  // the row id that it is to have
   std::size_t leaves_read_ = 0;
   bool is_at_end_ = false;
 

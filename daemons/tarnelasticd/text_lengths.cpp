@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <limits>
 
+#include "daemons/tarnelasticd/doc_set.h"
 #include "daemons/tarnelasticd/segment_reader.h"
 
 namespace quarry::engine {
@@ -64,6 +65,7 @@ void UpdateTextLengths(Database* db, const std::vector<std::int64_t>& ids) {
   Statement old = db->Prepare(kSelect);
   Statement write = db->Prepare("INSERT OR REPLACE INTO text_lengths(block,words) VALUES(?1,?2)");
   for (auto id = ids.begin(); id != ids.end();) {
+    CheckId(*id);
     const std::int64_t block = *id / kBlock;
     std::string lengths = ReadBlock(&old, block);
     for (; id != ids.end() && *id / kBlock == block; ++id) {

@@ -7,6 +7,7 @@
 #include <utility>
 
 #include "daemons/tarnelasticd/compression.h"
+#include "daemons/tarnelasticd/engine_error.h"
 #include "daemons/tarnelasticd/varint.h"
 
 namespace quarry::engine {
@@ -21,15 +22,22 @@ std::size_t CostOf(std::string_view text) {
   return text.empty() ? 0 : text.size() + kEntryBytes;
 }
 
+[[noreturn]] void FailDamaged() {
+  throw Error(kDamagedIndex, "Stored texts are damaged");
+}
+
 constexpr char kSelectRow[] = "SELECT id,packed FROM texts WHERE id<=?1 ORDER BY id DESC LIMIT 1";
 
-// Calls visit(id, text) for each text of a row until it returns false.
+// Calls visit(id, text) for each text of a row until it returns false. The ids ascend.
 template <typename Visit>
 void ForEachText(std::int64_t row, std::string_view bytes, Visit visit) {
-  auto id = static_cast<std::uint64_t>(row);
-  while (!bytes.empty()) {
-    id += TakeNumber(&bytes);
-    if (!visit(static_cast<std::int64_t>(id), TakeCounted(&bytes))) return;
+  std::int64_t id = row;
+  for (bool first = true; !bytes.empty(); first = false) {
+    const std::uint64_t step = TakeNumber(&bytes);
+    const auto room = static_cast<std::uint64_t>(std::numeric_limits<std::int64_t>::max() - id);
+    if (first != (step == 0) || step > room) FailDamaged();
+    id += static_cast<std::int64_t>(step);
+    if (!visit(id, TakeCounted(&bytes))) return;
   }
 }
 
@@ -77,6 +85,7 @@ TextStore::Rows::iterator TextStore::Load(std::int64_t id) {
     row.stored = true;
     const std::string bytes = Decompress(stored.Blob(1));
     ForEachText(key, bytes, [&row](std::int64_t at, std::string_view text) {
+      if (at >= row.end) FailDamaged();
       row.bytes += CostOf(text);
       row.texts.emplace(at, text);
       return true;
@@ -114,7 +123,8 @@ void TextStore::Write(std::int64_t id, std::string text) {
   if (kept.empty()) row.texts.erase(id);
 }
 
-// A row that has grown becomes several.
+// A row that has grown becomes several. A text that fills one has one of its own, so that its
+// neighbours are read without it.
 void TextStore::WriteOut(std::int64_t key, const Row& row) {
   if (row.stored) db_->Prepare("DELETE FROM texts WHERE id=?1").Bind(1, key).Run();
   Statement insert = db_->Prepare("INSERT INTO texts(id,packed) VALUES(?1,?2)");
@@ -122,6 +132,7 @@ void TextStore::WriteOut(std::int64_t key, const Row& row) {
     const std::int64_t first = text->first;
     std::string bytes;
     for (std::int64_t last = first; text != row.texts.end() && bytes.size() < kRowBytes; ++text) {
+      if (!bytes.empty() && text->second.size() >= kRowBytes) break;
       AppendNumber(&bytes, static_cast<std::uint64_t>(text->first - last));
       AppendNumber(&bytes, text->second.size());
       bytes += text->second;

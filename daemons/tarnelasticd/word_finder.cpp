@@ -74,7 +74,9 @@ DocSet WordFinder::MatchRows(const std::string& table, const std::string& expres
   Statement rows =
       reader_->db().Prepare("SELECT rowid FROM " + table + " WHERE " + table + " MATCH ?1");
   rows.Bind(1, std::string_view(expression));
-  while (rows.Step()) found.Add(rows.Int(0));
+  while (rows.Step()) {
+    if (rows.Int(0) <= names_.last_id()) found.Add(rows.Int(0));
+  }
   return found;
 }
 

@@ -34,5 +34,22 @@ TEST(CompressionTest, RefusesWhatItHasNotMade) {
   EXPECT_THROW(Decompress("no frame at all"), Error);
 }
 
+// Most of a frame of texts that hardly repeat are their bytes as they are.
+TEST(CompressionTest, NoticesEveryChangedByte) {
+  std::mt19937 random(3);
+  std::string bytes(200, 'x');
+  for (char& c : bytes) c = static_cast<char>(random());
+  const std::string whole = Compress(bytes);
+  for (std::size_t i = 0; i < whole.size(); ++i) {
+    std::string damaged = whole;
+    damaged[i] = static_cast<char>(damaged[i] ^ 1 << random() % 8);
+    try {
+      EXPECT_EQ(Decompress(damaged), bytes) << i;
+    } catch (const Error& error) {
+      EXPECT_TRUE(HasCode(error, kDamagedIndex));
+    }
+  }
+}
+
 }  // namespace
 }  // namespace quarry::engine

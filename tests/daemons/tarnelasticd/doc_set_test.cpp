@@ -4,8 +4,11 @@
 
 #include <algorithm>
 #include <iterator>
+#include <limits>
 #include <random>
 #include <set>
+
+#include "daemons/tarnelasticd/frequencies.h"
 
 namespace quarry::engine {
 namespace {
@@ -57,6 +60,18 @@ TEST(DocSetTest, BehavesAsASet) {
       ASSERT_GT(united.Bound(), static_cast<std::size_t>(*expected_united.rbegin()));
     }
   }
+}
+
+TEST(DocSetTest, TakesNoMemoryForNumbersThatCannotBe) {
+  constexpr std::int64_t kMost = std::numeric_limits<std::int64_t>::max();
+  DocSet set;
+  Frequencies frequencies;
+  for (const std::int64_t id : {-kMost - 1, std::int64_t{-1}, std::int64_t{0}, kMaxId + 1, kMost}) {
+    EXPECT_THROW(set.Add(id), Error) << id;
+    EXPECT_THROW(frequencies.Add(id, 1), Error) << id;
+  }
+  EXPECT_EQ(set.Bound(), 0U);
+  EXPECT_EQ(frequencies.Bytes(), 0U);
 }
 
 }  // namespace

@@ -84,7 +84,7 @@ TEST_F(TextStoreTest, AFullRowTakesNoMoreDocuments) {
   store_.Write(3, large);
   store_.Write(4, "small");
   store_.Flush();
-  EXPECT_EQ(Rows(), 3);
+  EXPECT_EQ(Rows(), 4);
   EXPECT_EQ(ReadText(&db_, 1), large);
   EXPECT_EQ(ReadText(&db_, 2), "small");
   EXPECT_EQ(ReadText(&db_, 3), large);
@@ -142,6 +142,71 @@ TEST_F(TextStoreTest, DamageIsTold) {
   EXPECT_THROW(ReadText(&db_, 1), Error);
   EXPECT_THROW(ReadText(&db_, 5), Error);
   EXPECT_THROW(store_.Write(1, "x"), Error);
+}
+
+TEST_F(TextStoreTest, ATextThatFillsARowHasOneOfItsOwn) {
+  const std::string large(TextStore::kRowBytes, 'x');
+  store_.Write(1, "before");
+  store_.Write(2, large);
+  store_.Write(3, "behind");
+  store_.Flush();
+  EXPECT_EQ(Rows(), 3);
+  EXPECT_EQ(ReadText(&db_, 1), "before");
+  EXPECT_EQ(ReadText(&db_, 2), large);
+  EXPECT_EQ(ReadText(&db_, 3), "behind");
+}
+
+// Two texts of one document, or of one that another row has, could not all be kept.
+TEST_F(TextStoreTest, TextsInTheWrongPlaceAreDamage) {
+  const auto insert = [this](std::int64_t id, const std::string& bytes) {
+    const std::string packed = Compress(bytes);
+    db_.Prepare("INSERT INTO texts(id,packed) VALUES(?1,?2)").Bind(1, id).BindBlob(2, packed).Run();
+  };
+  insert(1, std::string("\x00\x01"
+                        "a"
+                        "\x00\x01"
+                        "b",
+                        6));
+  insert(10, std::string("\x00\x01"
+                         "a"
+                         "\x0a\x01"
+                         "b",
+                         6));
+  insert(20, std::string("\x01\x01"
+                         "a",
+                         3));
+  insert(30, std::string("\x00\x01"
+                         "a",
+                         3) +
+                 std::string(8, '\xff') +
+                 std::string("\x7f\x01"
+                             "b",
+                             3));
+  for (const std::int64_t id : {2, 11, 21, 31}) {
+    EXPECT_THROW(store_.Write(id, "x"), Error) << id;
+  }
+}
+
+// However often texts change, no more is kept than there is.
+TEST_F(TextStoreTest, KeepsNothingOfWhatWasReplaced) {
+  std::mt19937 random(4);
+  const auto bytes = [this] {
+    Statement sum = db_.Prepare("SELECT sum(length(packed)) FROM texts");
+    sum.Step();
+    return sum.Int(0);
+  };
+  for (int round = 0; round < 30; ++round) {
+    for (std::int64_t id = 1; id <= 200; ++id) {
+      store_.Write((id * 77) % 200 + 1, RandomText(&random, random() % 4000));
+      if (id % 50 == 0) store_.Flush();
+    }
+    store_.Flush();
+    EXPECT_LT(bytes(), 200 * 4000);
+  }
+  for (std::int64_t id = 1; id <= 200; ++id) store_.Write(id, id == 100 ? "last" : "");
+  store_.Flush();
+  EXPECT_EQ(Rows(), 1);
+  EXPECT_LT(bytes(), 50);
 }
 
 // What is open is bounded, so much of this goes through the table.
