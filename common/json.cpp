@@ -40,13 +40,13 @@ bool HoldsCommentOrNul(const std::string& text) {
 }
 
 bool Parse(Json::Value& out, const std::string& text) {
-  if (ReadPlainJson(text, &out)) return true;
-  if (HoldsCommentOrNul(text)) return false;
-  const std::unique_ptr<Json::CharReader> reader(ReaderBuilder().newCharReader());
   try {
+    if (ReadPlainJson(text, &out)) return true;
+    if (HoldsCommentOrNul(text)) return false;
+    const std::unique_ptr<Json::CharReader> reader(ReaderBuilder().newCharReader());
     return reader->parse(text.data(), text.data() + text.size(), &out, nullptr);
   } catch (const Json::Exception&) {
-    return false;  // nested too deep
+    return false;  // nested too deep, or too long
   }
 }
 

@@ -15,6 +15,8 @@ namespace {
 constexpr std::size_t kMaxLevels = 100;
 // As many digits always fit 64 bits.
 constexpr std::size_t kMaxDigits = 18;
+// The library refuses longer ones, for it keeps the length in 30 bits.
+constexpr std::size_t kKeyLimit = std::size_t{1} << 30;
 
 // Whether a byte stands for itself inside of a string.
 constexpr std::array<bool, 256> kPlain = [] {
@@ -66,6 +68,13 @@ char Unescaped(char letter) {
     default:
       return 0;
   }
+}
+
+std::unique_ptr<Json::CharReader> NewNumberReader() {
+  Json::CharReaderBuilder builder;
+  Json::CharReaderBuilder::strictMode(&builder.settings_);
+  builder["strictRoot"] = false;
+  return std::unique_ptr<Json::CharReader>(builder.newCharReader());
 }
 
 // Each member returns whether it has understood the text so far.
@@ -136,7 +145,7 @@ class Reader {
     Json::Value* container = level.container;
     if (!level.is_object) return ReadValue(&container->append(Json::Value()));
     std::string_view key;
-    if (!Take('"') || !TakeString(&key)) return false;
+    if (!Take('"') || !TakeString(&key) || key.size() >= kKeyLimit) return false;
     Json::Value* member = container->demand(key.data(), key.data() + key.size());
     return Take(':') && ReadValue(member);
   }
@@ -218,13 +227,12 @@ class Reader {
   }
 
   // By the library: nobody else rounds just as it does.
-  static bool ReadRareNumber(std::string_view number, Json::Value* out) {
-    Json::CharReaderBuilder builder;
-    Json::CharReaderBuilder::strictMode(&builder.settings_);
-    builder["strictRoot"] = false;
-    const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
+  bool ReadRareNumber(std::string_view number, Json::Value* out) {
+    if (!number_reader_) number_reader_ = NewNumberReader();
     Json::Value value;
-    if (!reader->parse(number.data(), number.data() + number.size(), &value, nullptr)) return false;
+    if (!number_reader_->parse(number.data(), number.data() + number.size(), &value, nullptr)) {
+      return false;
+    }
     *out = value;
     return value.isNumeric();
   }
@@ -232,18 +240,9 @@ class Reader {
   std::string_view rest_;
   std::vector<Level> open_;
   std::string buffer_;
+  // Kept for all numbers of a text, as making one takes longer than reading some.
+  std::unique_ptr<Json::CharReader> number_reader_;
 };
-
-const Json::StreamWriterBuilder& WriterBuilder() {
-  static const Json::StreamWriterBuilder* const builder = [] {
-    auto* made = new Json::StreamWriterBuilder;
-    (*made)["indentation"] = "";
-    (*made)["commentStyle"] = "None";
-    (*made)["emitUTF8"] = true;
-    return made;
-  }();
-  return *builder;
-}
 
 void AppendEscaped(std::string* out, char c) {
   constexpr char kHex[] = "0123456789abcdef";
@@ -269,13 +268,33 @@ void AppendString(std::string* out, std::string_view text) {
   out->push_back('"');
 }
 
-void AppendLeaf(std::string* out, const Json::Value& value) {
+void AppendText(std::string* out, const Json::Value& value) {
   const char* begin = nullptr;
   const char* end = nullptr;
-  if (value.isString() && value.getString(&begin, &end)) {
-    AppendString(out, {begin, static_cast<std::size_t>(end - begin)});
-  } else {
-    out->append(Json::writeString(WriterBuilder(), value));
+  // One without a text, which nobody but the library can make, is written as nothing.
+  if (!value.getString(&begin, &end)) return;
+  AppendString(out, {begin, static_cast<std::size_t>(end - begin)});
+}
+
+// The functions for single values are those that the library's writer calls too.
+void AppendLeaf(std::string* out, const Json::Value& value) {
+  switch (value.type()) {
+    case Json::stringValue:
+      return AppendText(out, value);
+    case Json::booleanValue:
+      out->append(Json::valueToString(value.asBool()));
+      return;
+    case Json::intValue:
+      out->append(Json::valueToString(value.asLargestInt()));
+      return;
+    case Json::uintValue:
+      out->append(Json::valueToString(value.asLargestUInt()));
+      return;
+    case Json::realValue:
+      out->append(Json::valueToString(value.asDouble()));
+      return;
+    default:
+      out->append("null");
   }
 }
 

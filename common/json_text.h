@@ -13,7 +13,8 @@ namespace quarry {
 
 // Reads `text` just as the JSON library in its strict mode would, or returns false, with `out` as
 // it was: then the text is no JSON, or of a rare kind that is left to the library to judge. Bytes
-// that are not UTF-8 are kept. Any thread.
+// that are not UTF-8 are kept. Throws what the library throws for strings too long for it. Any
+// thread.
 bool ReadPlainJson(std::string_view text, Json::Value* out);
 
 // The compact text of `value`, byte for byte as the JSON library writes it. Any thread.
