@@ -5,7 +5,6 @@
 
 #include <cstddef>
 #include <cstdint>
-#include <functional>
 #include <string_view>
 #include <vector>
 
@@ -17,9 +16,9 @@ class NameTable {
  public:
   static constexpr std::uint32_t kNone = 0xffffffff;
 
-  static std::uint32_t HashOf(std::string_view name) {
-    return static_cast<std::uint32_t>(std::hash<std::string_view>()(name));
-  }
+  // Differs from one process to the next, so that nobody can name files such that they all fall to
+  // one place, and make finding each as slow as walking through all.
+  static std::uint32_t HashOf(std::string_view name);
 
   // The first position that was added with this hash and for which `is_it` holds, or kNone.
   template <typename IsIt>
