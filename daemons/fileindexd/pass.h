@@ -33,8 +33,8 @@ enum class PassResult {
 
 // Takes the queue's snapshot, does what it says, commits, and only then deletes the snapshot: a
 // pass that is cut short anywhere is done again by the next one. With `full`, and where lines of
-// the snapshot cannot be read, the whole share is compared besides. Throws Error, with the snapshot kept, when the pass cannot go on, and
-// Interrupted when the worker is to stop.
+// the snapshot cannot be read, the whole share is compared besides. Throws Error, with the snapshot
+// kept, when the pass cannot go on, and Interrupted when the worker is to stop.
 PassResult RunPass(const PassSetup& setup, bool full);
 
 }  // namespace quarry::fileindexd
