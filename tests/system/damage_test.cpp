@@ -244,7 +244,7 @@ TEST_F(DamageTest, GarbageInAQueueThatWaits) {
 
 // What it may have told of is found by comparing.
 TEST_F(DamageTest, GarbageInAQueueInWorkIsPassedOver) {
-  system_.StopMonitor();
+  ASSERT_TRUE(system_.StopMonitor());
   WriteFile(docs_ + "/d0/new.txt", "armadillo");
   WriteFile(docs_ + "/d1/untold.txt", "armadillo");
   WriteFile(Queue(), "garbage\n{\"event\":64,\"path\":\"" + docs_ + "/d0/new.txt\"}\n{\"event\":6");

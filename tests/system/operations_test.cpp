@@ -77,7 +77,7 @@ class OperationsTest : public testing::Test {
 
 TEST_F(OperationsTest, ReindexFindsWhatChanged) {
   IndexDocs();
-  RunningSystem::StopMonitor();
+  ASSERT_TRUE(system_.StopMonitor());
   WriteFile(docs_ + "/a/new.txt", "armadillo");
   WriteFile(docs_ + "/b/new.txt", "armadillo");
   const Json::Value done = system_.QuarryJson({"folder", "reindex", "/docs/a"});

@@ -52,10 +52,11 @@ void RunningSystem::Kill() {
   supervisor_.reset();
 }
 
-void RunningSystem::StopMonitor() {
+bool RunningSystem::StopMonitor() const {
   Json::Value monitor;
   monitor["service"] = "tarnotifyd";
   cli::AskSupervisor("stop", monitor);
+  return WaitUntilIdle();
 }
 
 Ran RunningSystem::Quarry(const std::vector<std::string>& arguments) const {

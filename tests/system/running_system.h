@@ -37,8 +37,9 @@ class RunningSystem {
   // The program that is tested.
   static std::string Program();
 
-  // Ends the change monitor, for tests of what is found without it.
-  static void StopMonitor();
+  // Ends the change monitor, for tests of what is found without it, and waits until what it told
+  // last is worked off. Returns whether that came.
+  bool StopMonitor() const;
 
   // Runs quarry to its end, at most a minute.
   Ran Quarry(const std::vector<std::string>& arguments) const;

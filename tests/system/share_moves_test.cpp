@@ -32,7 +32,7 @@ class ShareMovesTest : public testing::Test {
     ASSERT_TRUE(system_.WaitUntilIdle());
     ASSERT_EQ(Found("capybara"), kFiles);
     // The monitor would tell of what follows, and have it read.
-    RunningSystem::StopMonitor();
+    ASSERT_TRUE(system_.StopMonitor());
     for (int i = 0; i < kFiles; ++i) Disguise(Path(i, docs_));
   }
   void TearDown() override { system_.Stop(); }
