@@ -128,6 +128,7 @@ TEST_F(OperationsTest, DeletedFoldersAreNotFoundAnyLonger) {
 
 TEST_F(OperationsTest, APausedShareAnswersAndTakesNothing) {
   IndexDocs();
+  ASSERT_TRUE(system_.StopMonitor());
   Run({"share", "pause", "docs"});
   EXPECT_TRUE(EngineIndexes()[0]["paused"].asBool());
   EXPECT_EQ(system_.Registrations(), 0);
