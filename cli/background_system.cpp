@@ -2,6 +2,7 @@
 
 #include <chrono>
 #include <csignal>
+#include <thread>
 
 #include "cli/layout.h"
 #include "cli/problem.h"
@@ -9,6 +10,7 @@
 #include "common/file_util.h"
 #include "common/paths.h"
 #include "daemons/common/client.h"
+#include "daemons/common/single_instance.h"
 
 namespace quarry::cli {
 namespace {
@@ -16,14 +18,24 @@ namespace {
 constexpr std::chrono::seconds kStartTime{30};
 constexpr int kStopMilliseconds = 30'000;
 
+// A system may be about to end, as when the command before this one was interrupted, or to start.
+void WaitUntilUpOrDown(std::chrono::steady_clock::time_point deadline) {
+  const std::string pid_file = daemon::PidFilePath("quarry");
+  while (daemon::RunningPid(pid_file) > 0 && !SupervisorAnswers() &&
+         std::chrono::steady_clock::now() < deadline) {
+    std::this_thread::sleep_for(std::chrono::milliseconds(20));
+  }
+}
+
 }  // namespace
 
 BackgroundSystem::BackgroundSystem() {
   EnsureLayout();
+  const auto deadline = std::chrono::steady_clock::now() + kStartTime;
+  WaitUntilUpOrDown(deadline);
   if (ServicesAreManaged()) return;
   const std::string log = RootedPath("/var/log/quarry.log");
   supervisor_.emplace(RealPath("/proc/self/exe"), std::vector<std::string>{"run"}, log);
-  const auto deadline = std::chrono::steady_clock::now() + kStartTime;
   while (!daemon::IsListening(SupervisorSocket()) || !daemon::IsListening(EngineSocket())) {
     if (supervisor_->WaitEnded(20)) {
       throw Problem("The system does not start (" + *supervisor_->Ended() + "); see " + log);

@@ -10,7 +10,8 @@
 namespace quarry::cli {
 
 // Starts "quarry run" in the background unless a system runs already, and stops at the end of its
-// life what it has started. The supervisor's output goes to var/log/quarry.log.
+// life what it has started. One that is about to end is waited for. The supervisor's output goes to
+// var/log/quarry.log.
 class BackgroundSystem {
  public:
   // Blocks until the search engine answers, at most half a minute. Throws Problem.

@@ -3,6 +3,7 @@
 #include <exception>
 #include <iostream>
 #include <string>
+#include <vector>
 
 #include "cli/commands/commands.h"
 #include "cli/layout.h"
@@ -35,14 +36,23 @@ int Fail(bool json, int code, const std::string& reason, const std::string& sent
   return kExitFailed;
 }
 
+// Prints help, or what is wrong with the command line.
+int Exit(const CLI::App& app, const CLI::ParseError& error) {
+  return app.exit(error) == 0 ? quarry::cli::kExitDone : kExitUsage;
+}
+
 int Run(CLI::App& app, int argc, char** argv) {
   const bool json = WantsJson(argc, argv);
   try {
     quarry::cli::CheckRoot();
     app.parse(argc, argv);
     return quarry::cli::kExitDone;
+  } catch (const CLI::RequiredError& error) {
+    // Where a word is no command's name, that says more than that a command is missing.
+    const std::vector<std::string> unknown = app.remaining(true);
+    return unknown.empty() ? Exit(app, error) : Exit(app, CLI::ExtrasError({unknown.front()}));
   } catch (const CLI::ParseError& error) {
-    return app.exit(error) == 0 ? quarry::cli::kExitDone : kExitUsage;
+    return Exit(app, error);
   } catch (const quarry::cli::Unwell&) {
     return kExitFailed;
   } catch (const quarry::Error& error) {

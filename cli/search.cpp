@@ -127,8 +127,8 @@ void PrintHits(std::ostream& out, const Json::Value& found, unsigned int offset,
     const auto total = found["total"].asUInt64();
     if (total == 0) {
       out << "Nothing found.\n";
-    } else if (number < total) {
-      out << number - offset << " of " << total << " shown.\n";
+    } else if (hits.size() < total) {
+      out << hits.size() << " of " << total << " shown.\n";
     }
     if (found.isMember("suggestion")) {
       out << "Did you mean \"" << Printable(found["suggestion"].asString()) << "\"?\n";

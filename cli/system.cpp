@@ -127,6 +127,16 @@ Json::Value AskIndexDaemon(const std::string& command, const Json::Value& data) 
                   Envelope("type", command, data));
 }
 
+bool SupervisorAnswers() {
+  if (!daemon::IsListening(SupervisorSocket())) return false;
+  try {
+    AskSupervisor("status", Json::Value(Json::objectValue));
+    return true;
+  } catch (const Problem&) {
+    return false;
+  }
+}
+
 bool ServicesAreManaged() {
   return daemon::IsListening(SupervisorSocket()) || SystemdIsInCharge();
 }

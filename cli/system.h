@@ -21,6 +21,10 @@ Json::Value AskSupervisor(const std::string& command, const Json::Value& data);
 Json::Value AskEngine(const std::string& command, const Json::Value& data);
 Json::Value AskIndexDaemon(const std::string& command, const Json::Value& data);
 
+// Whether the supervisor runs and does what it is asked; one that is about to end does not. Blocks
+// until it has answered, at most half a minute.
+bool SupervisorAnswers();
+
 // Whether somebody keeps the services running: the supervisor, or systemd for a system without a
 // root of its own.
 bool ServicesAreManaged();

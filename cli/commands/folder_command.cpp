@@ -124,7 +124,7 @@ void List(const Page& page, bool json) {
     PrintJson(std::cout, result);
     return;
   }
-  if (result["folder"].empty()) {
+  if (result["total"].asInt() == 0) {
     std::cout << "No folder is indexed. Add one with: quarry folder add /SHARE/DIRECTORY\n";
     return;
   }

@@ -53,16 +53,17 @@ void RunSystem(bool full_speed) {
   Examination(true).Part("what is left of dead processes", CheckLeftovers);
   daemon::StopSignal stop;
   Supervisor supervisor(Services(full_speed));
-  daemon::SocketServer server(
-      SupervisorSocket(),
-      [&](const std::string& request, const daemon::Peer&) { return Answer(supervisor, request); });
-  server.WakeOn(stop.Fd());
+  std::optional<daemon::SocketServer> server;
+  server.emplace(SupervisorSocket(), [&](const std::string& request, const daemon::Peer&) {
+    return Answer(supervisor, request);
+  });
+  server->WakeOn(stop.Fd());
   supervisor.Step();
   // Whether the other services are needed is for the folder list to say, and bringing them up means
   // asking this very supervisor; so another process does it.
   std::optional<Child> prepare(Child(OwnProgram(), {"prepare-services"}));
   while (!stop.Requested()) {
-    server.Step(kStepMilliseconds);
+    server->Step(kStepMilliseconds);
     supervisor.Step();
     if (!prepare) continue;
     if (const auto end = prepare->Ended()) {
@@ -72,6 +73,8 @@ void RunSystem(bool full_speed) {
   }
   daemon::LogInfo("stopping");
   prepare.reset();
+  // Nobody is to wait for answers of a system that is going.
+  server.reset();
   supervisor.StopAll();
 }
 

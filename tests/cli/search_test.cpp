@@ -43,6 +43,12 @@ TEST(PrintHitsTest, NumbersTheHitsAndTellsHowManyThereAre) {
   EXPECT_NE(text.find("\n   a word here\n4. /v/a\n2 of 5 shown.\n"), std::string::npos) << text;
 }
 
+TEST(PrintHitsTest, TellsHowManyThereAreBeyondTheLastOne) {
+  EXPECT_EQ(Shown(R"({"total":5,"hits":[]})", 7), "0 of 5 shown.\n");
+  EXPECT_EQ(Shown(R"({"total":2,"hits":[{"path":"/v/a","is_dir":true}]})", 1),
+            "2. /v/a\n1 of 2 shown.\n");
+}
+
 TEST(PrintHitsTest, SaysNoNumberWhereAllAreShown) {
   EXPECT_EQ(Shown(R"({"total":1,"hits":[{"path":"/v/a","is_dir":true}]})"), "1. /v/a\n");
 }

@@ -2,9 +2,13 @@
 
 #include <gtest/gtest.h>
 
+#include <csignal>
 #include <filesystem>
 
+#include "cli/system.h"
 #include "common/file_util.h"
+#include "daemons/common/client.h"
+#include "daemons/common/single_instance.h"
 #include "tests/support/files.h"
 #include "tests/system/running_system.h"
 
@@ -94,6 +98,24 @@ TEST_F(FirstLightTest, OneCommandIndexesAndSearches) {
   system_.Stop();
 }
 
+TEST_F(FirstLightTest, OneCommandWaitsForASystemThatIsEnding) {
+  system_.Start();
+  const pid_t engine = system_.Pid("tarnelasticd");
+  ASSERT_EQ(kill(engine, SIGSTOP), 0);
+  ASSERT_EQ(kill(daemon::RunningPid(daemon::PidFilePath("quarry")), SIGTERM), 0);
+  // It has stopped listening and now waits for its engine.
+  EXPECT_TRUE(WaitUntil([] { return !daemon::IsListening(cli::SupervisorSocket()); }));
+  EXPECT_GT(daemon::RunningPid(daemon::PidFilePath("quarry")), 0);
+  cli::Child index(RunningSystem::Program(), {"index", docs_, "--", "zeppelin"},
+                   system_.Files() + "/output");
+  EXPECT_FALSE(index.WaitEnded(300));
+  ASSERT_EQ(kill(engine, SIGCONT), 0);
+  EXPECT_TRUE(index.WaitEnded(60'000));
+  EXPECT_EQ(index.Ended().value_or("still running"), "exit code 0");
+  EXPECT_NE(ReadFile(system_.Files() + "/output").find(docs_ + "/notes.md"), std::string::npos);
+  system_.Stop();
+}
+
 TEST_F(FirstLightTest, ReadsOnlyTheKindsThatAreWanted) {
   system_.Start();
   system_.Quarry({"share", "add", docs_});
@@ -126,9 +148,15 @@ TEST_F(FirstLightTest, RefusesBeforeAnythingIsChanged) {
   EXPECT_EQ(system_.Quarry({"folder", "get", "/docs"}).end, "exit code 1");
   EXPECT_EQ(system_.Quarry({"folder", "add", "/docs"}).end, "exit code 0");
   EXPECT_EQ(system_.Quarry({"folder", "add", "/docs"}).end, "exit code 1");
-  EXPECT_EQ(system_.Quarry({"no-such-command"}).end, "exit code 2");
+  const Ran unknown = system_.Quarry({"no-such-command"});
+  EXPECT_EQ(unknown.end, "exit code 2");
+  EXPECT_NE(unknown.output.find("not expected: no-such-command\n"), std::string::npos)
+      << unknown.output;
+  EXPECT_NE(system_.Quarry({"share"}).output.find("A subcommand is required\n"), std::string::npos);
   EXPECT_EQ(system_.QuarryJson({"share", "list"}).size(), 1U);
   EXPECT_EQ(system_.QuarryJson({"folder", "list"})["total"].asInt(), 1);
+  EXPECT_EQ(system_.Quarry({"folder", "list", "--offset", "1"}).output,
+            "FOLDER  NAME  CONTENT  PAUSED\n");
   system_.Stop();
 }
 
