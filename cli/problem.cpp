@@ -4,6 +4,7 @@
 
 #include "cli/state_check.h"
 #include "common/file_util.h"
+#include "daemons/tarnelasticd/engine_error.h"
 
 namespace quarry::cli {
 namespace {
@@ -43,6 +44,10 @@ constexpr Explanation kExplanations[] = {
     {kErrorNoSpace, "The volume is full; free at least 100 MiB, then try again"},
     {kErrorEngineBusy, "The search engine is busy; try again in a while"},
     {kErrorEngineBusyMemory, "The search engine is busy; try again in a while"},
+    {engine::kDamagedIndex,
+     "An index cannot be used; it is made anew when its share is indexed next, or by "
+     "\"quarry doctor\""},
+    {engine::kMovingIndex, "An index is being made anew; try again in a while"},
 };
 
 // The library's words for state that is damaged or missing are the same as for a wrong argument.

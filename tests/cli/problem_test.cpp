@@ -6,6 +6,7 @@
 #include <unistd.h>
 
 #include "cli/state_check.h"
+#include "daemons/tarnelasticd/engine_error.h"
 #include "tests/support/files.h"
 #include "tests/support/root.h"
 
@@ -13,26 +14,28 @@ namespace quarry::cli {
 namespace {
 
 TEST(ExplainTest, SaysWhatToDoForEveryCode) {
-  for (const int code : {kErrorBadParameter,
-                         kErrorShareEnum,
-                         kErrorSystem,
-                         kErrorCredentials,
-                         kErrorLoadFile,
-                         kErrorSaveFile,
-                         kErrorLock,
-                         kErrorShareNotFound,
-                         kErrorServiceAccount,
-                         kErrorTooManyFolders,
-                         kErrorFolderExists,
-                         kErrorFolderNotFound,
-                         kErrorPathNotIndexable,
-                         kErrorMalformedEvent,
-                         kErrorEngineRequest,
-                         kErrorParseDocument,
-                         kErrorEngineQuery,
-                         kErrorNoSpace,
-                         kErrorEngineBusy,
-                         kErrorEngineBusyMemory}) {
+  for (const int code : std::initializer_list<int>{kErrorBadParameter,
+                                                   kErrorShareEnum,
+                                                   kErrorSystem,
+                                                   kErrorCredentials,
+                                                   kErrorLoadFile,
+                                                   kErrorSaveFile,
+                                                   kErrorLock,
+                                                   kErrorShareNotFound,
+                                                   kErrorServiceAccount,
+                                                   kErrorTooManyFolders,
+                                                   kErrorFolderExists,
+                                                   kErrorFolderNotFound,
+                                                   kErrorPathNotIndexable,
+                                                   kErrorMalformedEvent,
+                                                   kErrorEngineRequest,
+                                                   kErrorParseDocument,
+                                                   kErrorEngineQuery,
+                                                   kErrorNoSpace,
+                                                   kErrorEngineBusy,
+                                                   kErrorEngineBusyMemory,
+                                                   engine::kDamagedIndex,
+                                                   engine::kMovingIndex}) {
     const std::string text = Explain(Error(static_cast<ErrorCode>(code), ""));
     EXPECT_EQ(text.find("The request failed"), std::string::npos) << code;
     EXPECT_NE(text.find(" (code " + std::to_string(code) + ")"), std::string::npos) << text;
