@@ -23,6 +23,16 @@ class Frequencies {
     all_[index] += frequency;
   }
 
+  // The same, in place of what there was.
+  void Set(std::int64_t id, float frequency) {
+    const auto index = static_cast<std::size_t>(id);
+    if (index < all_.size()) {
+      all_[index] = frequency;
+    } else if (frequency > 0) {
+      Add(id, frequency);
+    }
+  }
+
   float Of(std::int64_t id) const {
     const auto index = static_cast<std::size_t>(id);
     return index < all_.size() ? all_[index] : 0;

@@ -68,22 +68,24 @@ void FtsBuffer::Run(const std::string& sql, std::int64_t id,
 void FtsBuffer::RunBody(const std::string& sql, std::int64_t id, std::string_view body) {
   if (body.empty()) return;
   Run(sql, id, UnpackTexts(schema_, body));
-  texts_.push_back(id);
-  bytes_ += sizeof id;
 }
 
-void FtsBuffer::InsertLabels(std::int64_t id, const Labels& labels) {
-  Run(label_.insert, id, {labels.name, labels.extra});
-  Run(name_.insert, id, {MarkedName(tokenizer_, labels.name)});
+void FtsBuffer::InsertLabels(std::int64_t doc, const Labels& labels) {
+  Run(label_.insert, doc, {labels.name, labels.extra});
+  Run(name_.insert, doc, {MarkedName(tokenizer_, labels.name)});
 }
 
-void FtsBuffer::Insert(std::int64_t id, const Labels& labels, std::string_view body) {
-  InsertLabels(id, labels);
-  RunBody(body_.insert, id, body);
+void FtsBuffer::InsertBody(std::int64_t text, std::string_view body) {
+  RunBody(body_.insert, text, body);
 }
 
-void FtsBuffer::ChangeBody(std::int64_t id, std::string old, std::string now) {
-  bytes_ += Merge(&bodies_, id, std::move(old), std::move(now));
+void FtsBuffer::ChangeBody(std::int64_t text, std::string old, std::string now) {
+  bytes_ += Merge(&bodies_, text, std::move(old), std::move(now));
+}
+
+void FtsBuffer::NoteText(std::int64_t doc) {
+  noted_.push_back(doc);
+  bytes_ += sizeof doc;
 }
 
 void FtsBuffer::ChangeLabels(std::int64_t id, std::optional<Labels> old,
@@ -111,13 +113,13 @@ void FtsBuffer::Flush() {
 }
 
 void FtsBuffer::FlushLengths() {
-  std::sort(texts_.begin(), texts_.end());
-  texts_.erase(std::unique(texts_.begin(), texts_.end()), texts_.end());
-  UpdateTextLengths(db_, texts_);
+  std::sort(noted_.begin(), noted_.end());
+  noted_.erase(std::unique(noted_.begin(), noted_.end()), noted_.end());
+  UpdateTextLengths(db_, noted_);
 }
 
 void FtsBuffer::Clear() {
-  texts_.clear();
+  noted_.clear();
   bodies_.clear();
   labels_.clear();
   bytes_ = 0;

@@ -30,11 +30,13 @@ class FtsBuffer {
   // What is given must outlive the buffer.
   FtsBuffer(const Schema& schema, Database* db, const TextTokenizer& tokenizer);
 
-  // Puts in a row whose id is above all others'. An empty full text is none.
-  void Insert(std::int64_t id, const Labels& labels, std::string_view body);
-  // The full text of a row changes from `old` to `now` (both packed); empty stands for a row
-  // without full text.
-  void ChangeBody(std::int64_t id, std::string old, std::string now);
+  // Put in what has a number above all others'. A full text is packed, and not empty.
+  void InsertLabels(std::int64_t doc, const Labels& labels);
+  void InsertBody(std::int64_t text, std::string_view body);
+  // A full text changes from `old` to `now` (both packed); empty stands for none.
+  void ChangeBody(std::int64_t text, std::string old, std::string now);
+  // To be called for each document that gets a full text, loses one or gets another.
+  void NoteText(std::int64_t doc);
   void ChangeLabels(std::int64_t id, std::optional<Labels> old, std::optional<Labels> now);
 
   // Roughly the memory that is held.
@@ -60,7 +62,6 @@ class FtsBuffer {
 
   void Run(const std::string& sql, std::int64_t id, const std::vector<std::string_view>& texts);
   void RunBody(const std::string& sql, std::int64_t id, std::string_view body);
-  void InsertLabels(std::int64_t id, const Labels& labels);
   void FlushLabels(std::int64_t id, const Change<std::optional<Labels>>& change);
   void FlushLengths();
 
@@ -72,7 +73,7 @@ class FtsBuffer {
   const Table name_;
   std::map<std::int64_t, Change<std::string>> bodies_;
   std::map<std::int64_t, Change<std::optional<Labels>>> labels_;
-  std::vector<std::int64_t> texts_;  // rows whose full text has been put in or taken out
+  std::vector<std::int64_t> noted_;  // documents with another full text than before
   std::size_t bytes_ = 0;
 };
 

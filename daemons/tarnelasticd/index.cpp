@@ -7,6 +7,7 @@
 #include "daemons/tarnelasticd/document.h"
 #include "daemons/tarnelasticd/index_files.h"
 #include "daemons/tarnelasticd/terms.h"
+#include "daemons/tarnelasticd/text_sharing.h"
 #include "daemons/tarnelasticd/text_store.h"
 
 namespace quarry::engine {
@@ -131,7 +132,8 @@ void Index::CopyDocuments(const Schema& schema, const std::string& database_path
   Statement rows = reader->db().Prepare("SELECT " + RowColumns(old) + " FROM docs ORDER BY id");
   while (rows.Step()) {
     Json::Value document = ReadRow(old, rows, nullptr);
-    AddTexts(old, ReadText(&reader->db(), rows.Int(0)), nullptr, &document);
+    const std::int64_t text = TextOf(&reader->db(), rows.Int(0));
+    AddTexts(old, ReadText(&reader->db(), text), nullptr, &document);
     writer.Upsert(MakeDocument(schema, rows.Text(1), document));
   }
   if (HasTerms(&reader->db())) writer.RequestTerms();

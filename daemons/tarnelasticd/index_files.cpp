@@ -18,6 +18,7 @@
 #include "daemons/tarnelasticd/database.h"
 #include "daemons/tarnelasticd/engine_error.h"
 #include "daemons/tarnelasticd/request.h"
+#include "daemons/tarnelasticd/text_hash.h"
 
 namespace quarry::engine {
 namespace {
@@ -155,6 +156,8 @@ void FillDatabase(Database* db, const Schema& schema) {
   Statement insert = db->Prepare("INSERT INTO meta(key,value) VALUES(?1,?2)");
   insert.Bind(1, std::string_view("layout")).Bind(2, std::int64_t{kLayoutVersion}).Run();
   const std::string mappings = toString(schema.mappings());
+  const std::string hash_key = RandomHashKey();
+  insert.Bind(1, std::string_view("hash_key")).BindBlob(2, hash_key).Run();
   insert.Bind(1, std::string_view("mappings")).Bind(2, std::string_view(mappings)).Run();
   insert.Bind(1, std::string_view("documents")).Bind(2, std::int64_t{0}).Run();
   db->Execute("COMMIT");

@@ -37,6 +37,18 @@ void IndexReader::CheckDeadline() const {
   if (IsLate()) throw Error(kSearchTooLong, "The search took too long");
 }
 
+// Reading them for each search would cost as much as a search for a rare word does.
+const std::vector<TextCopy>& IndexReader::TextCopies() {
+  Statement version = db_.Prepare("PRAGMA data_version");
+  const std::int64_t now = version.Step() ? version.Int(0) : -1;
+  if (now != copies_version_ || now < 0) {
+    copies_version_ = -1;
+    copies_ = ReadTextCopies(&db_);
+    copies_version_ = now;
+  }
+  return copies_;
+}
+
 void IndexReader::End() noexcept {
   deadline_ = std::chrono::steady_clock::time_point::max();
   if (db_.InTransaction()) sqlite3_exec(db_.handle(), "ROLLBACK", nullptr, nullptr, nullptr);

@@ -11,6 +11,7 @@
 
 #include "daemons/tarnelasticd/database.h"
 #include "daemons/tarnelasticd/ranking.h"
+#include "daemons/tarnelasticd/text_sharing.h"
 #include "daemons/tarnelasticd/text_tokenizer.h"
 
 namespace quarry::engine {
@@ -31,6 +32,8 @@ class IndexReader {
 
   Database& db() { return db_; }
   const TextTokenizer& tokenizer() const { return tokenizer_; }
+  // The documents that share texts, as the index stands. Valid until End().
+  const std::vector<TextCopy>& TextCopies();
 
   // Lets quarry_count write to `context` as long as it lives.
   class Counting {
@@ -53,6 +56,8 @@ class IndexReader {
   Database db_;
   TextTokenizer tokenizer_;
   CountContext* count_context_ = nullptr;
+  std::vector<TextCopy> copies_;
+  std::int64_t copies_version_ = -1;  // of the database, when they were read
   std::chrono::steady_clock::time_point deadline_ = std::chrono::steady_clock::time_point::max();
 };
 

@@ -89,6 +89,7 @@ IndexWriter::IndexWriter(const std::string& database_path, std::shared_ptr<const
       tokenizer_(db_.handle()),
       buffer_(*schema_, &db_, tokenizer_),
       texts_(&db_),
+      sharing_(&db_),
       insert_sql_(InsertSql(*schema_)),
       update_sql_(UpdateSql(*schema_)),
       select_row_sql_("SELECT " + RowColumns(*schema_) + " FROM docs WHERE path=?1") {
@@ -101,9 +102,9 @@ IndexWriter::~IndexWriter() {
 }
 
 void IndexWriter::LoadCounters() {
-  Statement last = db_.Prepare("SELECT max(id) FROM docs");
-  if (last.Step() && !last.IsNull(0)) CheckId(last.Int(0));
-  next_id_ = last.Int(0) + 1;
+  const std::int64_t last = LastId(&db_);
+  if (last != 0) CheckId(last);
+  next_id_ = last + 1;
   Statement count = db_.Prepare("SELECT value FROM meta WHERE key='documents'");
   documents_ = count.Step() ? count.Int(0) : 0;
 }
@@ -220,21 +221,49 @@ void IndexWriter::ChangeLabels(const Found& old, const Labels& now) {
   buffer_.ChangeLabels(old.id, old.labels, now);
 }
 
-void IndexWriter::ChangeText(std::int64_t id, std::string body) {
-  std::string old = texts_.Read(id);
+std::int64_t IndexWriter::NewId() {
+  CheckId(next_id_);
+  return next_id_++;
+}
+
+std::string IndexWriter::ReadTextOf(std::int64_t doc) {
+  return texts_.Read(TextOf(&db_, doc));
+}
+
+void IndexWriter::ChangeText(std::int64_t doc, std::string body) {
+  const std::int64_t text = TextOf(&db_, doc);
+  std::string old = texts_.Read(text);
   if (old == body) return;
-  texts_.Write(id, body);
-  buffer_.ChangeBody(id, std::move(old), std::move(body));
+  buffer_.NoteText(doc);
+  if (!old.empty()) DropText(doc, text, std::move(old));
+  if (!body.empty()) AddText(doc, std::move(body));
+}
+
+void IndexWriter::DropText(std::int64_t doc, std::int64_t text, std::string old) {
+  if (!sharing_.Leave(doc, text, old)) return;
+  texts_.Write(text, "");
+  buffer_.ChangeBody(text, std::move(old), "");
+}
+
+void IndexWriter::AddText(std::int64_t doc, std::string body) {
+  const TextSharing::Use use = sharing_.Join(doc, body, [this] { return NewId(); });
+  if (!use.is_first) return;
+  texts_.Write(use.text, body);
+  buffer_.ChangeBody(use.text, "", std::move(body));
 }
 
 void IndexWriter::Insert(StoredDocument document) {
-  CheckId(next_id_);
-  const std::int64_t id = next_id_++;
+  const std::int64_t id = NewId();
   WriteRow(insert_sql_, id, document);
-  buffer_.Insert(id, document.labels, document.body);
+  buffer_.InsertLabels(id, document.labels);
   transaction_bytes_ += document.body.size();
-  if (!document.body.empty()) texts_.Write(id, std::move(document.body));
   ++documents_;
+  if (document.body.empty()) return;
+  buffer_.NoteText(id);
+  const TextSharing::Use use = sharing_.Join(id, document.body, [this] { return NewId(); });
+  if (!use.is_first) return;
+  buffer_.InsertBody(use.text, document.body);
+  texts_.Write(use.text, std::move(document.body));
 }
 
 void IndexWriter::Replace(const Found& old, StoredDocument document) {
@@ -281,7 +310,7 @@ bool IndexWriter::SetLocked(std::string_view path, const Json::Value& changes) {
     document = ReadRow(*schema_, row, nullptr);
   }
   const bool touches_text = TouchesText(*schema_, changes);
-  if (touches_text) AddTexts(*schema_, texts_.Read(found.id), nullptr, &document);
+  if (touches_text) AddTexts(*schema_, ReadTextOf(found.id), nullptr, &document);
   ApplyChanges(changes, &document);
   const std::string new_path = document[schema_->path_field()].asString();
   if (new_path != path) {
@@ -337,7 +366,7 @@ Json::Value IndexWriter::Find(const Selection& selection) {
     if (found.size() >= kMaxFound) FailMalformed("Too many documents: ask with a limit");
     Json::Value document = ReadRow(*schema_, rows, only);
     if (wants_text) {
-      const std::string body = texts_.Read(rows.Int(0));
+      const std::string body = ReadTextOf(rows.Int(0));
       text_bytes += body.size();
       if (text_bytes > kMaxFoundText && !found.empty()) {
         FailMalformed("Too much text: ask with a limit");

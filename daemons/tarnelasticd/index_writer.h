@@ -18,6 +18,7 @@
 #include "daemons/tarnelasticd/fts_buffer.h"
 #include "daemons/tarnelasticd/schema.h"
 #include "daemons/tarnelasticd/selection.h"
+#include "daemons/tarnelasticd/text_sharing.h"
 #include "daemons/tarnelasticd/text_store.h"
 #include "daemons/tarnelasticd/text_tokenizer.h"
 
@@ -96,7 +97,11 @@ class IndexWriter {
   void Replace(const Found& old, StoredDocument document);
   void Remove(const Found& old);
   void ChangeLabels(const Found& old, const Labels& now);
-  void ChangeText(std::int64_t id, std::string body);
+  std::string ReadTextOf(std::int64_t doc);
+  void ChangeText(std::int64_t doc, std::string body);
+  void DropText(std::int64_t doc, std::int64_t text, std::string old);
+  void AddText(std::int64_t doc, std::string body);
+  std::int64_t NewId();
   void WriteRow(const std::string& sql, std::int64_t id, const StoredDocument& document);
   bool SetLocked(std::string_view path, const Json::Value& changes);
 
@@ -106,6 +111,7 @@ class IndexWriter {
   TextTokenizer tokenizer_;
   FtsBuffer buffer_;
   TextStore texts_;
+  TextSharing sharing_;
   std::string insert_sql_;
   std::string update_sql_;
   std::string select_row_sql_;

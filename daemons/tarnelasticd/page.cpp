@@ -66,7 +66,7 @@ class Scorer {
     DocSet common = texts;
     common.Intersect(matches_.documents);
     if (common.Empty()) return;
-    const double average = words_.AverageTextLength();
+    const double average = lengths_.Average();
     common.ForEach([&](std::int64_t id) {
       const double norm = LengthNorm(lengths_.Of(id), average);
       scores_[static_cast<std::size_t>(id)] += weight * WordScore(frequencies.Of(id), norm);

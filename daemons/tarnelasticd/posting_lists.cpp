@@ -13,7 +13,6 @@ namespace {
 
 constexpr char kMainIndex = '0';
 constexpr int kUnderstoodVersion = 4;
-constexpr std::int64_t kAveragesRow = 1;
 constexpr std::int64_t kStructureRow = 10;
 constexpr std::size_t kCookie = 4;  // bytes before the structure
 constexpr std::size_t kBatch = 1024;
@@ -136,16 +135,18 @@ class PostingLists::Gatherer {
   std::vector<std::int64_t> settled_ids_;
 };
 
-PostingLists::PostingLists(Database* db, std::string table, std::vector<double> weights,
-                           std::function<void()> check)
-    : db_(db), table_(std::move(table)), weights_(std::move(weights)), check_(std::move(check)) {
+PostingLists::PostingLists(Database* db, std::string table, std::int64_t last_id,
+                           std::vector<double> weights, std::function<void()> check)
+    : db_(db),
+      table_(std::move(table)),
+      last_id_(last_id),
+      weights_(std::move(weights)),
+      check_(std::move(check)) {
   Statement version = db_->Prepare("SELECT v FROM " + table_ + "_config WHERE k='version'");
   if (!version.Step() || version.Int(0) != kUnderstoodVersion) return;
   Statement row = db_->Prepare("SELECT block FROM " + table_ + "_data WHERE id=?1");
   row.Bind(1, kStructureRow);
   if (row.Step()) ReadStructure(row.Blob(0));
-  Statement last = db_->Prepare("SELECT max(id) FROM docs");
-  if (last.Step()) last_id_ = last.Int(0);
 }
 
 void PostingLists::ReadStructure(std::string_view record) {
@@ -178,7 +179,7 @@ void PostingLists::ForEach(std::string_view word, bool prefix, const Visitor& vi
   const std::string key = kMainIndex + std::string(word);
   Gatherer gatherer(weights_, last_id_, visit);
   if (prefix) {
-    GatherBeginning(key, &gatherer);
+    GatherBeginning(key, &gatherer, [](const std::string&) {});
   } else {
     GatherWord(key, &gatherer);
   }
@@ -194,8 +195,24 @@ void PostingLists::GatherWord(const std::string& key, Gatherer* gatherer) {
   }
 }
 
+void PostingLists::CountWords(
+    const std::function<std::int64_t(std::int64_t id)>& count_of,
+    const std::function<void(std::string_view word, std::int64_t rows)>& visit) {
+  std::int64_t rows = 0;
+  const Visitor add = [&](const std::vector<Posting>& some) {
+    for (const Posting& posting : some) rows += count_of(posting.id);
+  };
+  Gatherer gatherer(weights_, last_id_, add);
+  GatherBeginning(std::string(1, kMainIndex), &gatherer, [&](const std::string& key) {
+    gatherer.Flush();
+    if (rows > 0) visit(std::string_view(key).substr(1), rows);
+    rows = 0;
+  });
+}
+
 // Word by word through all segments at once: what a newer one says of a word holds.
-void PostingLists::GatherBeginning(const std::string& key, Gatherer* gatherer) {
+template <typename WordEnd>
+void PostingLists::GatherBeginning(const std::string& key, Gatherer* gatherer, WordEnd word_end) {
   const auto is_meant = [&key](const SegmentReader& reader) {
     return reader.key().compare(0, key.size(), key) == 0;
   };
@@ -215,20 +232,8 @@ void PostingLists::GatherBeginning(const std::string& key, Gatherer* gatherer) {
       if (!reader->Next() || !is_meant(*reader)) reader.reset();
     }
     std::erase(readers, nullptr);
+    word_end(next);
   }
-}
-
-double PostingLists::AverageLength() {
-  Statement row = db_->Prepare("SELECT block FROM " + table_ + "_data WHERE id=?1");
-  row.Bind(1, kAveragesRow);
-  if (!row.Step() || row.Blob(0).empty()) return 1;
-  const std::string_view record = row.Blob(0);
-  const char* at = record.data();
-  const char* const end = at + record.size();
-  const auto rows = static_cast<double>(TakeVarint(&at, end));
-  double words = 0;
-  while (at < end) words += static_cast<double>(TakeVarint(&at, end));
-  return rows > 0 && words > 0 ? words / rows : 1;
 }
 
 }  // namespace quarry::engine

@@ -25,40 +25,41 @@ struct Posting {
 // connection, one thread at a time. All that fails throws Error as Database does.
 class PostingLists {
  public:
-  // `table` is an FTS5 table with positions, over rows of docs. Columns without a weight weigh 1.
-  // `check` is called now and then, and may throw to end the work.
-  PostingLists(Database* db, std::string table, std::vector<double> weights,
+  // `table` is an FTS5 table with positions. No row of it has a number above `last_id`: a list that
+  // has one says so of a row that is gone, or is damaged. Columns without a weight weigh 1. `check`
+  // is called now and then, and may throw to end the work.
+  PostingLists(Database* db, std::string table, std::int64_t last_id, std::vector<double> weights,
                std::function<void()> check);
 
   // Whether the tables are of the form that is understood here. Where they are not, as those of a
   // library to come may be, FTS5 must be asked.
   bool IsReadable() const { return is_readable_; }
 
-  // No document has a number above this; a list that has one says so of a document that is gone, or
-  // is damaged.
-  std::int64_t last_id() const { return last_id_; }
-
   // Calls `visit` with the documents that have `word`, or a word that begins with it; no document
   // twice with one word, in no certain order. `word` is one that the table's tokenizer makes.
   using Visitor = std::function<void(const std::vector<Posting>& some)>;
   void ForEach(std::string_view word, bool prefix, const Visitor& visit);
 
-  // How many words a document of the table has on average, at least 1.
-  double AverageLength();
+  // Calls visit(word, rows) with each word of the table, and the sum of count_of(id) over the rows
+  // that have it.
+  void CountWords(const std::function<std::int64_t(std::int64_t id)>& count_of,
+                  const std::function<void(std::string_view word, std::int64_t rows)>& visit);
 
  private:
   class Gatherer;
 
   void ReadStructure(std::string_view record);
   void GatherWord(const std::string& key, Gatherer* gatherer);
-  void GatherBeginning(const std::string& key, Gatherer* gatherer);
+  // Calls word_end(key) behind each word that any row has.
+  template <typename WordEnd>
+  void GatherBeginning(const std::string& key, Gatherer* gatherer, WordEnd word_end);
 
   Database* db_;
   const std::string table_;
+  const std::int64_t last_id_;
   const std::vector<double> weights_;
   const std::function<void()> check_;
   bool is_readable_ = false;
-  std::int64_t last_id_ = 0;
   std::vector<Segment> segments_;  // the newest first
 };
 

@@ -46,7 +46,6 @@ void Count(const Fts5ExtensionApi* api, Fts5Context* fts, sqlite3_context* resul
   if (context == nullptr) return;
   const sqlite3_int64 id = api->xRowid(fts);
   Guarded(result, [&] {
-    context->documents->Add(id);
     context->frequencies->Add(id, static_cast<float>(Frequency(api, fts, context->column_weights)));
   });
 }

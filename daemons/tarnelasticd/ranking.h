@@ -24,7 +24,7 @@ double LengthNorm(std::size_t length, double average_length);
 double WordScore(double frequency, double length_norm);
 constexpr double kMostOfWord = 2.2;
 
-// What the functions below write to while a statement runs: documents, and how often they have the
+// What the functions below write to while a statement runs: documents, or how often rows have the
 // first phrase of the MATCH expression.
 struct CountContext {
   std::vector<double> column_weights;
@@ -33,7 +33,7 @@ struct CountContext {
 };
 
 // Gives the connection quarry_count(TABLE), for use in a statement with MATCH over TABLE, and
-// quarry_add(ID), which notes the document alone; they return nothing. `*slot` is read while such
+// quarry_add(ID), which notes a document; they return nothing. `*slot` is read while such
 // statements run, and belongs to the caller.
 void RegisterCounting(sqlite3* db, CountContext** slot);
 

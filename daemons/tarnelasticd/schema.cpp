@@ -5,6 +5,7 @@
 #include "daemons/tarnelasticd/field_names.h"
 #include "daemons/tarnelasticd/terms.h"
 #include "daemons/tarnelasticd/text_lengths.h"
+#include "daemons/tarnelasticd/text_sharing.h"
 #include "daemons/tarnelasticd/text_tokenizer.h"
 
 namespace quarry::engine {
@@ -164,7 +165,7 @@ std::string Schema::CreateStatements() const {
   add_words("body", ColumnList("t", std::max<std::size_t>(text_columns_, 1)), kTextTokenizer);
   add_words("labels", "name,extra", kTextTokenizer);
   add_words("names", "name", "trigram case_sensitive 1");
-  return sql + CreateLengthTable() + CreateTermTables();
+  return sql + CreateSharingTables() + CreateLengthTable() + CreateTermTables();
 }
 
 }  // namespace quarry::engine

@@ -5,7 +5,9 @@
 //   docs    one row per document: its path, a column per listed field that is no full text, and
 //           what is not listed as JSON
 //   texts   the full texts of documents, packed and compressed; text_store.h says more
-//   body    FTS5 over the full text, a column per field; without content of its own
+//   text_copies, text_hashes  which documents share a text; text_sharing.h says more
+//   body    FTS5 over the full texts, a column per field; without content of its own. Its rows have
+//           the numbers of texts, those of labels and names the numbers of documents
 //   labels  FTS5 over the words of the file name and the texts of fields that are not listed
 //   names   FTS5 over all three letters in a row of the file name
 //   text_lengths  how many words the full texts have; text_lengths.h says more
@@ -25,7 +27,7 @@
 namespace quarry::engine {
 
 // The version of the layout. A database of another version counts as damaged: it is made anew.
-constexpr int kLayoutVersion = 4;
+constexpr int kLayoutVersion = 5;
 
 // How a field's values are kept.
 enum class Storage {

@@ -14,6 +14,7 @@
 #include "daemons/tarnelasticd/request.h"
 #include "daemons/tarnelasticd/snippet.h"
 #include "daemons/tarnelasticd/suggestion.h"
+#include "daemons/tarnelasticd/text_sharing.h"
 #include "daemons/tarnelasticd/text_store.h"
 
 namespace quarry::engine {
@@ -142,7 +143,8 @@ Json::Value HitJson(const SearchedIndex& index, const Ranked& ranked,
                     const std::vector<const QueryTerm*>& terms, std::size_t snippet_length) {
   Json::Value hit = AttributesJson(index, ranked);
   if (snippet_length == 0) return hit;
-  const std::string packed = ReadText(&index.reader->db(), ranked.id);
+  Database* db = &index.reader->db();
+  const std::string packed = ReadText(db, TextOf(db, ranked.id));
   if (packed.empty()) return hit;
   hit["snippet"] = SnippetJson(ChooseSnippet(index, packed, terms, snippet_length));
   return hit;

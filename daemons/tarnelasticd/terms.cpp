@@ -5,7 +5,10 @@
 #include <utility>
 
 #include "daemons/tarnelasticd/edit_distance.h"
+#include "daemons/tarnelasticd/engine_error.h"
+#include "daemons/tarnelasticd/posting_lists.h"
 #include "daemons/tarnelasticd/selection.h"
+#include "daemons/tarnelasticd/text_sharing.h"
 #include "daemons/tarnelasticd/text_tokenizer.h"
 
 namespace quarry::engine {
@@ -93,6 +96,47 @@ class NearFinder {
   std::vector<NearTerm> found_;
 };
 
+// How many documents have each text, by its number.
+std::vector<std::int32_t> CountUsers(Database* db) {
+  std::vector<std::int32_t> users(static_cast<std::size_t>(LastId(db)) + 1, 1);
+  for (const TextCopy& copy : ReadTextCopies(db)) {
+    if (copy.text >= users.size()) throw Error(kDamagedIndex, "Stored texts are damaged");
+    if (copy.text != 0) ++users[copy.text];
+    --users[copy.doc];
+  }
+  return users;
+}
+
+bool IsOfMiddlingLength(std::string_view word) {
+  if (word.size() < static_cast<std::size_t>(kMinTermLetters)) return false;
+  const auto letters = static_cast<std::int64_t>(CountCharacters(word));
+  return letters >= kMinTermLetters && letters <= kMaxTermLetters;
+}
+
+std::string LengthCondition() {
+  return "length(term) BETWEEN " + std::to_string(kMinTermLetters) + " AND " +
+         std::to_string(kMaxTermLetters);
+}
+
+void CollectTextTerms(Database* db) {
+  // Makes FTS5 write out what it holds back.
+  db->Prepare("SELECT 1 FROM body_terms LIMIT 1").Step();
+  PostingLists lists(db, "body", LastId(db), {}, [] {});
+  if (!lists.IsReadable()) {
+    db->Execute(
+        "INSERT INTO terms(term,documents) SELECT term,doc FROM body_terms WHERE doc>1 AND " +
+        LengthCondition());
+    return;
+  }
+  const std::vector<std::int32_t> users = CountUsers(db);
+  Statement insert = db->Prepare("INSERT INTO terms(term,documents) VALUES(?1,?2)");
+  lists.CountWords([&users](std::int64_t text) { return users[static_cast<std::size_t>(text)]; },
+                   [&insert](std::string_view word, std::int64_t documents) {
+                     if (documents < 2 || !IsOfMiddlingLength(word)) return;
+                     insert.Bind(1, word).Bind(2, documents).Run();
+                   });
+}
+
 }  // namespace
 
 std::string CreateTermTables() {
@@ -107,17 +151,13 @@ std::string CreateTermTables() {
 // A word that stands in one text alone is as likely a slip as a word. In a file name it is what
 // people look for, unless it is a number.
 void CollectTerms(Database* db) {
-  const std::string lengths = "length(term) BETWEEN " + std::to_string(kMinTermLetters) + " AND " +
-                              std::to_string(kMaxTermLetters);
+  db->Execute("DELETE FROM terms;DELETE FROM term_blocks;");
+  CollectTextTerms(db);
   db->Execute(
-      "DELETE FROM terms;DELETE FROM term_blocks;"
-      "INSERT INTO terms(term,documents) SELECT term,doc FROM body_terms "
-      "WHERE doc>1 AND " +
-      lengths +
-      ";"
       "INSERT INTO terms(term,documents) SELECT term,doc FROM label_terms "
       "WHERE (doc>1 OR term NOT GLOB '*[0-9]*') AND " +
-      lengths + " ON CONFLICT(term) DO UPDATE SET documents=max(documents,excluded.documents);");
+      LengthCondition() +
+      " ON CONFLICT(term) DO UPDATE SET documents=max(documents,excluded.documents);");
   BlockWriter blocks(db);
   Statement terms = db->Prepare("SELECT term FROM terms");
   while (terms.Step()) blocks.Add(terms.Text(0));

@@ -3,6 +3,7 @@
 #include "daemons/tarnelasticd/database.h"
 #include "daemons/tarnelasticd/fts_buffer.h"
 #include "daemons/tarnelasticd/ranking.h"
+#include "daemons/tarnelasticd/text_sharing.h"
 
 namespace quarry::engine {
 namespace {
@@ -29,24 +30,31 @@ DocSet Documents(PostingLists* lists, const std::string& word, bool prefix) {
 WordFinder::WordFinder(const Schema& schema, IndexReader* reader)
     : schema_(schema),
       reader_(reader),
-      body_(&reader->db(), "body", schema.Weights(), [reader] { reader->CheckDeadline(); }),
-      labels_(&reader->db(), "labels", {}, [reader] { reader->CheckDeadline(); }),
-      names_(&reader->db(), "names", {}, [reader] { reader->CheckDeadline(); }) {}
+      last_id_(LastId(&reader->db())),
+      body_(&reader->db(), "body", last_id_, schema.Weights(),
+            [reader] { reader->CheckDeadline(); }),
+      labels_(&reader->db(), "labels", last_id_, {}, [reader] { reader->CheckDeadline(); }),
+      names_(&reader->db(), "names", last_id_, {}, [reader] { reader->CheckDeadline(); }) {}
 
 DocSet WordFinder::InTexts(const QueryTerm& term, Frequencies* frequencies) {
+  CountTexts(term, frequencies);
+  SpreadToDocuments(reader_->TextCopies(), frequencies);
+  return frequencies->Documents();
+}
+
+// By the numbers of texts.
+void WordFinder::CountTexts(const QueryTerm& term, Frequencies* frequencies) {
   if (term.words.size() == 1 && body_.IsReadable()) {
     body_.ForEach(term.words.front(), term.prefix, [&](const std::vector<Posting>& some) {
       for (const Posting& posting : some) frequencies->Add(posting.id, posting.frequency);
     });
-    return frequencies->Documents();
+    return;
   }
-  DocSet found;
-  CountContext context{schema_.Weights(), &found, frequencies};
+  CountContext context{schema_.Weights(), nullptr, frequencies};
   const IndexReader::Counting counting(reader_, &context);
   Statement rows = reader_->db().Prepare("SELECT quarry_count(body) FROM body WHERE body MATCH ?1");
   const std::string expression = PhraseExpression(term);
   rows.Bind(1, std::string_view(expression)).Run();
-  return found;
 }
 
 DocSet WordFinder::InLabels(const QueryTerm& term) {
@@ -75,7 +83,7 @@ DocSet WordFinder::MatchRows(const std::string& table, const std::string& expres
       reader_->db().Prepare("SELECT rowid FROM " + table + " WHERE " + table + " MATCH ?1");
   rows.Bind(1, std::string_view(expression));
   while (rows.Step()) {
-    if (rows.Int(0) <= names_.last_id()) found.Add(rows.Int(0));
+    if (rows.Int(0) <= last_id_) found.Add(rows.Int(0));
   }
   return found;
 }

@@ -3,6 +3,7 @@
 #ifndef QUARRY_DAEMONS_TARNELASTICD_WORD_FINDER_H_
 #define QUARRY_DAEMONS_TARNELASTICD_WORD_FINDER_H_
 
+#include <cstdint>
 #include <string>
 
 #include "daemons/tarnelasticd/doc_set.h"
@@ -32,13 +33,13 @@ class WordFinder {
   // Those whose folded file name is, or where `before_dot` begins before a dot with, `name`.
   DocSet ByWholeName(const std::string& name, bool before_dot);
 
-  double AverageTextLength() { return body_.AverageLength(); }
-
  private:
+  void CountTexts(const QueryTerm& term, Frequencies* frequencies);
   DocSet MatchRows(const std::string& table, const std::string& expression);
 
   const Schema& schema_;
   IndexReader* reader_;
+  const std::int64_t last_id_;
   PostingLists body_;
   PostingLists labels_;
   PostingLists names_;

@@ -135,6 +135,12 @@ class SearchModelTest : public EngineTest, public testing::WithParamInterface<un
     file.is_dir = Chance(6);
     if (!file.is_dir) file.text = RandomText(8);
     if (Chance(4)) file.title = RandomText(3);
+    // A copy of another, as a folder has it that was copied.
+    if (!file.is_dir && !files_.empty() && Chance(2)) {
+      const auto other = std::next(files_.begin(), static_cast<int>(Number(files_.size())));
+      file.text = other->second.text;
+      file.title = other->second.title;
+    }
     return file;
   }
   static Json::Value DocumentOf(const File& file) {

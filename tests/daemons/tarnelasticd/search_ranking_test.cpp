@@ -33,6 +33,7 @@ class SearchRankingTest : public EngineTest, public testing::WithParamInterface<
   std::size_t Number(std::size_t below) {
     return std::uniform_int_distribution<std::size_t>(0, below - 1)(random_);
   }
+  std::ptrdiff_t Jump(std::size_t below) { return static_cast<std::ptrdiff_t>(Number(below)); }
   // The first words are the most frequent.
   std::string Word() { return kWords[Number(1 + Number(1 + Number(kWords.size())))]; }
   std::vector<std::string> Words(std::size_t most) {
@@ -46,6 +47,12 @@ class SearchRankingTest : public EngineTest, public testing::WithParamInterface<
     const std::string path = "/s/" + file.name;
     file.text = Words(Number(20) == 0 ? 500 : 30);
     if (Number(4) == 0) file.title = Words(4);
+    // Some have the texts of another.
+    if (!files_.empty() && Number(3) == 0) {
+      const File& other = std::next(files_.begin(), Jump(files_.size()))->second;
+      file.text = other.text;
+      file.title = other.title;
+    }
     Json::Value document = FileDocument(path, Join(file.text));
     if (!file.title.empty()) document["TARNMDTitle"] = Join(file.title);
     Upsert(document);
