@@ -27,6 +27,7 @@ function(quarry_test source)
   target_link_libraries(${name} PRIVATE quarry_flags test_support ${ARGN} GTest::gmock GTest::gtest)
   set_target_properties(${name} PROPERTIES RUNTIME_OUTPUT_DIRECTORY ${PROJECT_BINARY_DIR}/tests)
   gtest_discover_tests(${name} TEST_PREFIX "${name}/" DISCOVERY_MODE PRE_TEST
+                       NO_PRETTY_VALUES  # so that no name holds what differs from run to run
                        PROPERTIES TIMEOUT 300)
 endfunction()
 

@@ -183,6 +183,10 @@ struct BadReply {
   const char* shown;  // how the reason shows it
 };
 
+void PrintTo(const BadReply& bad, std::ostream* out) {
+  *out << bad.reply;
+}
+
 class CommBadReplyTest : public CommTest, public ::testing::WithParamInterface<BadReply> {};
 
 TEST_P(CommBadReplyTest, IsATransportFailure) {
@@ -221,6 +225,10 @@ struct BadRefusal {
   const char* reply;
   const char* reason;
 };
+
+void PrintTo(const BadRefusal& bad, std::ostream* out) {
+  *out << bad.reply;
+}
 
 class CommBadRefusalTest : public CommTest, public ::testing::WithParamInterface<BadRefusal> {};
 

@@ -27,6 +27,7 @@
 #include "tests/fake_platform/fixture.h"
 #include "tests/support/files.h"
 #include "tests/support/temp_dir.h"
+#include "tests/support/thrown.h"
 
 namespace {
 
@@ -51,20 +52,10 @@ namespace quarry::fileindex {
 namespace {
 
 using std::chrono::seconds;
+using test::Thrown;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 using ::testing::SizeIs;
-
-template <typename Call>
-Error Thrown(Call call) {
-  try {
-    call();
-  } catch (const Error& error) {
-    return error;
-  }
-  ADD_FAILURE() << "nothing thrown";
-  return Error(0);
-}
 
 std::string Reason(const char* call, int error_number) {
   return std::string(call) + " failed, reason=" + strerror(error_number);

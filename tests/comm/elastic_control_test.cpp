@@ -10,10 +10,12 @@
 #include "fileindex/config/status_mgr.h"
 #include "tests/fake_platform/fixture.h"
 #include "tests/support/files.h"
+#include "tests/support/thrown.h"
 
 namespace quarry::fileindex::elastic {
 namespace {
 
+using test::Thrown;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 using ::testing::SizeIs;
@@ -32,18 +34,6 @@ class ElasticControlTest : public fake::FakePlatformTest {
   }
 
   static void Reply(const std::string& text) { fake::QueueReply(text); }
-
-  // Runs `call` and returns what it throws.
-  template <typename Call>
-  static Error Thrown(Call call) {
-    try {
-      call();
-    } catch (const Error& error) {
-      return error;
-    }
-    ADD_FAILURE() << "nothing thrown";
-    return Error(0);
-  }
 
   // Expects that exactly this was sent, whatever the order of members.
   static void ExpectSent(const std::string& request) {

@@ -113,7 +113,8 @@ const FieldMapping kFields[] = {
     {"TARNMDSpotlightBoost", kNames},
 };
 
-INSTANTIATE_TEST_SUITE_P(Table, FieldMappingTest, ::testing::ValuesIn(kFields));
+INSTANTIATE_TEST_SUITE_P(Table, FieldMappingTest, ::testing::ValuesIn(kFields),
+                         [](const auto& mapping) { return std::string(mapping.param.field); });
 
 TEST(IndexMappingsTest, ThereIsNoOtherField) {
   EXPECT_EQ(GetFileIndexMappings()["properties"].size(), std::size(kFields));

@@ -12,9 +12,12 @@
 
 #include "common/error.h"
 #include "tests/fake_platform/fixture.h"
+#include "tests/support/thrown.h"
 
 namespace quarry {
 namespace {
+
+using test::FailureOf;
 
 Json::Value Doc(const std::string& text) {
   Json::Value value;
@@ -22,21 +25,11 @@ Json::Value Doc(const std::string& text) {
   return value;
 }
 
-// The code and the reason of what `call` throws, or "none".
-std::string Thrown(const std::function<void()>& call) {
-  try {
-    call();
-  } catch (const Error& error) {
-    return std::to_string(error.code()) + " " + error.reason();
-  }
-  return "none";
-}
-
 template <typename T>
 std::string Required(const std::string& text, const std::string& key = "a") {
   const Json::Value json = Doc(text);
   T out{};
-  return Thrown([&] { GetJsonValue<T>(out, json, key, true); });
+  return FailureOf([&] { GetJsonValue<T>(out, json, key, true); });
 }
 
 // What an optional read leaves in a variable that held `before`.
@@ -269,13 +262,13 @@ TEST_F(JsonTest, ValuesAreConverted) {
 
 TEST_F(JsonTest, LibraryExceptionsOfAConversionBecomeErrors) {
   const std::string reason = "120 Not a string, data=";
-  EXPECT_EQ(Thrown([] { asJsonType<std::string>(Doc("[1]")); }), reason + "[1]");
-  EXPECT_EQ(Thrown([] { asJsonType<bool>(Doc("\"x\"")); }), reason + "\"x\"");
-  EXPECT_EQ(Thrown([] { asJsonType<int>(Doc("1e10")); }), reason + "10000000000.0");
-  EXPECT_EQ(Thrown([] { asJsonType<unsigned int>(Doc("-1")); }), reason + "-1");
-  EXPECT_EQ(Thrown([] { asJsonType<long long>(Doc("18446744073709551615")); }),
+  EXPECT_EQ(FailureOf([] { asJsonType<std::string>(Doc("[1]")); }), reason + "[1]");
+  EXPECT_EQ(FailureOf([] { asJsonType<bool>(Doc("\"x\"")); }), reason + "\"x\"");
+  EXPECT_EQ(FailureOf([] { asJsonType<int>(Doc("1e10")); }), reason + "10000000000.0");
+  EXPECT_EQ(FailureOf([] { asJsonType<unsigned int>(Doc("-1")); }), reason + "-1");
+  EXPECT_EQ(FailureOf([] { asJsonType<long long>(Doc("18446744073709551615")); }),
             reason + "18446744073709551615");
-  EXPECT_EQ(Thrown([] { asJsonType<double>(Doc("{}")); }), reason + "{}");
+  EXPECT_EQ(FailureOf([] { asJsonType<double>(Doc("{}")); }), reason + "{}");
 }
 
 // ---- GetJsonValue
@@ -317,7 +310,7 @@ TYPED_TEST(GetJsonValueTest, NoObjectIsAnErrorEvenForAnOptionalKey) {
     for (const bool required : {true, false}) {
       TypeParam out{};
       const Json::Value json = Doc(text);
-      EXPECT_EQ(Thrown([&] { GetJsonValue<TypeParam>(out, json, "a", required); }),
+      EXPECT_EQ(FailureOf([&] { GetJsonValue<TypeParam>(out, json, "a", required); }),
                 "120 Not an object, data=" + text);
     }
   }
@@ -329,7 +322,7 @@ TYPED_TEST(GetJsonValueTest, AbsentKeyIsAnErrorOnlyWhenRequired) {
     TypeParam out{};
     const TypeParam before = out;
     const Json::Value json = Doc(text);
-    EXPECT_EQ(Thrown([&] { GetJsonValue<TypeParam>(out, json, "a", false); }), "none");
+    EXPECT_EQ(FailureOf([&] { GetJsonValue<TypeParam>(out, json, "a", false); }), "");
     EXPECT_EQ(out, before);
   }
 }
@@ -344,7 +337,7 @@ TEST_F(JsonTest, WrongTypeReportsOneMessageForAllTypes) {
     EXPECT_EQ(Required<unsigned int>(text), reason + text);
     EXPECT_EQ(Required<long long>(text), reason + text);
     EXPECT_EQ(Required<double>(text), reason + text);
-    EXPECT_EQ(Required<Json::Value>(text), "none");
+    EXPECT_EQ(Required<Json::Value>(text), "");
   }
   EXPECT_EQ(Required<int>("{\"a\":\"5\"}"), reason + "{\"a\":\"5\"}");
   EXPECT_EQ(Required<bool>("{\"a\":\"true\"}"), reason + "{\"a\":\"true\"}");
@@ -369,7 +362,7 @@ TEST_F(JsonTest, IntegerBeyondLongLongIsAnErrorThatShowsTheDocument) {
   const std::string text = "{\"a\":18446744073709551615}";
   EXPECT_EQ(Required<long long>(text), "120 Not a string, data=" + text);
   long long out = 3;
-  EXPECT_EQ(Thrown([&] { GetJsonValue(out, Doc(text), "a", false); }),
+  EXPECT_EQ(FailureOf([&] { GetJsonValue(out, Doc(text), "a", false); }),
             "120 Not a string, data=" + text);
   EXPECT_EQ(out, 3);
 }
@@ -406,8 +399,8 @@ TEST_F(JsonTest, NothingIsLogged) {
 
 std::string Merged(const std::string& target, const std::string& changes) {
   Json::Value value = Doc(target);
-  const std::string thrown = Thrown([&] { JsonApplyChanges(value, Doc(changes)); });
-  return thrown == "none" ? toString(value) : thrown;
+  const std::string failure = FailureOf([&] { JsonApplyChanges(value, Doc(changes)); });
+  return failure.empty() ? toString(value) : failure;
 }
 
 TEST_F(JsonTest, ChangesAreMerged) {
@@ -499,7 +492,7 @@ TEST_F(JsonTest, MergingEqualsTheNaiveRuleOnRandomDocuments) {
     } catch (const Json::Exception&) {
       naive_fails = true;
     }
-    EXPECT_EQ(Thrown([&] { JsonApplyChanges(actual, changes); }) != "none", naive_fails);
+    EXPECT_EQ(FailureOf([&] { JsonApplyChanges(actual, changes); }) != "", naive_fails);
     EXPECT_EQ(actual, expected) << before << changes;
     if (!naive_fails) ++merged;
   }

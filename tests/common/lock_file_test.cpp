@@ -20,23 +20,17 @@
 #include "tests/fake_platform/fixture.h"
 #include "tests/support/files.h"
 #include "tests/support/temp_dir.h"
+#include "tests/support/thrown.h"
 
 namespace quarry {
 namespace {
 
-std::string Thrown(const std::function<void()>& call) {
-  try {
-    call();
-  } catch (const Error& error) {
-    return std::to_string(error.code()) + " " + error.reason();
-  }
-  return "none";
-}
+using test::FailureOf;
 
 class LockFileTest : public fake::FakePlatformTest {
  protected:
   std::string Take(bool exclusive) {
-    return Thrown([&] { LockFile lock(path_, exclusive); });
+    return FailureOf([&] { LockFile lock(path_, exclusive); });
   }
 
   test::TempDir dir_;
@@ -53,20 +47,20 @@ TEST_F(LockFileTest, MissingFileIsCreated) {
 
 TEST_F(LockFileTest, ContentOfTheFileIsKept) {
   test::WriteFile(path_, "text");
-  EXPECT_EQ(Take(true), "none");
+  EXPECT_EQ(Take(true), "");
   EXPECT_EQ(test::ReadFile(path_), "text");
 }
 
 TEST_F(LockFileTest, ReadOnlyFileCanBeLocked) {
   test::WriteFile(path_, "");
   ASSERT_EQ(chmod(path_.c_str(), 0444), 0);
-  EXPECT_EQ(Take(true), "none");
+  EXPECT_EQ(Take(true), "");
 }
 
 TEST_F(LockFileTest, MissingDirectoryIsAnErrorAtOnce) {
   const std::string path = dir_ / "none/lock";
   const std::string reason = "open failed, path=" + path + ", reason=No such file or directory";
-  EXPECT_EQ(Thrown([&] { LockFile lock(path, true); }), "506 " + reason);
+  EXPECT_EQ(FailureOf([&] { LockFile lock(path, true); }), "506 " + reason);
   EXPECT_EQ(fake::Logs(),
             std::vector<std::string>(
                 {fake::LogHead("lock_file", 15, "LockFile") +
@@ -86,7 +80,7 @@ TEST_F(LockFileTest, OpenFailureDuringTheRetriesEndsThem) {
 
 TEST_F(LockFileTest, PathWithNulByteIsRefused) {
   const std::string path = path_ + std::string("\0x", 2);
-  EXPECT_EQ(Thrown([&] { LockFile lock(path, true); }),
+  EXPECT_EQ(FailureOf([&] { LockFile lock(path, true); }),
             "506 open failed, path=" + path + ", reason=Invalid argument");
   EXPECT_FALSE(std::filesystem::exists(path_));
 }
@@ -152,13 +146,13 @@ TEST_F(LockFileTest, LockIsTakenOnceItIsFree) {
   fake::OnSleep([&](std::chrono::microseconds) {
     if (fake::Sleeps().size() == 63) holder.reset();
   });
-  EXPECT_EQ(Take(true), "none");
+  EXPECT_EQ(Take(true), "");
   EXPECT_EQ(fake::Sleeps().size(), 63u);
 }
 
 TEST_F(LockFileTest, InterruptedLockIsTriedAgain) {
   fake::FailSystemCall("flock", 1, EINTR);
-  EXPECT_EQ(Take(true), "none");
+  EXPECT_EQ(Take(true), "");
   EXPECT_EQ(fake::Sleeps().size(), 1u);
 }
 
@@ -167,7 +161,7 @@ TEST_F(LockFileTest, OtherErrorOfTheLockIsThrownAtOnceWithoutALogLine) {
   EXPECT_EQ(Take(true), "506 No locks available");
   EXPECT_TRUE(fake::Sleeps().empty());
   EXPECT_TRUE(fake::Logs().empty());
-  EXPECT_EQ(Take(true), "none");
+  EXPECT_EQ(Take(true), "");
 }
 
 TEST_F(LockFileTest, DescriptorIsNotInheritedByPrograms) {
@@ -197,7 +191,7 @@ TEST_F(LockFileTest, LockIsGivenUpThoughAProcessKeepsACopyOfTheDescriptor) {
   }
   ::close(finish[0]);
   lock.reset();
-  EXPECT_EQ(Take(true), "none");
+  EXPECT_EQ(Take(true), "");
   ::close(finish[1]);
   int status = 0;
   ASSERT_EQ(waitpid(child, &status, 0), child);
@@ -237,7 +231,7 @@ TEST_F(LockFileTest, FileThatAlwaysVanishesIsGivenUp) {
 TEST_F(LockFileTest, LockFileMayBeALink) {
   std::filesystem::create_symlink(dir_ / "real", path_);
   LockFile lock(path_, true);
-  EXPECT_EQ(Thrown([&] { LockFile other(dir_ / "real", true); }),
+  EXPECT_EQ(FailureOf([&] { LockFile other(dir_ / "real", true); }),
             "506 Exceed max retry, path=" + (dir_ / "real"));
 }
 
@@ -272,13 +266,13 @@ TEST_F(LockFileTest, LockOfAnotherProcessExcludes) {
   ::close(finish[0]);
   char byte = 0;
   ASSERT_EQ(read(ready[0], &byte, 1), 1);
-  EXPECT_EQ(Take(false), "none");
+  EXPECT_EQ(Take(false), "");
   EXPECT_EQ(Take(true), "506 Exceed max retry, path=" + path_);
   ::close(finish[1]);
   int status = 0;
   ASSERT_EQ(waitpid(child, &status, 0), child);
   EXPECT_EQ(status, 0);
-  EXPECT_EQ(Take(true), "none");
+  EXPECT_EQ(Take(true), "");
   ::close(ready[0]);
 }
 

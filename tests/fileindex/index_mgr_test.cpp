@@ -15,10 +15,12 @@
 #include "tests/fake_platform/fixture.h"
 #include "tests/fileindex/index_daemon.h"
 #include "tests/support/files.h"
+#include "tests/support/thrown.h"
 
 namespace quarry::fileindex {
 namespace {
 
+using test::FailureOf;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 
@@ -38,16 +40,6 @@ class IndexMgrTest : public fake::FakePlatformTest {
     for (const Folder& folder : folders) list.append(folder.GetData());
     test::WriteFile(kFileIndexFoldersCfgPath, toString(list));
   }
-  // The failure of `action`, as "code reason"; "" when it does not fail.
-  static std::string FailureOf(const std::function<void()>& action) {
-    try {
-      action();
-    } catch (const Error& error) {
-      return std::to_string(error.code()) + " " + error.reason();
-    }
-    return "";
-  }
-
   const std::string volume_ = test::TestRoot() + "/volume1";
 };
 

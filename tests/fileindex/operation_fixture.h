@@ -29,6 +29,7 @@
 #include "tests/fileindex/effects.h"
 #include "tests/fileindex/index_daemon.h"
 #include "tests/support/files.h"
+#include "tests/support/thrown.h"
 
 namespace quarry::fileindex {
 
@@ -108,12 +109,7 @@ class OperationTest : public fake::FakePlatformTest {
   // The failure of an operation, as "code reason"; "" when it does not fail. The lock is free in
   // either case.
   static std::string FailureOf(const Action& operation) {
-    std::string failure;
-    try {
-      operation();
-    } catch (const Error& error) {
-      failure = std::to_string(error.code()) + " " + error.reason();
-    }
+    const std::string failure = test::FailureOf(operation);
     const int fd = open(kFolderLock.c_str(), O_RDONLY | O_CLOEXEC);
     if (fd >= 0) {
       EXPECT_EQ(flock(fd, LOCK_EX | LOCK_NB), 0);

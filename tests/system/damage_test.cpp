@@ -42,24 +42,17 @@ class DamageTest : public testing::Test {
                 "capybara number " + std::to_string(i));
     }
     system_.Start();
-    Run({"share", "add", docs_});
-    Run({"folder", "add", "/docs"});
-    ASSERT_TRUE(system_.WaitUntilIdle());
+    system_.IndexShare(docs_);
   }
   void TearDown() override { system_.Stop(); }
 
-  std::string Run(const std::vector<std::string>& arguments) {
-    const Ran ran = system_.Quarry(arguments);
-    EXPECT_EQ(ran.end, "exit code 0") << ran.output;
-    return ran.output;
-  }
   // What the doctor says when it could mend everything; it has nothing to say thereafter.
   std::string Mended() {
     const Ran look = system_.Quarry({"doctor", "--check"});
     EXPECT_EQ(look.end, "exit code 1") << look.output;
-    const std::string output = Run({"doctor"});
+    const std::string output = system_.Run({"doctor"});
     EXPECT_TRUE(Contains(output, "mended: ")) << output;
-    EXPECT_EQ(Run({"doctor", "--check"}), "All is well.\n");
+    EXPECT_EQ(system_.Run({"doctor", "--check"}), "All is well.\n");
     return output;
   }
   // What the doctor has to leave to somebody.
@@ -76,7 +69,7 @@ class DamageTest : public testing::Test {
   }
 
   void ExpectWhole() {
-    ASSERT_TRUE(system_.WaitUntilIdle()) << system_.Quarry({"status"}).output;
+    ASSERT_TRUE(system_.WaitUntilIdle());
     EXPECT_TRUE(WaitUntil([&] { return IsWhole(); }));
     EXPECT_TRUE(StatusSays("up to date"));
   }
@@ -124,15 +117,15 @@ class DamageTest : public testing::Test {
 };
 
 TEST_F(DamageTest, AHealthySystemIsLeftAlone) {
-  EXPECT_EQ(Run({"doctor", "--check"}), "All is well.\n");
-  EXPECT_EQ(Run({"doctor"}), "All is well.\n");
+  EXPECT_EQ(system_.Run({"doctor", "--check"}), "All is well.\n");
+  EXPECT_EQ(system_.Run({"doctor"}), "All is well.\n");
   const Json::Value report = system_.QuarryJson({"doctor"});
   EXPECT_TRUE(report["well"].asBool());
   EXPECT_TRUE(report["findings"].isArray() && report["findings"].empty());
 }
 
 TEST_F(DamageTest, AnIndexWhoseFileIsOverwritten) {
-  Run({"pause"});
+  system_.Run({"pause"});
   system_.Stop();
   WriteFile(Database(), std::string(20'000, 'x'));
   system_.Start();
@@ -140,7 +133,7 @@ TEST_F(DamageTest, AnIndexWhoseFileIsOverwritten) {
   EXPECT_TRUE(StatusSays("The index of the share docs cannot be used"));
   EXPECT_TRUE(StatusSays("quarry doctor"));
   Mended();
-  Run({"resume"});
+  system_.Run({"resume"});
   ExpectWhole();
 }
 
@@ -149,14 +142,14 @@ TEST_F(DamageTest, AnIndexWithBadPages) {
   // All but the list of tables.
   std::string pages = ReadFile(Database());
   for (std::size_t at = 4096; at < pages.size(); ++at) pages[at] = '\x55';
-  Run({"pause"});
+  system_.Run({"pause"});
   WriteFile(Database(), pages);
   system_.Start();
   // Nobody has read them yet.
   const std::string output = Mended();
   EXPECT_TRUE(Contains(output, "The index of the share docs is damaged")) << output;
   EXPECT_EQ(fileindex::StatusMgr().GetShareStatus("docs"), 0);
-  Run({"resume"});
+  system_.Run({"resume"});
   ExpectWhole();
 }
 
@@ -175,24 +168,24 @@ TEST_F(DamageTest, AnIndexThatIsCutOffOrRemovedIsMadeAnewByItself) {
 }
 
 TEST_F(DamageTest, ARebuildThatWasCutShortIsEnded) {
-  Run({"pause"});
+  system_.Run({"pause"});
   fileindex::StatusMgr().SetShareStatus(
       "docs", fileindex::kShareNeedReindex | fileindex::kShareNeedRebuild);
   const std::string output = Mended();
   EXPECT_TRUE(Contains(output, "is marked as to be made anew")) << output;
-  Run({"resume"});
+  system_.Run({"resume"});
   ExpectWhole();
 }
 
 TEST_F(DamageTest, APausedShareStaysPaused) {
-  Run({"share", "pause", "docs"});
+  system_.Run({"share", "pause", "docs"});
   system_.Stop();
   Unlink(Database());
   system_.Start();
   Mended();
   const Json::Value nothing(Json::objectValue);
   EXPECT_TRUE(cli::AskEngine("engine_status", nothing)["indexes"][0]["paused"].asBool());
-  Run({"share", "resume", "docs"});
+  system_.Run({"share", "resume", "docs"});
   ExpectWhole();
 }
 
@@ -223,11 +216,11 @@ TEST_F(DamageTest, AnEngineThatCannotReadItsListIsStartedAgain) {
   EXPECT_TRUE(Contains(ran.output, path + ".damaged-")) << ran.output;
   ASSERT_TRUE(WaitUntil([] { return daemon::IsListening(cli::EngineSocket()); }));
   ExpectWhole();
-  EXPECT_EQ(Run({"doctor"}), "All is well.\n");
+  EXPECT_EQ(system_.Run({"doctor"}), "All is well.\n");
 }
 
 TEST_F(DamageTest, GarbageInAQueueThatWaits) {
-  Run({"share", "pause", "docs"});
+  system_.Run({"share", "pause", "docs"});
   WriteFile(docs_ + "/d0/new.txt", "armadillo");
   WriteFile(docs_ + "/d1/new.txt", "armadillo");
   const std::string good = R"({"event":64,"path":")" + docs_ + "/d0/new.txt\"}\n";
@@ -237,8 +230,8 @@ TEST_F(DamageTest, GarbageInAQueueThatWaits) {
   EXPECT_FALSE(system_.Quarry({"folder", "reindex", "/docs/d1"}).end == "exit code 0");
   Mended();
   EXPECT_TRUE(Contains(ReadFile(Queue()), good));
-  Run({"folder", "reindex", "/docs/d1"});
-  Run({"share", "resume", "docs"});
+  system_.Run({"folder", "reindex", "/docs/d1"});
+  system_.Run({"share", "resume", "docs"});
   ExpectWhole();
 }
 
@@ -261,7 +254,7 @@ TEST_F(DamageTest, AFullDiskIsWaitedFor) {
   for (int i = 0; i < 20; ++i) {
     WriteFile(docs_ + "/new/" + std::to_string(i) + ".txt", "armadillo");
   }
-  Run({"folder", "reindex", "/docs"});
+  system_.Run({"folder", "reindex", "/docs"});
   EXPECT_TRUE(StatusSays("will try again"));
   EXPECT_TRUE(LogSays("Share docs cannot be indexed now: "));
   EXPECT_EQ(system_.Pid("tarnelasticd"), engine);
@@ -283,7 +276,7 @@ TEST_F(DamageTest, AShareThatVanishesAndComesBack) {
   EXPECT_EQ(system_.QuarryJson({"search", "capybara"})["total"].asInt(), 40);
   std::filesystem::rename(elsewhere, docs_);
   ExpectWhole();
-  EXPECT_EQ(Run({"doctor"}), "All is well.\n");
+  EXPECT_EQ(system_.Run({"doctor"}), "All is well.\n");
 }
 
 TEST_F(DamageTest, AShareThatNobodyKnowsAnyMoreIsNamedWithItsPlace) {
@@ -291,19 +284,19 @@ TEST_F(DamageTest, AShareThatNobodyKnowsAnyMoreIsNamedWithItsPlace) {
   const std::string output = Left();
   EXPECT_TRUE(Contains(output, "quarry share add " + docs_)) << output;
   EXPECT_TRUE(Contains(output, "quarry share clear docs " + docs_)) << output;
-  Run({"share", "add", docs_});
+  system_.Run({"share", "add", docs_});
   ExpectWhole();
-  EXPECT_EQ(Run({"doctor"}), "All is well.\n");
+  EXPECT_EQ(system_.Run({"doctor"}), "All is well.\n");
 }
 
 TEST_F(DamageTest, AFolderThatIsGoneIsNamed) {
   WriteFile(docs_ + "/sub/x.txt", "x");
-  Run({"folder", "add", "/docs/sub"});
+  system_.Run({"folder", "add", "/docs/sub"});
   ASSERT_TRUE(system_.WaitUntilIdle());
   RemoveTree(docs_ + "/sub");
   EXPECT_TRUE(Contains(Left(), "quarry folder delete /docs/sub"));
-  Run({"folder", "delete", "/docs/sub"});
-  EXPECT_EQ(Run({"doctor"}), "All is well.\n");
+  system_.Run({"folder", "delete", "/docs/sub"});
+  EXPECT_EQ(system_.Run({"doctor"}), "All is well.\n");
 }
 
 TEST_F(DamageTest, WhatIsToBeWatchedIsRegisteredAnew) {

@@ -41,10 +41,7 @@ class FirstLightTest : public testing::Test {
 
   void IndexAll() {
     system_.Start();
-    EXPECT_EQ(system_.Quarry({"share", "add", docs_}).end, "exit code 0");
-    const Ran added = system_.Quarry({"folder", "add", "/docs"});
-    ASSERT_EQ(added.end, "exit code 0") << added.output;
-    ASSERT_TRUE(system_.WaitUntilIdle());
+    system_.IndexShare(docs_);
   }
 
   using Names = std::vector<std::string>;

@@ -27,17 +27,10 @@ class OperationsTest : public testing::Test {
   void TearDown() override { system_.Stop(); }
 
   void IndexDocs() {
-    Run({"share", "add", docs_});
-    Run({"folder", "add", "/docs"});
-    ASSERT_TRUE(system_.WaitUntilIdle());
+    system_.IndexShare(docs_);
     ASSERT_EQ(Found("capybara"), 2);
   }
 
-  std::string Run(const std::vector<std::string>& arguments) {
-    const Ran ran = system_.Quarry(arguments);
-    EXPECT_EQ(ran.end, "exit code 0") << ran.output;
-    return ran.output;
-  }
   // Whether the command is refused with these words, and nothing else but them on its line.
   bool Refuses(const std::vector<std::string>& arguments, const std::string& words) {
     const Ran ran = system_.Quarry(arguments);
@@ -84,7 +77,7 @@ TEST_F(OperationsTest, ReindexFindsWhatChanged) {
   EXPECT_EQ(done["paths"][0], "/docs/a");
   ASSERT_TRUE(system_.WaitUntilIdle());
   EXPECT_EQ(Found("armadillo"), 1);
-  Run({"folder", "reindex", "/docs/a", docs_ + "/b"});
+  system_.Run({"folder", "reindex", "/docs/a", docs_ + "/b"});
   ASSERT_TRUE(system_.WaitUntilIdle());
   EXPECT_EQ(Found("armadillo"), 2);
 }
@@ -94,31 +87,31 @@ TEST_F(OperationsTest, ReindexMakesADoubtfulIndexAnew) {
   fileindex::StatusMgr().SetShareStatus(
       "docs", fileindex::kShareNeedReindex | fileindex::kShareNeedRebuild);
   EXPECT_TRUE(StatusSays("needs a reindex: quarry folder reindex /docs")) << Status();
-  Run({"folder", "reindex", "/docs"});
+  system_.Run({"folder", "reindex", "/docs"});
   ASSERT_TRUE(system_.WaitUntilIdle());
   EXPECT_TRUE(StatusSays("up to date")) << Status();
   EXPECT_EQ(system_.Documents(docs_), Listing(docs_));
 }
 
 TEST_F(OperationsTest, ReindexRefusesPlacesOutsideOfFolders) {
-  Run({"share", "add", docs_});
+  system_.Run({"share", "add", docs_});
   EXPECT_TRUE(Refuses({"folder", "reindex", "/docs"}, "quarry folder add /docs"));
-  Run({"folder", "add", "/docs/a"});
+  system_.Run({"folder", "add", "/docs/a"});
   EXPECT_TRUE(Refuses({"folder", "reindex", "/docs/b"}, "lies in no indexed folder"));
-  Run({"folder", "reindex", "/docs"});
+  system_.Run({"folder", "reindex", "/docs"});
   EXPECT_TRUE(Refuses({"folder", "reindex", "/nowhere/x"}, "no share named \"nowhere\""));
 }
 
 TEST_F(OperationsTest, DeletedFoldersAreNotFoundAnyLonger) {
-  Run({"share", "add", docs_});
-  Run({"folder", "add", "/docs/a"});
-  Run({"folder", "add", "/docs/b"});
+  system_.Run({"share", "add", docs_});
+  system_.Run({"folder", "add", "/docs/a"});
+  system_.Run({"folder", "add", "/docs/b"});
   ASSERT_TRUE(system_.WaitUntilIdle());
-  Run({"folder", "delete", "/docs/a"});
+  system_.Run({"folder", "delete", "/docs/a"});
   EXPECT_TRUE(WaitUntil([&] { return Found("capybara") == 1; }));
   EXPECT_TRUE(Refuses({"folder", "delete", "/docs/a"}, "No such folder is indexed"));
   EXPECT_TRUE(Refuses({"share", "remove", "docs"}, "quarry folder delete /docs/b"));
-  Run({"folder", "delete", "/docs/b"});
+  system_.Run({"folder", "delete", "/docs/b"});
   ExpectGone();
   const Json::Value done = system_.QuarryJson({"share", "remove", "docs"});
   EXPECT_EQ(done["path"], docs_);
@@ -129,12 +122,12 @@ TEST_F(OperationsTest, DeletedFoldersAreNotFoundAnyLonger) {
 TEST_F(OperationsTest, APausedShareAnswersAndTakesNothing) {
   IndexDocs();
   ASSERT_TRUE(system_.StopMonitor());
-  Run({"share", "pause", "docs"});
+  system_.Run({"share", "pause", "docs"});
   EXPECT_TRUE(EngineIndexes()[0]["paused"].asBool());
   EXPECT_EQ(system_.Registrations(), 0);
   EXPECT_TRUE(StatusSays("paused")) << Status();
   WriteFile(docs_ + "/a/new.txt", "armadillo");
-  Run({"folder", "reindex", "/docs/a"});
+  system_.Run({"folder", "reindex", "/docs/a"});
   EXPECT_EQ(Found("capybara"), 2);
   EXPECT_EQ(system_.QuarryJson({"queue", "show", "docs"}).size(), 1U);
   // Daemons that are started anew keep the pause, too.
@@ -147,7 +140,7 @@ TEST_F(OperationsTest, APausedShareAnswersAndTakesNothing) {
   EXPECT_TRUE(EngineIndexes()[0]["paused"].asBool());
   EXPECT_EQ(Found("armadillo"), 0);
   EXPECT_EQ(system_.QuarryJson({"queue", "show", "docs"}).size(), 1U);
-  Run({"share", "resume", "docs"});
+  system_.Run({"share", "resume", "docs"});
   ASSERT_TRUE(system_.WaitUntilIdle());
   EXPECT_EQ(Found("armadillo"), 1);
   EXPECT_EQ(system_.Registrations(), 1);
@@ -156,8 +149,8 @@ TEST_F(OperationsTest, APausedShareAnswersAndTakesNothing) {
 TEST_F(OperationsTest, AClearedShareIsGoneFromDisk) {
   IndexDocs();
   EXPECT_TRUE(Refuses({"share", "clear", "docs"}, "quarry share pause docs"));
-  Run({"share", "pause", "docs"});
-  Run({"folder", "reindex", "/docs/a"});
+  system_.Run({"share", "pause", "docs"});
+  system_.Run({"folder", "reindex", "/docs/a"});
   EXPECT_TRUE(Refuses({"share", "clear", "docs", "/elsewhere"}, "lives at"));
   const Json::Value done = system_.QuarryJson({"share", "clear", "docs"});
   EXPECT_EQ(done["state"], "cleared");
@@ -166,7 +159,7 @@ TEST_F(OperationsTest, AClearedShareIsGoneFromDisk) {
   EXPECT_TRUE(Refuses({"share", "clear", "docs"}, "Nothing of the share \"docs\" is indexed"));
   EXPECT_TRUE(Refuses({"share", "pause", "docs"}, "quarry folder add /docs"));
   EXPECT_TRUE(Refuses({"share", "resume", "nobody"}, "There is no share named \"nobody\""));
-  Run({"folder", "add", "/docs"});
+  system_.Run({"folder", "add", "/docs"});
   ASSERT_TRUE(system_.WaitUntilIdle());
   EXPECT_EQ(Found("capybara"), 2);
 }
@@ -176,21 +169,21 @@ TEST_F(OperationsTest, KilledAnywhereAndRunAgain) {
   for (int milliseconds = 0; milliseconds < 80; milliseconds += 8) {
     for (const char* command : {"pause", "resume"}) {
       system_.KillQuarry({"share", command, "docs"}, milliseconds);
-      Run({"share", command, "docs"});
+      system_.Run({"share", command, "docs"});
     }
   }
   ASSERT_TRUE(system_.WaitUntilIdle());
   EXPECT_EQ(system_.Documents(docs_), Listing(docs_));
   for (int milliseconds = 0; milliseconds < 80; milliseconds += 8) {
-    Run({"share", "pause", "docs"});
+    system_.Run({"share", "pause", "docs"});
     system_.KillQuarry({"share", "clear", "docs"}, milliseconds);
-    if (!StatusSays("No folder")) Run({"share", "clear", "docs"});
+    if (!StatusSays("No folder")) system_.Run({"share", "clear", "docs"});
     ExpectGone();
-    Run({"folder", "add", "/docs"});
+    system_.Run({"folder", "add", "/docs"});
     system_.KillQuarry({"folder", "delete", "/docs"}, milliseconds);
-    if (!StatusSays("No folder")) Run({"folder", "delete", "/docs"});
+    if (!StatusSays("No folder")) system_.Run({"folder", "delete", "/docs"});
     ExpectGone();
-    Run({"folder", "add", "/docs"});
+    system_.Run({"folder", "add", "/docs"});
   }
   ASSERT_TRUE(system_.WaitUntilIdle());
   EXPECT_EQ(system_.Documents(docs_), Listing(docs_));
@@ -201,7 +194,7 @@ TEST_F(OperationsTest, AShareThatHasVanishedIsClearedByItsPath) {
   WriteFile(TestRoot() + "/etc/quarry/shares.json", R"({"shares":[]})");
   EXPECT_TRUE(StatusSays("is not known any more")) << Status();
   EXPECT_TRUE(Refuses({"share", "clear", "docs"}, "Say where it lived"));
-  Run({"share", "clear", "docs", docs_});
+  system_.Run({"share", "clear", "docs", docs_});
   EXPECT_EQ(Count("index"), 0U);
   EXPECT_TRUE(StatusSays("No folder is indexed."));
 }
@@ -217,10 +210,10 @@ TEST_F(OperationsTest, VolumesPauseResumeAndAreDropped) {
   EXPECT_TRUE(EngineIndexes()[0]["paused"].asBool());
   EXPECT_EQ(Found("capybara"), 2);
   WriteFile(docs_ + "/a/new.txt", "armadillo");
-  Run({"volume", "resume", volume});
+  system_.Run({"volume", "resume", volume});
   ASSERT_TRUE(WaitUntil([&] { return Found("armadillo") == 1; }));
-  Run({"volume", "pause", volume});
-  Run({"volume", "clear", volume});
+  system_.Run({"volume", "pause", volume});
+  system_.Run({"volume", "clear", volume});
   ExpectGone();
   EXPECT_TRUE(Refuses({"volume", "clear", volume}, "No folder was paused"));
 }
@@ -233,7 +226,7 @@ TEST_F(OperationsTest, AllIndexingPausesForSomeHours) {
   EXPECT_LE(end, std::time(nullptr) + 8 * 3600);
   EXPECT_TRUE(StatusSays("Indexing is paused until 20")) << Status();
   WriteFile(docs_ + "/a/new.txt", "armadillo");
-  Run({"folder", "reindex", "/docs/a"});
+  system_.Run({"folder", "reindex", "/docs/a"});
   EXPECT_TRUE(StatusSays("paused")) << Status();
   EXPECT_EQ(Found("armadillo"), 0);
   EXPECT_EQ(system_.QuarryJson({"pause"})["resume_time"].asInt64(), 0);
@@ -247,9 +240,9 @@ TEST_F(OperationsTest, AllIndexingPausesForSomeHours) {
 }
 
 TEST_F(OperationsTest, APauseNeedsNoIndexDaemon) {
-  Run({"pause", "1"});
+  system_.Run({"pause", "1"});
   EXPECT_TRUE(StatusSays("Indexing is paused until"));
-  Run({"resume"});
+  system_.Run({"resume"});
   EXPECT_FALSE(StatusSays("paused"));
 }
 
@@ -257,9 +250,9 @@ TEST_F(OperationsTest, HomesAndAccounts) {
   const std::string homes = system_.Files() + "/homes";
   WriteFile(homes + "/first/notes.txt", "armadillo");
   EXPECT_TRUE(Refuses({"home", "enable"}, "There is no share named \"homes\""));
-  Run({"share", "add", homes});
+  system_.Run({"share", "add", homes});
   EXPECT_TRUE(Refuses({"user", "rename", "first", "second"}, "quarry folder add /homes"));
-  Run({"folder", "add", "/homes/first"});
+  system_.Run({"folder", "add", "/homes/first"});
   ASSERT_TRUE(system_.WaitUntilIdle());
   EXPECT_TRUE(Refuses({"user", "rename", "first", "second"}, "There is no home folder"));
   EXPECT_TRUE(Refuses({"user", "rename", "first", "../x"}, "is no account's name"));
@@ -270,7 +263,7 @@ TEST_F(OperationsTest, HomesAndAccounts) {
   EXPECT_EQ(system_.QuarryJson({"folder", "list"})["folder"][0]["path"], "/homes/second");
   const std::string monitor = TestRoot() + "/var/lib/quarry/monitor/";
   EXPECT_NE(ReadFile(monitor + ListDir(monitor).at(0)).find("/homes/second\""), std::string::npos);
-  Run({"home", "disable"});
+  system_.Run({"home", "disable"});
   EXPECT_EQ(system_.QuarryJson({"home", "enable", "--accounts", "ldap"})["accounts"], "ldap");
   EXPECT_EQ(system_.Quarry({"home", "enable", "--accounts", "all"}).end, "exit code 2");
 }

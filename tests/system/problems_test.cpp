@@ -18,9 +18,7 @@ class ProblemsTest : public testing::Test {
   void SetUp() override {
     WriteFile(docs_ + "/one.txt", "capybara");
     system_.Start();
-    ASSERT_EQ(system_.Quarry({"share", "add", docs_}).end, "exit code 0");
-    ASSERT_EQ(system_.Quarry({"folder", "add", "/docs"}).end, "exit code 0");
-    ASSERT_TRUE(system_.WaitUntilIdle());
+    system_.IndexShare(docs_);
   }
   void TearDown() override { system_.Stop(); }
 

@@ -67,6 +67,12 @@ Ran RunningSystem::Quarry(const std::vector<std::string>& arguments) const {
   return {ReadFile(output), *child.Ended()};
 }
 
+std::string RunningSystem::Run(const std::vector<std::string>& arguments) const {
+  const Ran ran = Quarry(arguments);
+  EXPECT_EQ(ran.end, "exit code 0") << ran.output;
+  return ran.output;
+}
+
 void RunningSystem::KillQuarry(const std::vector<std::string>& arguments, int milliseconds) const {
   cli::Child child(Program(), arguments, scratch_ / "killed.log");
   if (!child.WaitEnded(milliseconds)) child.Signal(SIGKILL);
@@ -89,18 +95,37 @@ Json::Value RunningSystem::QuarryJson(std::vector<std::string> arguments) const 
   return value;
 }
 
+void RunningSystem::IndexShare(const std::string& path) const {
+  Run({"share", "add", path});
+  Run({"folder", "add", "/" + Basename(path)});
+  ASSERT_TRUE(WaitUntilIdle());
+}
+
+bool RunningSystem::IsIdle() const {
+  const Ran ran = Quarry({"folder", "list", "--status", "--json"});
+  Json::Value list;
+  if (!fromString(list, ran.output) || ran.end != "exit code 0") return false;
+  return std::all_of(list["folder"].begin(), list["folder"].end(), [](const Json::Value& folder) {
+    return folder["additional"]["status"]["text"] == "finished";
+  });
+}
+
 bool RunningSystem::WaitUntilIdle() const {
-  return WaitUntil(
-      [this] {
-        const Ran ran = Quarry({"folder", "list", "--status", "--json"});
-        Json::Value list;
-        if (!fromString(list, ran.output) || ran.end != "exit code 0") return false;
-        for (const Json::Value& folder : list["folder"]) {
-          if (folder["additional"]["status"]["text"] != "finished") return false;
-        }
-        return true;
-      },
-      std::chrono::milliseconds(kPatience));
+  const bool idle = WaitUntil([this] { return IsIdle(); }, std::chrono::milliseconds(kPatience));
+  if (!idle) ADD_FAILURE() << WhatItWaitsFor();
+  return idle;
+}
+
+// All that tells an index that cannot be worked on from one that takes long.
+std::string RunningSystem::WhatItWaitsFor() const {
+  std::string text = Quarry({"status"}).output + Quarry({"status", "--json"}).output;
+  text +=
+      Quarry({"folder", "list", "--status", "--json"}).output + Quarry({"share", "list"}).output;
+  const std::string queues = TestRoot() + "/var/lib/quarry/queue";
+  for (const std::string& name : ListDir(queues)) {
+    text += name + ":\n" + ReadFile(queues + "/" + name);
+  }
+  return text + Log();
 }
 
 std::multiset<std::string> RunningSystem::Documents(const std::string& share_path) const {

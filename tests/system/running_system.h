@@ -43,12 +43,18 @@ class RunningSystem {
 
   // Runs quarry to its end, at most a minute.
   Ran Quarry(const std::vector<std::string>& arguments) const;
+  // The same for what is to succeed; returns what it printed.
+  std::string Run(const std::vector<std::string>& arguments) const;
   // Runs it and kills it after so many milliseconds, unless it has ended before.
   void KillQuarry(const std::vector<std::string>& arguments, int milliseconds) const;
   // The same as Quarry() with --json; the document it printed.
   Json::Value QuarryJson(std::vector<std::string> arguments) const;
 
+  // Makes the directory a share, the whole of it indexed, and waits until it is.
+  void IndexShare(const std::string& path) const;
+
   // Waits until no folder has anything waiting, at most a minute, and returns whether that came.
+  // Where it did not, the test fails with what the status says.
   bool WaitUntilIdle() const;
 
   // The paths of all documents in the index of the share, each as often as it is there.
@@ -68,6 +74,9 @@ class RunningSystem {
   const std::string& Files() const { return files_.path(); }
 
  private:
+  bool IsIdle() const;
+  std::string WhatItWaitsFor() const;
+
   TempDir files_;
   TempDir scratch_;
   std::optional<cli::Child> supervisor_;

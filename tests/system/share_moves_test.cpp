@@ -27,9 +27,7 @@ class ShareMovesTest : public testing::Test {
     for (int i = 0; i < kFiles; ++i) WriteFile(Path(i, docs_), "capybara");
     std::filesystem::create_directory(system_.Files() + "/other");
     system_.Start();
-    Run({"share", "add", docs_});
-    Run({"folder", "add", "/docs"});
-    ASSERT_TRUE(system_.WaitUntilIdle());
+    system_.IndexShare(docs_);
     ASSERT_EQ(Found("capybara"), kFiles);
     // The monitor would tell of what follows, and have it read.
     ASSERT_TRUE(system_.StopMonitor());
@@ -50,11 +48,6 @@ class ShareMovesTest : public testing::Test {
     ASSERT_EQ(utimensat(AT_FDCWD, path.c_str(), times, 0), 0);
   }
 
-  std::string Run(const std::vector<std::string>& arguments) {
-    const Ran ran = system_.Quarry(arguments);
-    EXPECT_EQ(ran.end, "exit code 0") << ran.output;
-    return ran.output;
-  }
   // The sentence with which a command is refused.
   std::string Refusal(const std::vector<std::string>& arguments) {
     const Ran ran = system_.Quarry(arguments);
@@ -96,22 +89,22 @@ TEST_F(ShareMovesTest, Renamed) {
   EXPECT_EQ(system_.QuarryJson({"folder", "list"})["folder"][0]["path"], "/papers");
   // What happens afterwards is seen.
   WriteFile(papers + "/new.txt", "armadillo");
-  Run({"folder", "reindex", "/papers"});
+  system_.Run({"folder", "reindex", "/papers"});
   ASSERT_TRUE(system_.WaitUntilIdle());
   EXPECT_EQ(Found("armadillo"), 1);
 }
 
 TEST_F(ShareMovesTest, RenamedAfterItsDirectory) {
   std::filesystem::rename(docs_, system_.Files() + "/papers");
-  Run({"share", "rename", "docs", "papers"});
+  system_.Run({"share", "rename", "docs", "papers"});
   ExpectArrived(system_.Files() + "/papers");
 }
 
 TEST_F(ShareMovesTest, WaitingWorkComesAlong) {
-  Run({"pause"});
+  system_.Run({"pause"});
   WriteFile(docs_ + "/d1/new.txt", "armadillo");
-  Run({"folder", "reindex", "/docs/d1"});
-  Run({"share", "rename", "docs", "papers"});
+  system_.Run({"folder", "reindex", "/docs/d1"});
+  system_.Run({"share", "rename", "docs", "papers"});
   const Json::Value waiting = system_.QuarryJson({"queue", "show", "papers"});
   bool carried = false;
   for (const Json::Value& entry : waiting) {
@@ -119,24 +112,24 @@ TEST_F(ShareMovesTest, WaitingWorkComesAlong) {
               (entry["operation"] == "reindex" && entry["path"] == system_.Files() + "/papers/d1");
   }
   EXPECT_TRUE(carried) << waiting.toStyledString();
-  Run({"resume"});
+  system_.Run({"resume"});
   ExpectArrived(system_.Files() + "/papers");
   EXPECT_EQ(Found("armadillo"), 1);
 }
 
 TEST_F(ShareMovesTest, APausedShareMovesToo) {
-  Run({"share", "pause", "docs"});
-  Run({"share", "rename", "docs", "papers"});
-  Run({"share", "migrate", "papers", system_.Files() + "/other"});
+  system_.Run({"share", "pause", "docs"});
+  system_.Run({"share", "rename", "docs", "papers"});
+  system_.Run({"share", "migrate", "papers", system_.Files() + "/other"});
   EXPECT_EQ(Found("capybara"), kFiles);
   EXPECT_EQ(system_.Registrations(), 0);
-  Run({"share", "resume", "papers"});
+  system_.Run({"share", "resume", "papers"});
   ExpectArrived(system_.Files() + "/other/papers");
 }
 
 TEST_F(ShareMovesTest, Migrated) {
   const std::string other = system_.Files() + "/other";
-  Run({"share", "migrate", "docs", other + "/"});
+  system_.Run({"share", "migrate", "docs", other + "/"});
   EXPECT_FALSE(IsDirExist(docs_, false));
   ExpectArrived(other + "/docs");
 }
@@ -147,7 +140,7 @@ TEST_F(ShareMovesTest, MigratedToACopy) {
   ASSERT_TRUE(copy.WaitEnded(60'000));
   EXPECT_NE(Refusal({"share", "migrate", "docs", other}).find("is there already"),
             std::string::npos);
-  Run({"share", "migrate", "docs", other, "--copied"});
+  system_.Run({"share", "migrate", "docs", other, "--copied"});
   EXPECT_TRUE(IsDirExist(docs_, false));
   ExpectArrived(other + "/docs");
 }
@@ -183,7 +176,7 @@ TEST_F(ShareMovesTest, KilledAnywhereAndRunAgain) {
     system_.KillQuarry({"share", "rename", from, to}, milliseconds);
     const bool done =
         platform::ReadShares()[0].name == to && platform::ReadShares()[0].moved_from.empty();
-    if (!done) Run({"share", "rename", from, to});
+    if (!done) system_.Run({"share", "rename", from, to});
     std::swap(from, to);
   }
   ExpectArrived(system_.Files() + "/" + from);
@@ -196,7 +189,7 @@ TEST_F(ShareMovesTest, MigrationKilledAnywhereAndRunAgain) {
     system_.KillQuarry({"share", "migrate", "docs", to}, milliseconds);
     const platform::ShareRecord share = platform::ReadShares()[0];
     if (share.path != to + "/docs" || !share.moved_from.empty()) {
-      Run({"share", "migrate", "docs", to});
+      system_.Run({"share", "migrate", "docs", to});
     }
     std::swap(from, to);
   }
@@ -207,25 +200,25 @@ TEST_F(ShareMovesTest, MigrationKilledAnywhereAndRunAgain) {
 // at the new place, everything else is not.
 TEST_F(ShareMovesTest, AMoveThatWasCutShortIsNamedAndEnded) {
   const std::string papers = system_.Files() + "/papers";
-  Run({"share", "pause", "docs"});
+  system_.Run({"share", "pause", "docs"});
   std::filesystem::rename(docs_, papers);
   platform::MoveShare("docs", papers);
   const std::string command = "quarry share rename docs papers";
-  EXPECT_NE(Run({"status"}).find(command), std::string::npos);
-  EXPECT_NE(Run({"share", "list"}).find(command), std::string::npos);
+  EXPECT_NE(system_.Run({"status"}).find(command), std::string::npos);
+  EXPECT_NE(system_.Run({"share", "list"}).find(command), std::string::npos);
   for (const char* word : {"pause", "remove"}) {
     EXPECT_NE(Refusal({"share", word, "papers"}).find(command), std::string::npos) << word;
   }
   EXPECT_NE(Refusal({"share", "rename", "papers", "more"}).find(command), std::string::npos);
-  Run({"share", "rename", "docs", "papers"});
-  Run({"share", "resume", "papers"});
+  system_.Run({"share", "rename", "docs", "papers"});
+  system_.Run({"share", "resume", "papers"});
   ExpectArrived(papers);
 }
 
 TEST_F(ShareMovesTest, AShareThatIsNotIndexedNeedsNoSystem) {
-  Run({"folder", "delete", "/docs"});
+  system_.Run({"folder", "delete", "/docs"});
   system_.Stop();
-  Run({"share", "rename", "docs", "papers"});
+  system_.Run({"share", "rename", "docs", "papers"});
   EXPECT_TRUE(IsDirExist(system_.Files() + "/papers", false));
   EXPECT_EQ(platform::ReadShares()[0].name, "papers");
   EXPECT_EQ(ReadFile(TestRoot() + "/var/lib/quarry/queue/" +

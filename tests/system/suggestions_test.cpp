@@ -22,16 +22,6 @@ class SuggestionsTest : public testing::Test {
   }
   void TearDown() override { system_.Stop(); }
 
-  void IndexDocs() {
-    Run({"share", "add", docs_});
-    Run({"folder", "add", "/docs"});
-    ASSERT_TRUE(system_.WaitUntilIdle());
-  }
-  std::string Run(const std::vector<std::string>& arguments) {
-    const Ran ran = system_.Quarry(arguments);
-    EXPECT_EQ(ran.end, "exit code 0") << ran.output;
-    return ran.output;
-  }
   // What bash offers for the last of the words, with blanks between.
   std::string Offered(const std::string& words) {
     const std::string script =
@@ -54,12 +44,12 @@ class SuggestionsTest : public testing::Test {
 };
 
 TEST_F(SuggestionsTest, ComeOnceWordsHaveBeenCollected) {
-  IndexDocs();
-  EXPECT_EQ(Run({"search", "capibara"}), "Nothing found.\n");
-  EXPECT_EQ(Run({"search", "--complete", "cap"}), "");
+  system_.IndexShare(docs_);
+  EXPECT_EQ(system_.Run({"search", "capibara"}), "Nothing found.\n");
+  EXPECT_EQ(system_.Run({"search", "--complete", "cap"}), "");
   EXPECT_EQ(system_.QuarryJson({"suggest"})["indexes"][0], "fileindex_docs");
-  EXPECT_EQ(Run({"search", "capibara"}), "Nothing found.\nDid you mean \"capybara\"?\n");
-  EXPECT_EQ(Run({"search", "capibara -lion", "type:document"}),
+  EXPECT_EQ(system_.Run({"search", "capibara"}), "Nothing found.\nDid you mean \"capybara\"?\n");
+  EXPECT_EQ(system_.Run({"search", "capibara -lion", "type:document"}),
             "Nothing found.\n");  // one word of the shell is a phrase
   const Json::Value found = system_.QuarryJson({"search", "capibara -lion type:document"});
   EXPECT_EQ(found["suggestion"], "capybara -lion type:document");
@@ -72,17 +62,17 @@ TEST_F(SuggestionsTest, ComeOnceWordsHaveBeenCollected) {
 }
 
 TEST_F(SuggestionsTest, AreThereAfterTheIndexCommand) {
-  const std::string shown = Run({"index", docs_, "--", "capibara"});
+  const std::string shown = system_.Run({"index", docs_, "--", "capibara"});
   EXPECT_NE(shown.find("Did you mean \"capybara\"?"), std::string::npos) << shown;
 }
 
 TEST_F(SuggestionsTest, CompleteWords) {
-  IndexDocs();
-  EXPECT_EQ(Run({"suggest"}).substr(0, 41), "Refreshed the words to suggest (1 share).");
-  EXPECT_EQ(Run({"search", "--complete", "CAP"}), "capybara\n");
+  system_.IndexShare(docs_);
+  EXPECT_EQ(system_.Run({"suggest"}).substr(0, 41), "Refreshed the words to suggest (1 share).");
+  EXPECT_EQ(system_.Run({"search", "--complete", "CAP"}), "capybara\n");
   EXPECT_EQ(system_.QuarryJson({"search", "--complete", "cap"})["words"][0], "capybara");
-  EXPECT_EQ(Run({"search", "--complete", "zzz"}), "");
-  EXPECT_EQ(Run({"search", "--complete", ""}), "");
+  EXPECT_EQ(system_.Run({"search", "--complete", "zzz"}), "");
+  EXPECT_EQ(system_.Run({"search", "--complete", ""}), "");
   EXPECT_EQ(system_.Quarry({"search"}).end, "exit code 2");
   EXPECT_EQ(system_.Quarry({"search", "--complete"}).end, "exit code 2");
   EXPECT_EQ(system_.Quarry({"search", "--complete", "cap", "word"}).end, "exit code 2");
@@ -92,10 +82,10 @@ TEST_F(SuggestionsTest, CompleteWords) {
 }
 
 TEST_F(SuggestionsTest, CompletionIsSilentWithoutASystem) {
-  IndexDocs();
-  Run({"suggest"});
+  system_.IndexShare(docs_);
+  system_.Run({"suggest"});
   system_.Stop();
-  EXPECT_EQ(Run({"search", "--complete", "cap"}), "");
+  EXPECT_EQ(system_.Run({"search", "--complete", "cap"}), "");
   EXPECT_EQ(system_.QuarryJson({"search", "--complete", "cap"})["words"].size(), 0U);
   EXPECT_EQ(Offered("quarry search cap"), "");
   system_.Start();
@@ -104,8 +94,8 @@ TEST_F(SuggestionsTest, CompletionIsSilentWithoutASystem) {
 TEST_F(SuggestionsTest, CompletionTakesNamesAsTheyStand) {
   const std::string strange = system_.Files() + "/a $(touch hit) b";
   WriteFile(strange + "/one.txt", "x");
-  IndexDocs();
-  Run({"share", "add", strange});
+  system_.IndexShare(docs_);
+  system_.Run({"share", "add", strange});
   EXPECT_EQ(Offered("quarry share pause d"), "docs");
   EXPECT_EQ(Offered("quarry share pause a"), "a $(touch hit) b");
   EXPECT_EQ(Offered("quarry sh"), "share");

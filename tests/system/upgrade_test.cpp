@@ -21,17 +21,9 @@ class UpgradeTest : public testing::Test {
                 "capybara number " + std::to_string(i));
     }
     system_.Start();
-    Run({"share", "add", docs_});
-    Run({"folder", "add", "/docs"});
-    ASSERT_TRUE(system_.WaitUntilIdle());
+    system_.IndexShare(docs_);
   }
   void TearDown() override { system_.Stop(); }
-
-  std::string Run(const std::vector<std::string>& arguments) {
-    const Ran ran = system_.Quarry(arguments);
-    EXPECT_EQ(ran.end, "exit code 0") << ran.output;
-    return ran.output;
-  }
 
   // Makes the only index one that a release with another layout has written.
   static void ChangeLayout(int version) {
@@ -69,7 +61,7 @@ TEST_F(UpgradeTest, AnIndexOfAnotherLayoutIsMadeAnew) {
     EXPECT_TRUE(Finds(20));
     ASSERT_TRUE(system_.WaitUntilIdle());
     EXPECT_EQ(system_.Documents(docs_), Listing(docs_));
-    EXPECT_EQ(Run({"doctor", "--check"}), "All is well.\n");
+    EXPECT_EQ(system_.Run({"doctor", "--check"}), "All is well.\n");
     EXPECT_EQ(system_.QuarryJson({"status"})["folders"][0]["state"], "finished");
   }
   EXPECT_TRUE(LogSays("The index's database is of another version"));
@@ -78,7 +70,7 @@ TEST_F(UpgradeTest, AnIndexOfAnotherLayoutIsMadeAnew) {
 
 // Searches and the status say why nothing is found, rather than that there is nothing.
 TEST_F(UpgradeTest, APausedIndexOfAnotherLayoutIsNamedUntilItIsMadeAnew) {
-  Run({"pause"});
+  system_.Run({"pause"});
   system_.Stop();
   ChangeLayout(engine::kLayoutVersion - 1);
   system_.Start();
@@ -88,7 +80,7 @@ TEST_F(UpgradeTest, APausedIndexOfAnotherLayoutIsNamedUntilItIsMadeAnew) {
   const std::string status = system_.Quarry({"status"}).output;
   EXPECT_NE(status.find("The index of the share docs cannot be used (" + why), std::string::npos)
       << status;
-  Run({"resume"});
+  system_.Run({"resume"});
   EXPECT_TRUE(Finds(20));
 }
 

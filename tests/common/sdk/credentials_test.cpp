@@ -36,17 +36,6 @@ class CredentialsTest : public fake::FakePlatformTest {
   }
   ~CredentialsTest() override { fake::OnCall(nullptr); }
 
-  static std::string Thrown(const std::function<void()>& call) {
-    std::string thrown = "none";
-    try {
-      call();
-    } catch (const Error& error) {
-      EXPECT_TRUE(IsSDKMutexFree());
-      thrown = std::to_string(error.code()) + " " + error.reason();
-    }
-    return thrown;
-  }
-
   const Ids alice_{1001, 101};
   const Ids bob_{1002, 102};
   const Ids root_{0, 0};
@@ -105,7 +94,7 @@ TEST_F(CredentialsTest, LastOfSeveralUsersIsLeftForTheFirst) {
 TEST_F(CredentialsTest, UnknownCurrentUserIsAnError) {
   fake::SetPlatformError(5120);
   fake::FailCall("TARNUserGetByUID", 1, {-1, ESRCH});
-  EXPECT_EQ(Thrown([] { SDKCredentials credentials; }), "503 TARNUserGetByUID failed, err=5120");
+  EXPECT_EQ(FailureOf([] { SDKCredentials credentials; }), "503 TARNUserGetByUID failed, err=5120");
   ASSERT_EQ(fake::Logs().size(), 1u);
   EXPECT_EQ(fake::AnyLine(fake::Logs()[0]),
             fake::AnyLine(fake::LogHead("credentials", 1, "SDKCredentials")) +
@@ -115,13 +104,13 @@ TEST_F(CredentialsTest, UnknownCurrentUserIsAnError) {
 
 TEST_F(CredentialsTest, MissingRecordOfTheCurrentUserIsAnError) {
   fake::FailCall("TARNUserGetByUID", 1, {0});
-  EXPECT_EQ(Thrown([] { SDKCredentials credentials; }), "503 TARNUserGetByUID failed, err=0");
+  EXPECT_EQ(FailureOf([] { SDKCredentials credentials; }), "503 TARNUserGetByUID failed, err=0");
 }
 
 TEST_F(CredentialsTest, FailedSwitchIsAnErrorAndTheNextMaySucceed) {
   SDKCredentials credentials;
   fake::FailCall("ResetCredentialsByName", 1, {0, EPERM});
-  EXPECT_EQ(Thrown([&] { credentials.AsUser("bob"); }), "503 ");
+  EXPECT_EQ(FailureOf([&] { credentials.AsUser("bob"); }), "503 ");
   ASSERT_EQ(fake::Logs().size(), 1u);
   EXPECT_EQ(fake::AnyLine(fake::Logs()[0]),
             fake::AnyLine(fake::LogHead("credentials", 1, "AsUser")) +
@@ -133,7 +122,7 @@ TEST_F(CredentialsTest, FailedSwitchIsAnErrorAndTheNextMaySucceed) {
 
 TEST_F(CredentialsTest, UserWithNulByteIsRefused) {
   SDKCredentials credentials;
-  EXPECT_EQ(Thrown([&] { credentials.AsUser(std::string("bob\0x", 5)); }), "503 ");
+  EXPECT_EQ(FailureOf([&] { credentials.AsUser(std::string("bob\0x", 5)); }), "503 ");
   EXPECT_EQ(Now(), alice_);
   EXPECT_TRUE(fake::CallsOf("ResetCredentialsByName").empty());
 }
@@ -181,7 +170,7 @@ TEST_F(CredentialsTest, FailedConstructorLeavesNoPrivilegeBehind) {
     if (function == "ResetCredentialsByName") fake::SetEffectiveIds(0, 101);
   });
   fake::FailCall("ResetCredentialsByName");
-  EXPECT_EQ(Thrown([] { SDKCredentials credentials("root"); }), "503 ");
+  EXPECT_EQ(FailureOf([] { SDKCredentials credentials("root"); }), "503 ");
   EXPECT_EQ(Now(), alice_);
 }
 

@@ -30,18 +30,6 @@ class ShareTest : public fake::FakePlatformTest {
   }
   ~ShareTest() override { fake::OnCall(nullptr); }
 
-  // The code and the reason of what `call` throws, or "none". The lock is free afterwards.
-  static std::string Thrown(const std::function<void()>& call) {
-    std::string thrown = "none";
-    try {
-      call();
-    } catch (const Error& error) {
-      EXPECT_TRUE(IsSDKMutexFree());
-      thrown = std::to_string(error.code()) + " " + error.reason();
-    }
-    return thrown;
-  }
-
   static void Set(const std::function<void(fake::Share&)>& change) {
     fake::Share share;
     share.name = "photo";
@@ -83,14 +71,14 @@ TEST_F(ShareTest, IsNotCopyable) {
 }
 
 TEST_F(ShareTest, UnknownShareIsAnError) {
-  EXPECT_EQ(Thrown([] { SDKShare share("none"); }), "800 ");
+  EXPECT_EQ(FailureOf([] { SDKShare share("none"); }), "800 ");
   ExpectLogged("SDKShare", "0 > TARNShareGet(share_name.c_str(), &share_info_) || !share_info_",
                "");
 }
 
 TEST_F(ShareTest, FailedLookUpIsLoggedWithErrno) {
   fake::FailCall("TARNShareGet", 1, {-1, EIO});
-  EXPECT_EQ(Thrown([] { SDKShare share("photo"); }), "800 ");
+  EXPECT_EQ(FailureOf([] { SDKShare share("photo"); }), "800 ");
   ExpectLogged("SDKShare", "0 > TARNShareGet(share_name.c_str(), &share_info_) || !share_info_",
                " [err: Input/output error]");
   EXPECT_EQ(errno, 0);
@@ -98,11 +86,11 @@ TEST_F(ShareTest, FailedLookUpIsLoggedWithErrno) {
 
 TEST_F(ShareTest, MissingRecordIsAnErrorThoughTheCallSucceeded) {
   fake::FailCall("TARNShareGet", 1, {0});
-  EXPECT_EQ(Thrown([] { SDKShare share("photo"); }), "800 ");
+  EXPECT_EQ(FailureOf([] { SDKShare share("photo"); }), "800 ");
 }
 
 TEST_F(ShareTest, NameWithNulByteIsNotTheShareBeforeIt) {
-  EXPECT_EQ(Thrown([] { SDKShare share(std::string("photo\0x", 7)); }), "800 ");
+  EXPECT_EQ(FailureOf([] { SDKShare share(std::string("photo\0x", 7)); }), "800 ");
   EXPECT_TRUE(fake::Calls().empty());
 }
 
@@ -171,7 +159,7 @@ TEST_F(ShareTest, OnlyAWritableShareThatIsNotEncryptedIsIndexed) {
 TEST_F(ShareTest, UnknownEncryptionIsLoggedAtItsLine) {
   const SDKShare share("photo");
   fake::FailCall("HLIBShareIsEncryptedGet");
-  EXPECT_EQ(Thrown([&] { share.CanBeIndexed(); }),
+  EXPECT_EQ(FailureOf([&] { share.CanBeIndexed(); }),
             "502 HLIBShareis_encryptedGet failed, share=photo");
   EXPECT_EQ(fake::Logs(),
             Strings({fake::LogHead("share", 73, "CanBeIndexed") +
@@ -185,7 +173,7 @@ TEST_F(ShareTest, UnknownReadOnlyIsLoggedAtItsLine) {
   Set([](fake::Share& share) { share.encrypted = true; });
   const SDKShare share("photo");
   fake::FailCall("HLIBShareIsReadOnlyGet", 1, {-1, EPERM});
-  EXPECT_EQ(Thrown([&] { share.CanBeIndexed(); }),
+  EXPECT_EQ(FailureOf([&] { share.CanBeIndexed(); }),
             "502 HLIBShareis_readonlyGet failed, share=photo");
   EXPECT_EQ(
       fake::Logs(),
@@ -199,7 +187,7 @@ TEST_F(ShareTest, EncryptionIsAProperty) {
   Set([](fake::Share& share) { share.encryption = true; });
   EXPECT_TRUE(SDKShare("photo").IsEncryption());
   fake::FailCall("HLIBShareIsEncryptionGet");
-  EXPECT_EQ(Thrown([] { SDKShare("photo").IsEncryption(); }),
+  EXPECT_EQ(FailureOf([] { SDKShare("photo").IsEncryption(); }),
             "502 HLIBShareIsEncryptionGet failed, share=photo");
   ExpectLogged("IsEncryption", "0 > HLIBShareIsEncryptionGet(share_info_, &is_encryption)",
                "HLIBShareIsEncryptionGet failed, share=photo");
@@ -210,7 +198,7 @@ TEST_F(ShareTest, RecycleBinIsAProperty) {
   Set([](fake::Share& share) { share.recycle_bin = true; });
   EXPECT_TRUE(SDKShare("photo").IsEnableRecycleBin());
   fake::FailCall("HLIBShareRecycleStatusGet");
-  EXPECT_EQ(Thrown([] { SDKShare("photo").IsEnableRecycleBin(); }),
+  EXPECT_EQ(FailureOf([] { SDKShare("photo").IsEnableRecycleBin(); }),
             "502 HLIBShareRecycleStatusGet failed, share=photo");
   ExpectLogged("IsEnableRecycleBin", "0 > HLIBShareRecycleStatusGet(share_info_, &is_enabled)",
                "HLIBShareRecycleStatusGet failed, share=photo");
@@ -234,25 +222,25 @@ TEST_F(ShareTest, PathThatFillsTheBufferIsWhole) {
   fake::SetQueuePath("/volume1/photo", std::string(4095, 'q'));
   EXPECT_EQ(SDKShare("photo").GetQueuePath(), std::string(4095, 'q'));
   fake::SetQueuePath("/volume1/photo", std::string(4096, 'q'));
-  EXPECT_EQ(Thrown([] { SDKShare("photo").GetQueuePath(); }),
+  EXPECT_EQ(FailureOf([] { SDKShare("photo").GetQueuePath(); }),
             "502 FILEIDXQueuePathCompose failed, share=photo");
 }
 
 TEST_F(ShareTest, FailedCompositionsAreErrors) {
   const SDKShare share("photo");
   fake::FailCall("FILEIDXQueuePathCompose");
-  EXPECT_EQ(Thrown([&] { share.GetQueuePath(); }),
+  EXPECT_EQ(FailureOf([&] { share.GetQueuePath(); }),
             "502 FILEIDXQueuePathCompose failed, share=photo");
   ExpectLogged("GetQueuePath", "0 > FILEIDXQueuePathCompose(share_info_->szPath, buf, 4096)",
                "FILEIDXQueuePathCompose failed, share=photo");
   fake::ClearLogs();
   fake::FailCall("FILEIDXDBPathCompose");
-  EXPECT_EQ(Thrown([&] { share.GetDBPath(); }), "502 FILEIDXDBPathCompose failed, share=photo");
+  EXPECT_EQ(FailureOf([&] { share.GetDBPath(); }), "502 FILEIDXDBPathCompose failed, share=photo");
   ExpectLogged("GetDBPath", "0 > FILEIDXDBPathCompose(share_info_->szPath, buf, 4096)",
                "FILEIDXDBPathCompose failed, share=photo");
   fake::ClearLogs();
   fake::FailCall("FILEIDXGetIndexID");
-  EXPECT_EQ(Thrown([&] { share.GetDBName(); }), "502 FILEIDXGetIndexID failed, share=photo");
+  EXPECT_EQ(FailureOf([&] { share.GetDBName(); }), "502 FILEIDXGetIndexID failed, share=photo");
   ExpectLogged("GetDBName", "0 > FILEIDXGetIndexID(share_info_->szName, buf, 1024)",
                "FILEIDXGetIndexID failed, share=photo");
 }
@@ -272,26 +260,26 @@ TEST_F(ShareTest, NoSharesAreNoNames) {
 
 TEST_F(ShareTest, MissingListIsAnError) {
   fake::FailCall("HLIBCSzListAlloc", 1, {-1, ENOMEM});
-  EXPECT_EQ(Thrown([] { SDKShare::Enum(); }), "121 ");
+  EXPECT_EQ(FailureOf([] { SDKShare::Enum(); }), "121 ");
   ExpectLogged("Enum", "nullptr == (share_list = HLIBCSzListAlloc(BUFSIZ))",
                " [err: Cannot allocate memory]");
 }
 
 TEST_F(ShareTest, FailedEnumerationIsAnErrorAndReleasesTheList) {
   fake::FailCall("HLIBShareEnum");
-  EXPECT_EQ(Thrown([] { SDKShare::Enum(); }), "121 HLIBShareEnum failed");
+  EXPECT_EQ(FailureOf([] { SDKShare::Enum(); }), "121 HLIBShareEnum failed");
   ExpectLogged("Enum", "0 > HLIBShareEnum(&share_list, &enum_func)", "HLIBShareEnum failed");
   EXPECT_EQ(fake::Outstanding(), 0);
   fake::ClearLogs();
   // The list is released before the line is written, which tells the errno of the enumeration.
   fake::FailCall("HLIBShareEnum", 1, {-1, EIO});
   fake::FailCall("HLIBCSzListFree", 1, {0, EBADF});
-  EXPECT_EQ(Thrown([] { SDKShare::Enum(); }), "121 HLIBShareEnum failed");
+  EXPECT_EQ(FailureOf([] { SDKShare::Enum(); }), "121 HLIBShareEnum failed");
   ExpectLogged("Enum", "0 > HLIBShareEnum(&share_list, &enum_func)",
                "HLIBShareEnum failed [err: Input/output error]");
   EXPECT_EQ(errno, 0);
   fake::FailCall("HLIBCSzListPush");
-  EXPECT_EQ(Thrown([] { SDKShare::Enum(); }), "121 HLIBShareEnum failed");
+  EXPECT_EQ(FailureOf([] { SDKShare::Enum(); }), "121 HLIBShareEnum failed");
 }
 
 }  // namespace

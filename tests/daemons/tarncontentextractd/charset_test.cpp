@@ -49,6 +49,10 @@ struct Case {
   std::size_t mark_size;
 };
 
+void PrintTo(const Case& each, std::ostream* out) {
+  *out << each.charset << ": " << each.text;
+}
+
 class Encodings : public ::testing::TestWithParam<Case> {};
 
 TEST_P(Encodings, AreFoundAndDecoded) {

@@ -12,9 +12,11 @@
 #include "fileindex/config/folder_mgr.h"
 #include "tests/fake_platform/fixture.h"
 #include "tests/support/files.h"
+#include "tests/support/thrown.h"
 
 namespace quarry::fileindex {
 
+using test::FailureOf;
 using FolderPtr = std::shared_ptr<Folder>;
 
 // A folder whose kinds are given by letters: "davp" is all four.
@@ -67,15 +69,6 @@ class FolderMgrTest : public fake::FakePlatformTest {
     return diff;
   }
 
-  // The failure of `action`, as "code reason"; "" when it does not fail.
-  static std::string FailureOf(const std::function<void()>& action) {
-    try {
-      action();
-    } catch (const Error& error) {
-      return std::to_string(error.code()) + " " + error.reason();
-    }
-    return "";
-  }
   static std::string LoadFailure() {
     return FailureOf([] { FolderMgr folders; });
   }

@@ -13,10 +13,12 @@
 #include "fileindex/config/status_mgr.h"
 #include "tests/fake_platform/fixture.h"
 #include "tests/support/files.h"
+#include "tests/support/thrown.h"
 
 namespace quarry::fileindex {
 namespace {
 
+using test::FailureOf;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 
@@ -37,16 +39,6 @@ class FolderTest : public fake::FakePlatformTest {
     fake::AddShare("new", root_ + "/volume2/new");
     test::MakeDirs(root_ + "/volume1/photo/2019");
     errno = 0;
-  }
-
-  // The failure of `action`, as "code reason"; "" when it does not fail.
-  static std::string FailureOf(const std::function<void()>& action) {
-    try {
-      action();
-    } catch (const Error& error) {
-      return std::to_string(error.code()) + " " + error.reason();
-    }
-    return "";
   }
 
   static Folder Sample() {

@@ -24,6 +24,7 @@
 #include "fileindex/queue/event.h"
 #include "tests/fake_platform/fixture.h"
 #include "tests/support/files.h"
+#include "tests/support/thrown.h"
 
 namespace {
 
@@ -41,6 +42,7 @@ extern "C" int ftruncate(int fd, off_t size) noexcept {
 namespace quarry::fileindex {
 namespace {
 
+using test::Thrown;
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 using ::testing::IsEmpty;
@@ -49,17 +51,6 @@ using ::testing::SizeIs;
 constexpr int kRename = 0x100;
 constexpr int kReindex = 0x10000;
 constexpr int kUpdateCfg = 0x20000;
-
-template <typename Call>
-Error Thrown(Call call) {
-  try {
-    call();
-  } catch (const Error& error) {
-    return error;
-  }
-  ADD_FAILURE() << "nothing thrown";
-  return Error(0);
-}
 
 class CustomEventTest : public fake::FakePlatformTest {
  protected:

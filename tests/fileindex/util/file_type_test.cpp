@@ -104,6 +104,10 @@ struct Sample {
   FileType type;
 };
 
+void PrintTo(const Sample& sample, std::ostream* out) {
+  *out << sample.path;
+}
+
 class FileTypeSampleTest : public ::testing::TestWithParam<Sample> {};
 
 TEST_P(FileTypeSampleTest, Category) {

@@ -13,6 +13,7 @@
 #include "tests/fake_platform/fixture.h"
 #include "tests/support/files.h"
 #include "tests/support/temp_dir.h"
+#include "tests/support/thrown.h"
 
 namespace quarry::fileindex {
 namespace {
@@ -21,17 +22,7 @@ using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 using ::testing::SizeIs;
 using namespace std::string_literals;
-
-template <typename Call>
-Error Thrown(Call call) {
-  try {
-    call();
-  } catch (const Error& error) {
-    return error;
-  }
-  ADD_FAILURE() << "nothing thrown";
-  return Error(0);
-}
+using test::Thrown;
 
 // Shares really exist below a temporary directory, as volume1/photo and so on.
 class UtilTest : public fake::FakePlatformTest {

@@ -11,20 +11,12 @@
 #include "common/json.h"
 #include "platform/linux/share_store.h"
 #include "tests/platform/linux/share_fixture.h"
+#include "tests/support/thrown.h"
 
 namespace quarry::platform {
 namespace {
 
-// The error that `call` ends in, as "code reason"; "" without one.
-template <typename Call>
-std::string ErrorOf(const Call& call) {
-  try {
-    call();
-  } catch (const Error& error) {
-    return std::to_string(error.code()) + " " + error.reason();
-  }
-  return "";
-}
+using test::FailureOf;
 
 class ShareRegistryTest : public ShareTest {};
 
@@ -85,7 +77,7 @@ TEST_F(ShareRegistryTest, RefusesNamesAndPathsThatNoShareHas) {
     ShareRecord share;
     share.name = name;
     share.path = path;
-    return ErrorOf([&] { ValidateShare(share); });
+    return FailureOf([&] { ValidateShare(share); });
   };
   EXPECT_EQ(refused("photo", "/volume1/photo"), "");
   EXPECT_EQ(refused("photo", "/photo"), "");
@@ -121,14 +113,14 @@ TEST_F(ShareRegistryTest, RefusesPlacesThatAreNoDirectory) {
   share.name = "photo";
   share.path = volume_ / "photo";
   const auto add = [&] { AddShare(share); };
-  EXPECT_EQ(ErrorOf(add), "120 \"" + share.path + "\": No such file or directory.");
+  EXPECT_EQ(FailureOf(add), "120 \"" + share.path + "\": No such file or directory.");
   test::WriteFile(share.path, "");
-  EXPECT_EQ(ErrorOf(add), "120 \"" + share.path + "\" is no directory.");
+  EXPECT_EQ(FailureOf(add), "120 \"" + share.path + "\" is no directory.");
   test::MakeDirs(volume_ / "real/photo");
   ASSERT_EQ(symlink("real", (volume_ / "link").c_str()), 0);
   share.path = volume_ / "link/photo";
-  EXPECT_EQ(ErrorOf(add), "120 \"" + share.path + "\" leads through a link; the directory is \"" +
-                              (volume_ / "real/photo") + "\".");
+  EXPECT_EQ(FailureOf(add), "120 \"" + share.path + "\" leads through a link; the directory is \"" +
+                                (volume_ / "real/photo") + "\".");
   EXPECT_TRUE(ReadShares().empty());
 }
 
@@ -139,7 +131,7 @@ TEST_F(ShareRegistryTest, RefusesSharesThatMeet) {
     ShareRecord share;
     share.name = name;
     share.path = path;
-    return ErrorOf([&] { AddShare(share); });
+    return FailureOf([&] { AddShare(share); });
   };
   EXPECT_EQ(add("one", volume_ / "other/one"),
             "120 There is a share called \"one\" already, at \"" + first.path + "\".");
@@ -178,16 +170,16 @@ TEST_F(ShareRegistryTest, ABadFileIsAnErrorAndIsNotReplaced) {
   for (const auto& [text, what] : cases) {
     WriteShareFile(text);
     const std::string error = "504 The share file " + ShareFilePath() + " " + what;
-    EXPECT_EQ(ErrorOf([] { ReadShares(); }), error) << text;
-    EXPECT_EQ(ErrorOf([&] { AddShare(share); }), error) << text;
-    EXPECT_EQ(ErrorOf([] { RemoveShare("photo"); }), error) << text;
+    EXPECT_EQ(FailureOf([] { ReadShares(); }), error) << text;
+    EXPECT_EQ(FailureOf([&] { AddShare(share); }), error) << text;
+    EXPECT_EQ(FailureOf([] { RemoveShare("photo"); }), error) << text;
     EXPECT_EQ(test::ReadFile(ShareFilePath()), text);
   }
 }
 
 TEST_F(ShareRegistryTest, AFileOfAnotherKindIsAnError) {
   test::MakeDirs(ShareFilePath());
-  EXPECT_EQ(ErrorOf([] { ReadShares(); }),
+  EXPECT_EQ(FailureOf([] { ReadShares(); }),
             "504 The share file " + ShareFilePath() + " cannot be read: Invalid argument");
 }
 
