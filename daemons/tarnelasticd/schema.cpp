@@ -157,14 +157,15 @@ std::string Schema::CreateStatements() const {
   if (!is_dir.empty()) files.append(",").append(is_dir);
   if (!extension.empty()) add_index("docs_extension", files);
   const auto add_words = [&](const std::string& name, const std::string& columns,
-                             const std::string& tokenizer) {
+                             const std::string& tokenizer, const std::string& option = "") {
     sql += "CREATE VIRTUAL TABLE " + name + " USING fts5(" + columns +
-           ", content='', tokenize=" + QuoteSql(tokenizer, '\'') + ");";
+           ", content='', tokenize=" + QuoteSql(tokenizer, '\'') + option + ");";
   };
   // A table without any full text still has a column, which stays empty.
   add_words("body", ColumnList("t", std::max<std::size_t>(text_columns_, 1)), kTextTokenizer);
-  add_words("labels", "name,extra", kTextTokenizer);
-  add_words("names", "name", "trigram case_sensitive 1");
+  // Nobody asks how long these are.
+  add_words("labels", "name,extra", kTextTokenizer, ", columnsize=0");
+  add_words("names", "name", "trigram case_sensitive 1", ", columnsize=0");
   return sql + CreateSharingTables() + CreateLengthTable() + CreateTermTables();
 }
 

@@ -27,7 +27,7 @@
 namespace quarry::engine {
 
 // The version of the layout. A database of another version counts as damaged: it is made anew.
-constexpr int kLayoutVersion = 5;
+constexpr int kLayoutVersion = 6;
 
 // How a field's values are kept.
 enum class Storage {

@@ -1,70 +1,116 @@
 #include "daemons/tarnelasticd/terms.h"
 
 #include <algorithm>
-#include <map>
 #include <utility>
 
 #include "daemons/tarnelasticd/edit_distance.h"
 #include "daemons/tarnelasticd/engine_error.h"
 #include "daemons/tarnelasticd/posting_lists.h"
-#include "daemons/tarnelasticd/selection.h"
 #include "daemons/tarnelasticd/text_sharing.h"
 #include "daemons/tarnelasticd/text_tokenizer.h"
+#include "daemons/tarnelasticd/varint.h"
 
 namespace quarry::engine {
 namespace {
 
-constexpr std::size_t kBlockBytes = std::size_t{64} << 10;
-constexpr std::size_t kCollectedBytes = std::size_t{4} << 20;
+// With its first word a block just fits into a page of the database.
+constexpr std::size_t kBlockBytes = 3700;
+constexpr std::size_t kBlocksToCheck = 16;
 
-// Gathers words into blocks.
+[[noreturn]] void FailDamaged() {
+  throw Error(kDamagedIndex, "The words to suggest are damaged");
+}
+
+// Gathers words, which come in order, into blocks.
 class BlockWriter {
  public:
-  explicit BlockWriter(Database* db) : db_(db) {}
+  explicit BlockWriter(Database* db)
+      : insert_(db->Prepare("INSERT INTO terms(first,words) VALUES(?1,?2)")) {}
 
-  void Add(std::string_view term) {
-    std::string& block = blocks_[{CountCharacters(term), term.size()}];
-    block += term;
-    bytes_ += term.size();
-    if (block.size() >= kBlockBytes || bytes_ >= kCollectedBytes) Flush();
+  void Add(std::string_view term, std::int64_t documents) {
+    if (block_.empty()) first_ = last_ = term;
+    const auto differs = std::mismatch(term.begin(), term.end(), last_.begin(), last_.end()).first;
+    const auto shared = block_.empty() ? 0 : static_cast<std::size_t>(differs - term.begin());
+    AppendNumber(&block_, shared);
+    AppendNumber(&block_, term.size() - shared);
+    block_ += term.substr(shared);
+    AppendNumber(&block_, static_cast<std::uint64_t>(documents));
+    last_ = term;
+    if (block_.size() >= kBlockBytes) Flush();
   }
 
   void Flush() {
-    Statement insert =
-        db_->Prepare("INSERT INTO term_blocks(letters,bytes,words) VALUES(?1,?2,?3)");
-    for (const auto& [lengths, words] : blocks_) {
-      insert.Bind(1, static_cast<std::int64_t>(lengths.first));
-      insert.Bind(2, static_cast<std::int64_t>(lengths.second));
-      insert.BindBlob(3, words).Run();
-    }
-    blocks_.clear();
-    bytes_ = 0;
+    if (block_.empty()) return;
+    insert_.BindBlob(1, first_).BindBlob(2, block_).Run();
+    block_.clear();
   }
 
  private:
-  Database* db_;
-  std::map<std::pair<std::size_t, std::size_t>, std::string> blocks_;
-  std::size_t bytes_ = 0;
+  Statement insert_;
+  std::string first_;
+  std::string last_;
+  std::string block_;
 };
 
+// Calls visit(term, documents) with each word of a block until it returns false; returns whether it
+// never did.
+template <typename Visit>
+bool ReadBlock(std::string_view block, Visit visit) {
+  std::string term;
+  while (!block.empty()) {
+    const std::uint64_t shared = TakeNumber(&block);
+    if (shared > term.size()) FailDamaged();
+    term.resize(static_cast<std::size_t>(shared));
+    term += TakeCounted(&block);
+    if (!visit(term, static_cast<std::int64_t>(TakeNumber(&block)))) return false;
+  }
+  return true;
+}
+
+// The same with all words from `from` on, and perhaps some before it.
+template <typename Visit>
+void ReadFrom(Database* db, std::string_view from, Visit visit) {
+  Statement rows = db->Prepare(
+      "SELECT words FROM terms WHERE first>="
+      "coalesce((SELECT max(first) FROM terms WHERE first<=?1),?1) ORDER BY first");
+  rows.BindBlob(1, from);
+  while (rows.Step()) {
+    if (!ReadBlock(rows.Blob(0), visit)) return;
+  }
+}
+
+bool HasMore(const Term& a, const Term& b) {
+  if (a.documents != b.documents) return a.documents > b.documents;
+  return a.text < b.text;
+}
+
 bool ComesBefore(const NearTerm& a, const NearTerm& b) {
-  if (a.distance != b.distance) return a.distance < b.distance;
-  if (a.term.documents != b.term.documents) return a.term.documents > b.term.documents;
-  return a.term.text < b.term.text;
+  return a.distance != b.distance ? a.distance < b.distance : HasMore(a.term, b.term);
+}
+
+bool IsAscii(std::string_view term) {
+  return std::all_of(term.begin(), term.end(),
+                     [](char c) { return static_cast<unsigned char>(c) < 0x80; });
 }
 
 // Compares words with one, and keeps the best.
 class NearFinder {
  public:
-  NearFinder(Database* db, std::string_view word, std::size_t limit, std::size_t size)
-      : db_(db), word_(CodePoints(word)), letters_(LetterSet(word_)), limit_(limit), size_(size) {}
+  NearFinder(std::string_view word, std::size_t limit, std::size_t size)
+      : word_(CodePoints(word)), letters_(LetterSet(word_)), limit_(limit), size_(size) {}
 
-  const std::u32string& word() const { return word_; }
-
-  void AddBlock(std::string_view words, std::size_t letters, std::size_t bytes) {
-    for (; bytes > 0 && words.size() >= bytes; words.remove_prefix(bytes)) {
-      Compare(words.substr(0, bytes), letters == bytes);
-    }
+  void Compare(const std::string& term, std::int64_t documents) {
+    // No word of fewer bytes has enough letters.
+    if (term.size() + limit_ < word_.size()) return;
+    const bool ascii = IsAscii(term);
+    if (ascii && term.size() > word_.size() + limit_) return;
+    if (ascii && !MayBeNear(letters_, LetterSetOfAscii(term), limit_)) return;
+    const std::u32string points = CodePoints(term);
+    if (!ascii && !MayBeNear(letters_, LetterSet(points), limit_)) return;
+    const std::size_t distance = EditDistance(word_, points, limit_);
+    if (distance == 0 || distance > limit_) return;
+    found_.push_back({{term, documents}, distance});
+    if (found_.size() >= 4 * size_) Shorten();
   }
 
   std::vector<NearTerm> Take() {
@@ -73,22 +119,11 @@ class NearFinder {
   }
 
  private:
-  void Compare(std::string_view term, bool ascii) {
-    if (ascii && !MayBeNear(letters_, LetterSetOfAscii(term), limit_)) return;
-    const std::u32string points = CodePoints(term);
-    if (!ascii && !MayBeNear(letters_, LetterSet(points), limit_)) return;
-    const std::size_t distance = EditDistance(word_, points, limit_);
-    if (distance == 0 || distance > limit_) return;
-    found_.push_back({{std::string(term), DocumentsWith(db_, term)}, distance});
-    if (found_.size() >= 4 * size_) Shorten();
-  }
-
   void Shorten() {
     std::sort(found_.begin(), found_.end(), ComesBefore);
     if (found_.size() > size_) found_.resize(size_);
   }
 
-  Database* db_;
   const std::u32string word_;
   const std::uint64_t letters_;
   const std::size_t limit_;
@@ -118,50 +153,79 @@ std::string LengthCondition() {
          std::to_string(kMaxTermLetters);
 }
 
-void CollectTextTerms(Database* db) {
-  // Makes FTS5 write out what it holds back.
-  db->Prepare("SELECT 1 FROM body_terms LIMIT 1").Step();
-  PostingLists lists(db, "body", LastId(db), {}, [] {});
-  if (!lists.IsReadable()) {
-    db->Execute(
-        "INSERT INTO terms(term,documents) SELECT term,doc FROM body_terms WHERE doc>1 AND " +
-        LengthCondition());
-    return;
+// The words of file names and fields that are not listed, in order, woven into those of the texts.
+// A word that stands in one text alone is as likely a slip as a word. In a file name it is what
+// people look for, unless it is a number.
+class TermMerger {
+ public:
+  explicit TermMerger(Database* db)
+      : labels_(db->Prepare("SELECT term,doc FROM label_terms "
+                            "WHERE (doc>1 OR term NOT GLOB '*[0-9]*') AND " +
+                            LengthCondition() + " ORDER BY term")),
+        blocks_(db) {
+    NextLabel();
   }
-  const std::vector<std::int32_t> users = CountUsers(db);
-  Statement insert = db->Prepare("INSERT INTO terms(term,documents) VALUES(?1,?2)");
-  lists.CountWords([&users](std::int64_t text) { return users[static_cast<std::size_t>(text)]; },
-                   [&insert](std::string_view word, std::int64_t documents) {
-                     if (documents < 2 || !IsOfMiddlingLength(word)) return;
-                     insert.Bind(1, word).Bind(2, documents).Run();
-                   });
-}
+
+  void AddOfTexts(std::string_view word, std::int64_t documents) {
+    if (documents < 2 || !IsOfMiddlingLength(word)) return;
+    while (has_label_ && label_ < word) TakeLabel();
+    if (has_label_ && label_ == word) {
+      documents = std::max(documents, label_documents_);
+      NextLabel();
+    }
+    blocks_.Add(word, documents);
+  }
+
+  void Finish() {
+    while (has_label_) TakeLabel();
+    blocks_.Flush();
+  }
+
+ private:
+  void TakeLabel() {
+    blocks_.Add(label_, label_documents_);
+    NextLabel();
+  }
+  void NextLabel() {
+    has_label_ = labels_.Step();
+    if (!has_label_) return;
+    label_ = labels_.Text(0);
+    label_documents_ = labels_.Int(1);
+  }
+
+  Statement labels_;
+  bool has_label_ = false;
+  std::string label_;
+  std::int64_t label_documents_ = 0;
+  BlockWriter blocks_;
+};
 
 }  // namespace
 
 std::string CreateTermTables() {
-  return "CREATE TABLE terms(term TEXT PRIMARY KEY, documents INTEGER NOT NULL) WITHOUT ROWID;"
-         "CREATE TABLE term_blocks(id INTEGER PRIMARY KEY, letters INTEGER NOT NULL,"
-         " bytes INTEGER NOT NULL, words BLOB NOT NULL);"
-         "CREATE INDEX term_blocks_letters ON term_blocks(letters);"
+  return "CREATE TABLE terms(id INTEGER PRIMARY KEY, first BLOB NOT NULL, words BLOB NOT NULL);"
+         "CREATE INDEX terms_first ON terms(first);"
          "CREATE VIRTUAL TABLE body_terms USING fts5vocab('body','row');"
          "CREATE VIRTUAL TABLE label_terms USING fts5vocab('labels','row');";
 }
 
-// A word that stands in one text alone is as likely a slip as a word. In a file name it is what
-// people look for, unless it is a number.
 void CollectTerms(Database* db) {
-  db->Execute("DELETE FROM terms;DELETE FROM term_blocks;");
-  CollectTextTerms(db);
-  db->Execute(
-      "INSERT INTO terms(term,documents) SELECT term,doc FROM label_terms "
-      "WHERE (doc>1 OR term NOT GLOB '*[0-9]*') AND " +
-      LengthCondition() +
-      " ON CONFLICT(term) DO UPDATE SET documents=max(documents,excluded.documents);");
-  BlockWriter blocks(db);
-  Statement terms = db->Prepare("SELECT term FROM terms");
-  while (terms.Step()) blocks.Add(terms.Text(0));
-  blocks.Flush();
+  db->Execute("DELETE FROM terms");
+  TermMerger terms(db);
+  // Makes FTS5 write out what it holds back.
+  db->Prepare("SELECT 1 FROM body_terms LIMIT 1").Step();
+  PostingLists lists(db, "body", LastId(db), {}, [] {});
+  if (lists.IsReadable()) {
+    const std::vector<std::int32_t> users = CountUsers(db);
+    lists.CountWords([&users](std::int64_t text) { return users[static_cast<std::size_t>(text)]; },
+                     [&terms](std::string_view word, std::int64_t documents) {
+                       terms.AddOfTexts(word, documents);
+                     });
+  } else {
+    Statement words = db->Prepare("SELECT term,doc FROM body_terms ORDER BY term");
+    while (words.Step()) terms.AddOfTexts(words.Text(0), words.Int(1));
+  }
+  terms.Finish();
 }
 
 bool HasTerms(Database* db) {
@@ -169,34 +233,40 @@ bool HasTerms(Database* db) {
 }
 
 std::int64_t DocumentsWith(Database* db, std::string_view term) {
-  Statement row = db->Prepare("SELECT documents FROM terms WHERE term=?1");
-  row.Bind(1, term);
-  return row.Step() ? row.Int(0) : 0;
+  std::int64_t found = 0;
+  ReadFrom(db, term, [&](const std::string& word, std::int64_t documents) {
+    if (word == term) found = documents;
+    return word < term;
+  });
+  return found;
 }
 
 std::vector<Term> TermsThatBegin(Database* db, std::string_view prefix, std::size_t size) {
-  const std::string end = PrefixEnd(std::string(prefix));
-  Statement rows = db->Prepare(
-      "SELECT term,documents FROM terms WHERE term>=?1 AND term<?2 "
-      "ORDER BY documents DESC,term LIMIT ?3");
-  rows.Bind(1, prefix).Bind(2, std::string_view(end)).Bind(3, static_cast<std::int64_t>(size));
   std::vector<Term> terms;
-  while (rows.Step()) terms.push_back({std::string(rows.Text(0)), rows.Int(1)});
+  const auto shorten = [&terms, size] {
+    std::sort(terms.begin(), terms.end(), HasMore);
+    if (terms.size() > size) terms.resize(size);
+  };
+  ReadFrom(db, prefix, [&](const std::string& word, std::int64_t documents) {
+    const int order = word.compare(0, prefix.size(), prefix);
+    if (order == 0) terms.push_back({word, documents});
+    if (terms.size() >= 4 * size) shorten();
+    return order <= 0;
+  });
+  shorten();
   return terms;
 }
 
 std::vector<NearTerm> TermsNear(Database* db, std::string_view word, std::size_t limit,
                                 std::size_t size, const std::function<void()>& check) {
-  NearFinder finder(db, word, limit, size);
-  const auto letters = static_cast<std::int64_t>(finder.word().size());
-  const auto reach = static_cast<std::int64_t>(limit);
-  Statement blocks =
-      db->Prepare("SELECT letters,bytes,words FROM term_blocks WHERE letters BETWEEN ?1 AND ?2");
-  blocks.Bind(1, letters - reach).Bind(2, letters + reach);
-  while (blocks.Step()) {
-    check();
-    finder.AddBlock(blocks.Blob(2), static_cast<std::size_t>(blocks.Int(0)),
-                    static_cast<std::size_t>(blocks.Int(1)));
+  NearFinder finder(word, limit, size);
+  Statement blocks = db->Prepare("SELECT words FROM terms");
+  for (std::size_t read = 0; blocks.Step(); ++read) {
+    if (read % kBlocksToCheck == 0) check();
+    ReadBlock(blocks.Blob(0), [&finder](const std::string& term, std::int64_t documents) {
+      finder.Compare(term, documents);
+      return true;
+    });
   }
   return finder.Take();
 }

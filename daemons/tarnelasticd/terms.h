@@ -1,9 +1,9 @@
 // The words of one index that are there to be suggested.
 //
-// Two tables keep them: "terms" by their beginnings, with the number of documents, and
-// "term_blocks" by their lengths: all words of so many letters and so many bytes in a row, without
-// anything between them. Reading through those of about the right length is faster than any index
-// that would lead to the few similar ones, and takes no more room than the words.
+// The table "terms" keeps them in order of their bytes, a few hundred to a row. In a row stand, for
+// each word, how many bytes it shares with the one before, how many more it has, these, and how
+// many documents have it. Reading through all of them is faster than any index that would lead to
+// the few words that are similar to one.
 
 #ifndef QUARRY_DAEMONS_TARNELASTICD_TERMS_H_
 #define QUARRY_DAEMONS_TARNELASTICD_TERMS_H_
@@ -41,8 +41,8 @@ bool HasTerms(Database* db);
 // How many documents had the word; 0 for one that was not collected.
 std::int64_t DocumentsWith(Database* db, std::string_view term);
 
-// The words that begin with these bytes, at most `size`: those of most documents first, then in
-// order of their bytes.
+// The words that begin with these bytes, at most `size`, which is not 0: those of most documents
+// first, then in order of their bytes.
 std::vector<Term> TermsThatBegin(Database* db, std::string_view prefix, std::size_t size);
 
 struct NearTerm {

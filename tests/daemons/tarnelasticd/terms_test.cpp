@@ -37,8 +37,9 @@ class TermsTest : public EngineTest {
   }
   Words Collected() {
     Words words;
-    Statement rows = db_->Prepare("SELECT term,documents FROM terms");
-    while (rows.Step()) words[std::string(rows.Text(0))] = rows.Int(1);
+    for (const Term& term : TermsThatBegin(db_.get(), "", 1000000)) {
+      words[term.text] = term.documents;
+    }
     return words;
   }
   std::vector<std::string> Begin(const std::string& prefix, std::size_t size = 10) {
@@ -205,6 +206,49 @@ TEST_F(ManyTermsTest, AreFoundAsByAScanOverAll) {
     const std::string prefix = word.substr(0, random_() % 4 + 1);
     ASSERT_EQ(Begin(prefix), NaiveBegin(words, prefix, 10)) << prefix;
   }
+  for (const auto& [word, documents] : words) {
+    ASSERT_EQ(DocumentsWith(db_.get(), word), documents) << word;
+    ASSERT_EQ(DocumentsWith(db_.get(), word + "!"), 0) << word;
+  }
+}
+
+// Whatever stands in the rows, nothing but the declared error comes of it.
+TEST_F(ManyTermsTest, SurviveDamage) {
+  AddDocuments();
+  Collect();
+  std::string block;
+  {
+    Statement row = db_->Prepare("SELECT words FROM terms WHERE id=2");
+    ASSERT_TRUE(row.Step());
+    block = row.Blob(0);
+  }
+  int damaged = 0;
+  for (int i = 0; i < 300; ++i) {
+    std::string broken = block.substr(0, random_() % block.size() + 1);
+    broken[random_() % broken.size()] = static_cast<char>(random_());
+    db_->Prepare("UPDATE terms SET words=?1 WHERE id=2").BindBlob(1, broken).Run();
+    try {
+      Near("abcd", 2);
+      Begin("a");
+      DocumentsWith(db_.get(), Word());
+    } catch (const Error& error) {
+      EXPECT_TRUE(HasCode(error, kDamagedIndex)) << error.reason();
+      ++damaged;
+    }
+  }
+  EXPECT_GT(damaged, 100);
+}
+
+// A copy counts as a document, though its text is kept once.
+TEST_F(TermsTest, CountCopies) {
+  Add("/s/1", "harbour storm");
+  Add("/s/2", "harbour storm");
+  Add("/s/3", "harbour");
+  Add("/s/4", "lighthouse");
+  Ask("document_del_by_id", Parse(R"({"id":"a","doc_id":"/s/1"})"));
+  Add("/s/5", "harbour storm");
+  Collect();
+  EXPECT_EQ(Collected(), (Words{{"harbour", 3}, {"storm", 2}}));
 }
 
 }  // namespace
