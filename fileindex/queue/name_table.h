@@ -11,7 +11,7 @@
 namespace quarry::fileindex {
 
 // The positions of named things in a list that somebody else keeps. A slot takes eight bytes, and
-// between half and four fifths of the slots are taken: a directory may have a million names.
+// between four ninths and two thirds of the slots are taken: a directory may have a million names.
 class NameTable {
  public:
   static constexpr std::uint32_t kNone = 0xffffffff;
@@ -37,7 +37,7 @@ class NameTable {
   }
 
   void Add(std::uint32_t hash, std::uint32_t position) {
-    if (5 * (taken_ + 1) > 4 * slots_.size()) Grow();
+    if (3 * (taken_ + 1) > 2 * slots_.size()) Grow();
     Put({hash, position});
     ++taken_;
   }
