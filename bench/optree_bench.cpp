@@ -20,6 +20,7 @@
 #include "common/error.h"
 #include "fileindex/queue/event.h"
 #include "fileindex/queue/optree.h"
+#include "fileindex/queue/pool.h"
 #include "fileindex/queue/queue_reader.h"
 
 namespace quarry::fileindex {
@@ -127,7 +128,7 @@ double Seconds() {
 
 double BytesInUse() {
   const struct mallinfo2 info = mallinfo2();
-  return static_cast<double>(info.uordblks + info.hblkhd);
+  return static_cast<double>(info.uordblks + info.hblkhd + Pool::BytesInUse());
 }
 
 double SecondsToParse(const std::string& queue) {

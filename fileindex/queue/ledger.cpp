@@ -125,14 +125,16 @@ std::uint32_t Ledger::Find(const OPNode& node, std::string_view name, std::uint3
 }
 
 const std::shared_ptr<OPNode>& Ledger::Child(OPNode& node, std::string_view name,
-                                             std::uint32_t hash) {
+                                             std::uint32_t hash, Pool* pool) {
   Adopt(node);
   const std::uint32_t found = Find(node, name, hash);
   if (found != OPNode::kNone) {
     Touch(*node.children[found]);
     return node.children[found];
   }
-  node.children.push_back(std::make_shared<OPNode>(node.shared_from_this(), kUnnamed));
+  node.children.push_back(pool != nullptr
+                              ? pool->Make<OPNode>(node.shared_from_this(), kUnnamed)
+                              : std::make_shared<OPNode>(node.shared_from_this(), kUnnamed));
   node.children.back()->name = std::string(name);  // of its very size: assigned it takes more
   OPNode::Books& books = BooksOf(node);
   if (books.adopted > kFewChildren) {
@@ -157,19 +159,18 @@ void Ledger::PrefetchName(const OPNode& node, std::uint32_t hash) {
   if (node.books_) node.books_->names.Prefetch(hash);
 }
 
-std::uint32_t Ledger::Expected(const OPNode& node, std::uint32_t hash) {
-  if (!node.books_) return OPNode::kNone;
-  return node.books_->names.Find(hash, [](std::uint32_t) { return true; });
-}
-
 // A new child comes behind the last one.
-void Ledger::PrefetchPlace(const OPNode& node, std::uint32_t hash) {
-  const std::size_t place = std::min<std::size_t>(Expected(node, hash), node.children.size());
+std::uint32_t Ledger::PrefetchPlace(const OPNode& node, std::uint32_t hash) {
+  std::size_t place = node.children.size();
+  if (node.books_) {
+    place = std::min<std::size_t>(
+        place, node.books_->names.Find(hash, [](std::uint32_t) { return true; }));
+  }
   __builtin_prefetch(node.children.data() + place);
+  return static_cast<std::uint32_t>(place);
 }
 
-const OPNode* Ledger::PrefetchChild(const OPNode& node, std::uint32_t hash) {
-  const std::uint32_t place = Expected(node, hash);
+const OPNode* Ledger::PrefetchChild(const OPNode& node, std::uint32_t place) {
   if (place >= node.children.size()) return nullptr;
   const OPNode* const child = node.children[place].get();
   __builtin_prefetch(child);
@@ -375,6 +376,12 @@ void Ledger::Forget(OPNode& node) {
   Settle(node);
   if (node.books_) node.books_->records.reset();
   Touch(node);
+}
+
+void Ledger::PrefetchRelease(const OPNode* node) {
+  if (node == nullptr || !node->parent) return;
+  const auto& siblings = node->parent->children;
+  if (node->place_ < siblings.size()) __builtin_prefetch(&siblings[node->place_]);
 }
 
 void Ledger::Release(OPNode& node) {

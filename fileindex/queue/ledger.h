@@ -19,6 +19,7 @@
 
 #include "fileindex/queue/name_table.h"
 #include "fileindex/queue/optree.h"
+#include "fileindex/queue/pool.h"
 
 namespace quarry::fileindex {
 
@@ -68,21 +69,21 @@ struct OPNode::Books {
 // settled before the event is through.
 class Ledger {
  public:
-  // The child of that name, created if there is none, and touched. The reference holds until the
-  // next child is created.
-  static const std::shared_ptr<OPNode>& Child(OPNode& node, std::string_view name) {
-    return Child(node, name, NameTable::HashOf(name));
+  // The child of that name, created if there is none, in `pool` if there is one, and touched. The
+  // reference holds until the next child is created.
+  static const std::shared_ptr<OPNode>& Child(OPNode& node, std::string_view name, Pool* pool) {
+    return Child(node, name, NameTable::HashOf(name), pool);
   }
   static const std::shared_ptr<OPNode>& Child(OPNode& node, std::string_view name,
-                                              std::uint32_t hash);
+                                              std::uint32_t hash, Pool* pool);
 
   // Ask for the memory that Child and ForEachOwn will look at, each for what the one before has
   // asked for. What is expected as a child may be null, or another.
   static void PrefetchDirectory(const OPNode& node);
   static void PrefetchBooks(const OPNode& node);
   static void PrefetchName(const OPNode& node, std::uint32_t hash);
-  static void PrefetchPlace(const OPNode& node, std::uint32_t hash);
-  static const OPNode* PrefetchChild(const OPNode& node, std::uint32_t hash);
+  static std::uint32_t PrefetchPlace(const OPNode& node, std::uint32_t hash);
+  static const OPNode* PrefetchChild(const OPNode& node, std::uint32_t place);
   static void PrefetchList(const OPNode& node);
   static void PrefetchRecord(const OPNode& node);
 
@@ -139,6 +140,9 @@ class Ledger {
   // Forgets what is known about the node's list, for someone else may have changed its records.
   static void Forget(OPNode& node);
 
+  // Asks for the memory that Release will look at; the node may be null.
+  static void PrefetchRelease(const OPNode* node);
+
   // Drops the node's records, and the node itself, when its tree is taken apart and the node has no
   // children. The caller holds the node.
   static void Release(OPNode& node);
@@ -161,7 +165,6 @@ class Ledger {
   static bool IsInPlace(const OPNode& node);
   // Places among the node's children.
   static std::uint32_t Find(const OPNode& node, std::string_view name, std::uint32_t hash);
-  static std::uint32_t Expected(const OPNode& node, std::uint32_t hash);
   static std::uint32_t FindEntered(const OPNode& node, std::string_view name, std::uint32_t hash);
 
   using Link = std::uint32_t OPNode::*;

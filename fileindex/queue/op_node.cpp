@@ -45,7 +45,7 @@ OPNode::~OPNode() {
 }
 
 std::shared_ptr<OPNode> OPNode::GetChild(const std::string& child_name) {
-  return Ledger::Child(*this, child_name);
+  return Ledger::Child(*this, child_name, nullptr);
 }
 
 std::string OPNode::GetPath() const {

@@ -12,6 +12,7 @@
 #include "fileindex/queue/event_line.h"
 #include "fileindex/queue/ledger.h"
 #include "fileindex/queue/look_ahead.h"
+#include "fileindex/queue/pool.h"
 #include "fileindex/queue/queue_reader.h"
 #include "fileindex/queue/relocation.h"
 
@@ -45,17 +46,34 @@ constexpr RuleRow kUpdateCfg = {OP_UPDATE_CFG,  {{Keep, Drop,  Take, Take, Merge
 constexpr RuleRow kReindex   = {OP_REINDEX,     {{Keep, Drop,  Take, Take, Take,  Keep, Drop,   Keep}}};
 // clang-format on
 
-// Whether the pending record is changed.
-bool Meet(OP& pending, OP& rec, const RuleRow& rules) {
-  const auto kind = static_cast<std::size_t>(pending.op);
-  const Rule rule = kind < rules.meeting.size() ? rules.meeting[kind] : Keep;
+// The rules for what such an event does to a file, and nothing else; null for other events.
+const RuleRow* OnlyRules(const EventLine& event) {
+  switch (event.op) {
+    case EVENT_CREATE:
+      return event.is_dir ? nullptr : &kCreate;
+    case EVENT_DELETE:
+      return event.is_dir ? nullptr : &kDelete;
+    case EVENT_MODIFY:
+      return &kModify;
+    case EVENT_ATTR:
+      return &kAttr;
+    default:
+      return nullptr;
+  }
+}
+
+// A new record of that kind and with that data meets a pending one. Returns whether that one is
+// changed; sets `kind` to OP_NONE when it has taken the new one's work.
+bool Meet(OP& pending, FileIndexOP& kind, const Json::Value& data, const RuleRow& rules) {
+  const auto met = static_cast<std::size_t>(pending.op);
+  const Rule rule = met < rules.meeting.size() ? rules.meeting[met] : Keep;
   if (rule == Keep) return false;
-  if (rule == Merge) pending.MergeData(rec.data);
+  if (rule == Merge) pending.MergeData(data);
   if (rule == Take) {
     pending.op = rules.kind;
-    if (rules.kind == OP_UPDATE_CFG) pending.data = rec.data;
+    if (rules.kind == OP_UPDATE_CFG) pending.data = data;
   }
-  rec.op = OP_NONE;
+  kind = OP_NONE;
   return rule != Drop;
 }
 
@@ -91,6 +109,11 @@ void RefuseNul(const std::string& path) {
   }
 }
 
+const std::string kNoSource;
+
+// How many records ahead of the one that is let go memory is asked for.
+constexpr std::size_t kAhead = 16;
+
 std::string OpenFailure() {
   return std::string("Failed to open queue, reason=") + strerror(errno);
 }
@@ -98,7 +121,9 @@ std::string OpenFailure() {
 }  // namespace
 
 OPTree::OPTree(const std::string& path, Empty)
-    : queue_path(path), root(std::make_shared<OPNode>(nullptr, "")) {}
+    : queue_path(path),
+      root(std::make_shared<OPNode>(nullptr, "")),
+      pool_(std::make_unique<Pool>()) {}
 
 // Delegates first, so that the destructor takes the tree apart when building fails.
 OPTree::OPTree(const std::string& path) : OPTree(path, Empty()) {
@@ -106,12 +131,12 @@ OPTree::OPTree(const std::string& path) : OPTree(path, Empty()) {
 }
 
 OPTree::~OPTree() {
-  spare_.reset();
   // In order of acceptance, in which they lie in memory; the tree's own order is all over the
   // place.
-  for (std::shared_ptr<OP>& rec : ops) {
-    const std::shared_ptr<OPNode> node = rec->node;
-    rec.reset();
+  for (std::size_t i = 0; i < ops.size(); ++i) {
+    if (i + kAhead < ops.size()) Ledger::PrefetchRelease(ops[i + kAhead]->node.get());
+    const std::shared_ptr<OPNode> node = ops[i]->node;
+    ops[i].reset();
     if (node) Ledger::Release(*node);
   }
   std::vector<std::shared_ptr<OPNode>> orphans;
@@ -140,28 +165,33 @@ void OPTree::BuildTree() {
 
 void OPTree::InsertLines(QueueReader& input) {
   LookAhead ahead;
+  std::shared_ptr<OPNode> last;  // of the line before
   while (ahead.Read(input)) {
     for (const QueueLine& line : ahead.lines()) {
       if (log_level == 7) LogLine(QUARRY_SITE("optree"), "Got event: " + std::string(line.text));
-      InsertLine(line, ahead);
+      InsertLine(line, ahead, last);
       if (crashed) return;
     }
   }
 }
 
-void OPTree::InsertLine(const QueueLine& line, LookAhead& ahead) {
+void OPTree::InsertLine(const QueueLine& line, LookAhead& ahead, std::shared_ptr<OPNode>& last) {
   try {
     if (!line.is_usual) {
       InsertEvent(std::make_shared<Event>(std::string(line.text)));
-    } else if (line.directory != nullptr) {
-      Insert(Ledger::Child(*line.directory, line.name, line.hash), line.event,
-             Json::Value::nullSingleton());
-    } else {
-      const std::shared_ptr<OPNode> node = NodeAt(line.event.path);
-      ahead.Learn(line.event.path, *node);
-      Insert(node, line.event, Json::Value::nullSingleton());
+      return;
     }
+    if (line.is_repeated && last) {
+      Ledger::Touch(*last);
+    } else if (line.directory != nullptr) {
+      last = Ledger::Child(*line.directory, line.path.name, line.hash, pool_.get());
+    } else {
+      last = NodeAt(line.event.path);
+      ahead.Learn(line, *last);
+    }
+    Insert(last, line.event, Json::Value::nullSingleton());
   } catch (const Error& error) {
+    last.reset();
     ++skipped_lines_;
     LogError(LogSite{"optree.cpp", __LINE__, "BuildTree"},
              "InsertEvent failed, event_raw=" + std::string(line.text) +
@@ -178,8 +208,18 @@ void OPTree::InsertEvent(std::shared_ptr<Event> event) {
 }
 
 // The path that the node stands for, and the old path, hold no NUL byte.
-void OPTree::Insert(std::shared_ptr<OPNode> node, const EventLine& event, const Json::Value& data) {
-  const std::shared_ptr<OP> rec = NewRecord(node);
+void OPTree::Insert(const std::shared_ptr<OPNode>& node, const EventLine& event,
+                    const Json::Value& data) {
+  if (const RuleRow* const rules = OnlyRules(event)) {
+    FoldOnly(node, *rules);
+  } else {
+    InsertAny(node, event, data);
+  }
+}
+
+void OPTree::InsertAny(std::shared_ptr<OPNode> node, const EventLine& event,
+                       const Json::Value& data) {
+  const auto rec = std::make_shared<OP>(node, OP_NONE, "", Json::Value::nullSingleton());
   const auto has = [&event](EventKind kind) { return (event.op & kind) != 0; };
   const auto has_for_dir = [&](EventKind kind) { return has(kind) && event.is_dir; };
   const auto has_for_file = [&](EventKind kind) { return has(kind) && !event.is_dir; };
@@ -200,16 +240,6 @@ void OPTree::Insert(std::shared_ptr<OPNode> node, const EventLine& event, const 
     Fold(node, rec, kUpdateCfg);
   }
   if (has(EVENT_OVERFLOW)) crashed = true;
-  if (!rec->attached_) spare_ = rec;
-}
-
-// Most events are absorbed by what is pending already: their records are used again.
-std::shared_ptr<OP> OPTree::NewRecord(const std::shared_ptr<OPNode>& node) {
-  const std::shared_ptr<OP> rec = std::move(spare_);
-  if (!rec) return std::make_shared<OP>(node, OP_NONE, "", Json::Value());
-  rec->node = node;
-  if (!rec->data.isNull()) rec->data = Json::Value();
-  return rec;
 }
 
 std::shared_ptr<OPNode> OPTree::GetNodeByPath(const std::string& path) {
@@ -221,7 +251,7 @@ std::shared_ptr<OPNode> OPTree::NodeAt(std::string_view path) {
   const std::shared_ptr<OPNode>* node = &root;
   for (std::size_t begin = 0; begin < path.size();) {
     const std::size_t end = std::min(path.find('/', begin), path.size());
-    if (end != begin) node = &Ledger::Child(**node, path.substr(begin, end - begin));
+    if (end != begin) node = &Ledger::Child(**node, path.substr(begin, end - begin), pool_.get());
     begin = end + 1;
   }
   return *node;
@@ -237,8 +267,18 @@ void OPTree::Attach(const std::shared_ptr<OPNode>& node, const std::shared_ptr<O
 void OPTree::Fold(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& rec,
                   const RuleRow& rules) {
   rec->op = rules.kind;
-  Ledger::ForEachOwn(*node, rec.get(), [&](OP& pending) { return Meet(pending, *rec, rules); });
+  Ledger::ForEachOwn(*node, rec.get(),
+                     [&](OP& pending) { return Meet(pending, rec->op, rec->data, rules); });
   if (rec->op != OP_NONE) Attach(node, rec);
+}
+
+// Most events are absorbed by what is pending already: only the others get a record.
+void OPTree::FoldOnly(const std::shared_ptr<OPNode>& node, const RuleRow& rules) {
+  FileIndexOP kind = rules.kind;
+  const Json::Value& no_data = Json::Value::nullSingleton();
+  Ledger::ForEachOwn(*node, nullptr,
+                     [&](OP& pending) { return Meet(pending, kind, no_data, rules); });
+  if (kind != OP_NONE) Attach(node, pool_->Make<OP>(node, kind, kNoSource, no_data));
 }
 
 void OPTree::HandleCreate(std::shared_ptr<OPNode> node, std::shared_ptr<OP> rec) {
@@ -274,7 +314,7 @@ void OPTree::HandleRename(std::shared_ptr<OPNode> node, std::shared_ptr<OP> rec)
     CancelReplaced(*node, rec.get());
     // An old path without components names nothing that could have been moved.
     if (source != root) {
-      carriers = Relocation(*source, *node).Deliver(rec.get(), unsettled_);
+      carriers = Relocation(*source, *node, *pool_).Deliver(rec.get(), unsettled_);
     }
   }
   Attach(node, rec);

@@ -38,6 +38,7 @@ struct QueueLine;
 class OPNode;
 class LookAhead;
 class OPTree;
+class Pool;
 class QueueReader;
 struct RuleRow;
 
@@ -55,12 +56,14 @@ class QUARRY_EXPORT OP {
 
   std::shared_ptr<OPNode> node;  // the path that the operation is about
   FileIndexOP op;
-  std::string src;   // OP_RENAME: the old full path
-  Json::Value data;  // OP_UPDATE_CFG: the change
 
  private:
   friend class OPTree;
-  bool attached_ = false;  // it is in its tree's list and in a node's
+  bool attached_ = false;  // it is in its tree's list and in a node's; here it takes up no room
+
+ public:
+  std::string src;   // OP_RENAME: the old full path
+  Json::Value data;  // OP_UPDATE_CFG: the change
 };
 
 // One path component. A parent and its children hold each other, so the owner of a tree breaks the
@@ -170,17 +173,18 @@ class QUARRY_EXPORT OPTree {
   OPTree(const std::string& path, Empty);
 
   void InsertLines(QueueReader& input);
-  void InsertLine(const QueueLine& line, LookAhead& ahead);
-  void Insert(std::shared_ptr<OPNode> node, const EventLine& event, const Json::Value& data);
-  std::shared_ptr<OP> NewRecord(const std::shared_ptr<OPNode>& node);
+  void InsertLine(const QueueLine& line, LookAhead& ahead, std::shared_ptr<OPNode>& last);
+  void Insert(const std::shared_ptr<OPNode>& node, const EventLine& event, const Json::Value& data);
+  void InsertAny(std::shared_ptr<OPNode> node, const EventLine& event, const Json::Value& data);
   std::shared_ptr<OPNode> NodeAt(std::string_view path);
   void Attach(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& rec);
   void Fold(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& rec,
             const RuleRow& rules);
+  void FoldOnly(const std::shared_ptr<OPNode>& node, const RuleRow& rules);
   void Settle();
 
+  std::unique_ptr<Pool> pool_;      // of most nodes and records
   std::vector<OPNode*> unsettled_;  // nodes whose lists are not in order yet
-  std::shared_ptr<OP> spare_;       // a record that was not attached
   bool building_ = false;           // nobody looks at the lists yet
   std::size_t skipped_lines_ = 0;
 };

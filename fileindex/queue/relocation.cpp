@@ -4,7 +4,7 @@
 
 namespace quarry::fileindex {
 
-Relocation::Relocation(OPNode& source, OPNode& destination) {
+Relocation::Relocation(OPNode& source, OPNode& destination, Pool& pool) : pool_(pool) {
   stops_.push_back({&source, 0, &destination});
   Load(stops_.front());
   Collect(source, destination);
@@ -44,7 +44,7 @@ OPNode& Relocation::Target(std::size_t index) {
   }
   for (auto at = missing.rbegin(); at != missing.rend(); ++at) {
     Stop& stop = stops_[*at];
-    stop.to = Ledger::Child(*stops_[stop.above].to, stop.from->name).get();
+    stop.to = Ledger::Child(*stops_[stop.above].to, stop.from->name, &pool_).get();
   }
   return *stops_[index].to;
 }

@@ -19,8 +19,8 @@ class Relocation {
  public:
   // Takes the records of `source` and of the nodes below it where something is pending. Those that
   // can be done at the new place as well are cancelled. Both nodes must outlive this object, and
-  // differ.
-  Relocation(OPNode& source, OPNode& destination);
+  // differ. New nodes come out of the pool.
+  Relocation(OPNode& source, OPNode& destination, Pool& pool);
 
   // Hands all records to their new nodes and adds those whose lists are to be settled to
   // `unsettled`. Returns the work to be done there, one record per node, parents first, not
@@ -41,6 +41,7 @@ class Relocation {
   static void Load(Stop& stop);
   OPNode& Target(std::size_t index);
 
+  Pool& pool_;
   std::vector<Stop> stops_;  // in walk order, the source first
 };
 

@@ -61,6 +61,28 @@ TEST_F(BoundsTest, DirectoryOfAMillionFiles) {
   EXPECT_EQ(Pending(), 1'000'000);
 }
 
+// More than are remembered at a time; each is met again when it has been forgotten.
+TEST_F(BoundsTest, FilesInManyDirectoriesInTurn) {
+  std::string lines;
+  for (int turn = 0; turn < 2; ++turn) {
+    for (int i = 0; i < 40'000; ++i) {
+      const std::string directory = Nth("/s/directory-", i);
+      lines += Line(EVENT_MODIFY, directory + Nth("/file-", turn));
+      lines += Line(EVENT_MODIFY, directory + "/same");
+    }
+  }
+  const QueueFile queue(lines);
+  OPTree tree(queue.path());
+  ASSERT_EQ(tree.ops.size(), 120'000u);
+  EXPECT_EQ(tree.GetNodeByPath("/s")->children.size(), 40'000u);
+  const auto& last = tree.GetNodeByPath("/s/directory-39999")->children;
+  ASSERT_EQ(last.size(), 3u);
+  EXPECT_EQ(last[0]->name, "file-0");
+  EXPECT_EQ(last[1]->name, "same");
+  EXPECT_EQ(last[1]->ops.size(), 1u);
+  EXPECT_EQ(last[2]->name, "file-1");
+}
+
 TEST_F(BoundsTest, PathOfTwoThousandComponents) {
   std::string path;
   for (int i = 0; i < 2000; ++i) path += Nth("/component-", i);
