@@ -95,18 +95,15 @@ void Client::Wait(short events, const Deadline& deadline) {
   if (ready < 0 && errno != EINTR) Broken("cannot be waited for: " + ErrnoText());
 }
 
-void Client::SendAll(const std::string& bytes, const Deadline& deadline) {
-  std::size_t done = 0;
-  while (done < bytes.size()) {
-    const std::size_t size = std::min(bytes.size() - done, kPieceBytes);
-    const ssize_t sent = send(fd_.get(), bytes.data() + done, size, MSG_NOSIGNAL | MSG_DONTWAIT);
-    if (sent >= 0) {
-      done += static_cast<std::size_t>(sent);
-    } else if (errno == EAGAIN) {
-      Wait(POLLOUT, deadline);
-    } else if (errno != EINTR) {
-      Broken("hung up while the request was sent: " + ErrnoText());
-    }
+void Client::SendFrame(std::string text, const Deadline& deadline) {
+  FrameWriter writer;
+  writer.Set(std::move(text));
+  for (;;) {
+    errno = 0;
+    const FrameStatus status = writer.Write(fd_.get());
+    if (status == FrameStatus::kDone) return;
+    if (status == FrameStatus::kEnd) Broken("hung up while the request was sent: " + ErrnoText());
+    if (status == FrameStatus::kAgain) Wait(POLLOUT, deadline);
   }
 }
 
@@ -142,19 +139,24 @@ std::string Client::RecvFrame(const Deadline& deadline) {
   return text;
 }
 
-Json::Value Client::Request(const Json::Value& request) {
-  const std::string text = toString(request);
-  if (text.size() > std::numeric_limits<std::uint32_t>::max()) {
+std::string Client::RequestText(std::string request) {
+  if (request.size() > std::numeric_limits<std::uint32_t>::max()) {
     throw Error(kErrorSystem, "A request of 4 GiB or more cannot be sent to " + daemon_ + ".");
   }
   if (fd_.valid() && IsStale()) fd_.Reset();
   if (!fd_.valid()) Connect();
   const Deadline deadline(options_.timeout);
-  SendAll(MakeFrame(text), deadline);
+  SendFrame(std::move(request), deadline);
   std::string reply = RecvFrame(deadline);
   if (!reply.empty() && reply.back() == '\0') reply.pop_back();
+  return reply;
+}
+
+Json::Value Client::Request(const Json::Value& request) {
   Json::Value value;
-  if (!fromString(value, reply)) Broken("answered with something that is no JSON");
+  if (!fromString(value, RequestText(toString(request)))) {
+    Broken("answered with something that is no JSON");
+  }
   return value;
 }
 

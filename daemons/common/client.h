@@ -35,12 +35,16 @@ class Client {
   // was no JSON. After a failure the next request connects anew. A request is never sent twice.
   Json::Value Request(const Json::Value& request);
 
+  // The same for the text of a request that was written already; returns the text of the answer,
+  // which may be no JSON.
+  std::string RequestText(std::string request);
+
  private:
   class Deadline;
   void Connect();
   bool IsStale() const;
   void Wait(short events, const Deadline& deadline);
-  void SendAll(const std::string& bytes, const Deadline& deadline);
+  void SendFrame(std::string text, const Deadline& deadline);
   void RecvAll(char* buffer, std::size_t size, const Deadline& deadline);
   std::string RecvFrame(const Deadline& deadline);
   [[noreturn]] void Broken(const std::string& what);

@@ -1,5 +1,6 @@
 #include "daemons/fileindexd/document_writer.h"
 
+#include <algorithm>
 #include <utility>
 
 #include "daemons/common/log.h"
@@ -23,20 +24,45 @@ DocumentWriter::DocumentWriter(Index& index, FileSystem& files, TaskLane& lane, 
       lane_(lane),
       progress_(progress),
       aside_(aside),
-      may_remove_(std::move(may_remove)) {}
+      may_remove_(std::move(may_remove)),
+      upsert_together_([this](const auto& wishes) { return UpsertTogether(wishes); }) {}
+
+std::function<void()> DocumentWriter::Task(const std::string& path, const std::string& name,
+                                           std::function<void()> change) {
+  return [this, path, name, change = std::move(change)] {
+    progress_.Begin(path);
+    aside_.Try(name, change);
+    progress_.TakeWaiting(path);
+  };
+}
 
 void DocumentWriter::Submit(const std::string& path, const std::string& name,
                             std::function<void()> change) {
   progress_.AddWaiting(path);
-  lane_.Submit(path, [this, path, name, change = std::move(change)] {
-    progress_.Begin(path);
-    aside_.Try(name, change);
-    progress_.TakeWaiting(path);
-  });
+  lane_.Submit(path, Task(path, name, std::move(change)));
 }
 
 void DocumentWriter::Upsert(const std::string& path, bool need_meta) {
-  Submit(path, path, [this, path, need_meta] { UpsertNow(path, need_meta); });
+  progress_.AddWaiting(path);
+  lane_.SubmitSmall({path, need_meta},
+                    Task(path, path, [this, path, need_meta] { UpsertNow(path, need_meta); }),
+                    upsert_together_);
+}
+
+std::vector<bool> DocumentWriter::UpsertTogether(const std::vector<Wish>& wishes) {
+  if (std::any_of(wishes.begin(), wishes.end(),
+                  [&](auto& wish) { return aside_.Has(wish.path); })) {
+    return std::vector<bool>(wishes.size(), false);
+  }
+  progress_.Begin(wishes.front().path);
+  std::vector<bool> done = index_.UpsertMany(wishes);
+  for (std::size_t i = 0; i < wishes.size(); ++i) {
+    if (!done[i]) continue;
+    progress_.Begin(wishes[i].path);
+    progress_.Done(wishes[i].path);
+    progress_.TakeWaiting(wishes[i].path);
+  }
+  return done;
 }
 
 void DocumentWriter::ReplaceDirectory(const std::string& path, bool need_meta) {

@@ -6,6 +6,7 @@
 #include <functional>
 #include <optional>
 #include <string>
+#include <vector>
 
 #include "common/error.h"
 #include "daemons/fileindexd/file_system.h"
@@ -18,13 +19,15 @@ namespace quarry::fileindexd {
 
 // Each member hands one change to the lane and returns; it may block until the lane has room and
 // throws what an earlier change failed with. A change that fails because of its own file is counted
-// and logged, any other failure ends the lane. What is set aside is left out. One thread calls.
+// and logged, any other failure ends the lane. What is set aside is left out. Documents that are to
+// be made anew at the same time are made together; where that fails for one it is tried by itself.
+// One thread calls.
 class DocumentWriter {
  public:
   // Throws Error when it is doubtful that what is missing was deleted: the whole share is gone.
   using RemovalGuard = std::function<void()>;
 
-  // What is given must outlive the writer, and the lane must be drained or destroyed before it.
+  // What is given must outlive the writer, and the lane must be drained or ended before it.
   DocumentWriter(Index& index, FileSystem& files, TaskLane& lane, Progress& progress,
                  SetAside& aside, RemovalGuard may_remove);
 
@@ -43,6 +46,9 @@ class DocumentWriter {
 
  private:
   void Submit(const std::string& path, const std::string& name, std::function<void()> change);
+  std::function<void()> Task(const std::string& path, const std::string& name,
+                             std::function<void()> change);
+  std::vector<bool> UpsertTogether(const std::vector<Wish>& wishes);
   void UpsertNow(const std::string& path, bool need_meta);
   void SetAttributesNow(const std::string& path);
   void RemoveTreeNow(const std::string& path);
@@ -57,6 +63,7 @@ class DocumentWriter {
   Progress& progress_;
   SetAside& aside_;
   RemovalGuard may_remove_;
+  const TaskLane::Joint upsert_together_;
 };
 
 }  // namespace quarry::fileindexd

@@ -11,6 +11,7 @@
 #include "common/json.h"
 #include "common/paths.h"
 #include "daemons/common/client.h"
+#include "daemons/fileindexd/document_carrier.h"
 #include "daemons/tarncontentextractd/stamp.h"
 
 namespace quarry::fileindexd {
@@ -117,6 +118,12 @@ void ElasticIndex::Commit() {
 void ElasticIndex::Upsert(const std::string& path, bool need_meta) {
   const Exchange exchange(rest_);
   elastic::IndexUpsert(share_, path, need_meta);
+}
+
+std::vector<bool> ElasticIndex::UpsertMany(const std::vector<Wish>& wishes) {
+  static const DocumentCarrier::Sockets sockets{ExtractorSocketPath(), EngineSocketPath()};
+  thread_local DocumentCarrier carrier(sockets);
+  return carrier.Carry(id_, wishes);
 }
 
 void ElasticIndex::SetAttributes(const std::string& path) {

@@ -28,6 +28,7 @@ class ElasticIndex : public Index {
   void Commit() override;
   std::uint64_t Count() override;
   void Upsert(const std::string& path, bool need_meta) override;
+  std::vector<bool> UpsertMany(const std::vector<Wish>& wishes) override;
   void SetAttributes(const std::string& path) override;
   void Delete(const std::string& path) override;
   void DeleteBelow(const std::string& dir) override;

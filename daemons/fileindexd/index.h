@@ -19,6 +19,12 @@ struct Document {
   std::string content_stamp;    // empty: its content was not asked for
 };
 
+// A document that is to be made anew, its content with `need_meta`.
+struct Wish {
+  std::string path;
+  bool need_meta = false;
+};
+
 // Places are absolute paths without a "/" at their end. Every member blocks until the engine has
 // answered, throws Error, and may be called from several threads at once.
 class Index {
@@ -37,6 +43,9 @@ class Index {
 
   // Reads the place and replaces its whole document. Throws Error 914 when it cannot be read.
   virtual void Upsert(const std::string& path, bool need_meta) = 0;
+  // The same for many at once, as one piece of work. Returns for each whether it is done: where
+  // anything at all is in the way it is not, and Upsert() will tell what. Throws nothing.
+  virtual std::vector<bool> UpsertMany(const std::vector<Wish>& wishes) = 0;
   // Reads the place's attributes and merges them into its document.
   virtual void SetAttributes(const std::string& path) = 0;
   // Removes one document; none is no failure.

@@ -42,7 +42,9 @@ class Pass {
  public:
   explicit Pass(const PassSetup& setup)
       : setup_(setup),
-        lane_(setup.threads, setup.slots),
+        // The culprit is only found where each piece of work is done by itself.
+        lane_(setup.threads, setup.slots, &setup.gate,
+              setup.aside.IsSearching() ? 1 : TaskLane::kMostTogether),
         writer_(setup.index, setup.survey.files(), lane_, setup.progress, setup.aside,
                 [this] { CheckRoot(); }),
         handler_(

@@ -119,7 +119,7 @@ void Reconciler::VisitDirectory(const std::string& dir) {
   }
   std::sort(names.begin(), names.end());
   // What is still being done below the directory would make the answers out of date.
-  tools_.lane.Settle(dir);
+  tools_.lane.SettleBelow(dir);
   ChildCursor documents(tools_.index, dir);
   for (const std::string& name : names) {
     tools_.gate.Pass();

@@ -35,6 +35,8 @@ class SetAside {
   // A pass begins. `can_read`: the reader of files runs, so that it is some file's fault when it
   // does not run any longer.
   void BeginPass(bool can_read);
+  // Whether that piece of work is set aside.
+  bool Has(const std::string& name) const;
   // Does the work unless it is set aside. Throws what the work throws.
   void Try(const std::string& name, const std::function<void()>& work);
   // The document of that path, and with `below` all below it, is gone, and its troubles with it.
@@ -62,7 +64,6 @@ class SetAside {
     std::string error;
   };
 
-  bool Has(const std::string& name) const;
   void Blame(const std::string& name, const std::string& error);
   bool MakeRoom();
 

@@ -87,26 +87,52 @@ Json::Value ExtractService::ParseFile(const std::string& given_path, bool need_m
   return document;
 }
 
-Json::Value ExtractService::Answer(const std::string& request) {
-  Json::Value json;
-  if (!fromString(json, request)) throw Error(kErrorBadParameter, "The request is not JSON");
-  std::string command;
-  Json::Value data;
+Json::Value ExtractService::ParseAsked(const Json::Value& data) {
   std::string path;
   Json::Value options;
   bool need_meta = false;
-  GetJsonValue(command, json, "command", true);
-  if (command != "parse") throw Error(kErrorBadParameter, "Unknown command: " + command);
-  GetJsonValue(data, json, "data", true);
   GetJsonValue(path, data, "path", true);
   GetJsonValue(options, data, "options", false);
   GetJsonValue(need_meta, options, "need_meta", isObject(options) && options.isMember("need_meta"));
-  return daemon::SuccessReply(ParseFile(path, need_meta));
+  return ParseFile(path, need_meta);
+}
+
+std::string ExtractService::ParseMany(const Json::Value& data) {
+  Json::Value files;
+  GetJsonValue(files, data, "files", true);
+  if (!files.isArray()) throw Error(kErrorBadParameter, "Not an array: files");
+  const auto end = std::chrono::steady_clock::now() + kManyTime;
+  std::string documents;
+  for (const Json::Value& file : files) {
+    if (!documents.empty()) documents += ',';
+    try {
+      documents += toString(ParseAsked(file));
+    } catch (const Error& error) {
+      if (error.code() == kErrorSystem) throw;
+      documents += "null";
+    }
+    if (documents.size() >= kManyBytes || std::chrono::steady_clock::now() >= end) break;
+  }
+  return "{\"data\":[" + documents + "],\"success\":true}";
+}
+
+std::string ExtractService::Answer(const Json::Value& request) {
+  std::string command;
+  Json::Value data;
+  GetJsonValue(command, request, "command", true);
+  if (command != "parse" && command != "parse_many") {
+    throw Error(kErrorBadParameter, "Unknown command: " + command);
+  }
+  GetJsonValue(data, request, "data", true);
+  if (command == "parse_many") return ParseMany(data);
+  return toString(daemon::SuccessReply(ParseAsked(data)));
 }
 
 std::string ExtractService::Handle(const std::string& request) {
   try {
-    return toString(Answer(request));
+    Json::Value json;
+    if (!fromString(json, request)) throw Error(kErrorBadParameter, "The request is not JSON");
+    return Answer(json);
   } catch (const Error& error) {
     return toString(daemon::FailureReply(error.code(), error.reason()));
   }

@@ -5,6 +5,7 @@
 
 #include <json/json.h>
 
+#include <chrono>
 #include <cstddef>
 #include <string>
 
@@ -16,6 +17,11 @@ namespace quarry::extract {
 
 inline constexpr std::size_t kMaxBadFiles = 10000;
 inline constexpr std::size_t kMaxBadFileBytes = std::size_t{8} << 20;
+
+// A request for many documents is answered once there are so many bytes of them, or so much time
+// has passed: whoever asks holds them all, and may have been told to stop.
+inline constexpr std::size_t kManyBytes = std::size_t{1} << 20;
+inline constexpr std::chrono::milliseconds kManyTime(300);
 
 // Makes documents of files. Any thread, any number at once.
 class ExtractService {
@@ -32,7 +38,9 @@ class ExtractService {
   Json::Value ParseFile(const std::string& path, bool need_meta);
 
  private:
-  Json::Value Answer(const std::string& request);
+  std::string Answer(const Json::Value& request);
+  Json::Value ParseAsked(const Json::Value& data);
+  std::string ParseMany(const Json::Value& data);
   bool AddContent(const std::string& path, int place, const Attributes& attributes,
                   Json::Value& document);
 

@@ -39,6 +39,7 @@ class Source {
   int fd_;
   std::string extension_;
   std::string bytes_;
+  std::size_t step_ = 0;  // bytes to make room for at a time; 0: not yet known
   bool at_end_ = false;
 };
 

@@ -1,5 +1,6 @@
 #include "daemons/tarncontentextractd/worker.h"
 
+#include <malloc.h>
 #include <sys/time.h>
 #include <unistd.h>
 
@@ -21,6 +22,15 @@ void SetTimer(int seconds) {
   itimerval timer{};
   timer.it_value.tv_sec = seconds;
   setitimer(ITIMER_REAL, &timer, nullptr);
+}
+
+// What one file's text took serves the next one's. Given back in between, it would be asked for and
+// cleared page by page for each file. The sandbox bounds the whole.
+void KeepSomeHeap() {
+#ifdef __GLIBC__
+  mallopt(M_MMAP_THRESHOLD, 4 << 20);
+  mallopt(M_TRIM_THRESHOLD, 4 << 20);
+#endif
 }
 
 // Libraries fetch data at first use; what they open must be open before the sandbox closes.
@@ -76,6 +86,7 @@ void ServeFiles(const Registry& registry, int channel, int seconds) {
 
 int RunWorker(const Registry& registry, int channel) {
   closefrom(channel + 1);
+  KeepSomeHeap();
   LoadData();
   std::string problem = CloseSandbox(channel);
   if (problem.empty()) problem = FindGap();

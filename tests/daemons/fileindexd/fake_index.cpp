@@ -1,5 +1,8 @@
 #include "tests/daemons/fileindexd/fake_index.h"
 
+#include <algorithm>
+#include <iterator>
+
 #include "common/error.h"
 #include "common/file_util.h"
 #include "daemons/tarnelasticd/engine_error.h"
@@ -19,6 +22,12 @@ void FakeIndex::Enter(const std::string& command, bool changes) {
   if (!exists_ && command != "epoch" && command != "create") {
     throw Error(engine::kUnknownIndex, "Request failed, msg=There is no such index");
   }
+}
+
+void FakeIndex::Unrecord(const std::string& command) {
+  const std::lock_guard<std::mutex> lock(mutex_);
+  const auto last = std::find(commands_.rbegin(), commands_.rend(), command);
+  if (last != commands_.rend()) commands_.erase(std::next(last).base());
 }
 
 std::vector<std::string> FakeIndex::Commands() const {
@@ -124,6 +133,20 @@ void FakeIndex::Upsert(const std::string& path, bool need_meta) {
   const std::lock_guard<std::mutex> lock(mutex_);
   const bool is_dir = place.kind != PlaceKind::kFile;
   documents_[path] = {path, is_dir, place.attribute_stamp, need_meta ? place.content_stamp : ""};
+}
+
+std::vector<bool> FakeIndex::UpsertMany(const std::vector<Wish>& wishes) {
+  std::vector<bool> done;
+  for (const auto& [path, need_meta] : wishes) {
+    try {
+      Upsert(path, need_meta);
+      done.push_back(true);
+    } catch (const std::exception&) {
+      Unrecord("upsert " + path + (need_meta ? " content" : ""));
+      done.push_back(false);
+    }
+  }
+  return done;
 }
 
 void FakeIndex::SetAttributes(const std::string& path) {

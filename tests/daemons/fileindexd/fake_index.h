@@ -48,6 +48,8 @@ class FakeIndex : public Index {
   void Commit() override;
   std::uint64_t Count() override;
   void Upsert(const std::string& path, bool need_meta) override;
+  // One after the other, each recorded as an Upsert() is if it succeeds.
+  std::vector<bool> UpsertMany(const std::vector<Wish>& wishes) override;
   void SetAttributes(const std::string& path) override;
   void Delete(const std::string& path) override;
   void DeleteBelow(const std::string& dir) override;
@@ -61,6 +63,7 @@ class FakeIndex : public Index {
 
  private:
   void Enter(const std::string& command, bool changes);
+  void Unrecord(const std::string& command);
   Place Parse(const std::string& path, bool need_meta);
 
   FakeDisk& disk_;

@@ -24,6 +24,9 @@ class SharedIndex : public Index {
   void Commit() override { index_.Commit(); }
   std::uint64_t Count() override { return index_.Count(); }
   void Upsert(const std::string& path, bool need_meta) override { index_.Upsert(path, need_meta); }
+  std::vector<bool> UpsertMany(const std::vector<Wish>& wishes) override {
+    return index_.UpsertMany(wishes);
+  }
   void SetAttributes(const std::string& path) override { index_.SetAttributes(path); }
   void Delete(const std::string& path) override { index_.Delete(path); }
   void DeleteBelow(const std::string& dir) override { index_.DeleteBelow(dir); }

@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
+#include <deque>
 #include <future>
 #include <map>
 #include <random>
@@ -227,6 +228,235 @@ TEST_F(TaskLaneTest, KeepsTheOrderOfRandomTasks) {
   }
   lane.Drain();
   EXPECT_TRUE(in_order);
+}
+
+using Paths = std::vector<std::string>;
+using Wishes = std::vector<Wish>;
+
+Paths PathsOf(const Wishes& wishes) {
+  Paths paths;
+  for (const Wish& wish : wishes) paths.push_back(wish.path);
+  return paths;
+}
+
+// Small tasks that are recorded as they are done, together or alone.
+class SmallTasksTest : public TaskLaneTest {
+ protected:
+  // Records places done together, of which those that end in "!" cannot be, after the first of all
+  // has waited to be let go.
+  const TaskLane::Joint joint_ = [this](const Wishes& wishes) {
+    const Paths paths = PathsOf(wishes);
+    if (!first_done_.exchange(true)) first_.Task()();
+    std::vector<bool> done;
+    const std::lock_guard<std::mutex> lock(mutex_);
+    together_.push_back(paths);
+    for (const std::string& path : paths) done.push_back(path.back() != '!');
+    return done;
+  };
+  std::function<void()> Alone(const std::string& path) {
+    return [this, path] {
+      const std::lock_guard<std::mutex> lock(mutex_);
+      alone_.push_back(path);
+    };
+  }
+  void Submit(TaskLane& lane, const std::string& path) {
+    lane.SubmitSmall({path}, Alone(path), joint_);
+  }
+
+  Held first_;
+  std::atomic<bool> first_done_{false};
+  std::mutex mutex_;
+  std::vector<std::vector<std::string>> together_;
+  std::vector<std::string> alone_;
+};
+
+TEST_F(SmallTasksTest, WhatWaitsIsDoneTogetherAndNothingWaitsForOthers) {
+  TaskLane lane(1, slots_, nullptr, 3);
+  Submit(lane, "/1");
+  ASSERT_TRUE(first_.WaitBegun());
+  for (const char* path : {"/2", "/3", "/4", "/5"}) Submit(lane, path);
+  first_.Go();
+  lane.Drain();
+  EXPECT_EQ(together_, (std::vector<Paths>{{"/1"}, {"/2", "/3", "/4"}, {"/5"}}));
+  EXPECT_TRUE(alone_.empty());
+}
+
+TEST_F(SmallTasksTest, OnlyTasksOfOneKindAreDoneTogether) {
+  TaskLane lane(1, slots_, nullptr, 10);
+  const TaskLane::Joint other = joint_;
+  Submit(lane, "/1");
+  ASSERT_TRUE(first_.WaitBegun());
+  Submit(lane, "/2");
+  lane.SubmitSmall({"/3"}, Alone("/3"), other);
+  Submit(lane, "/4");
+  lane.Submit("/5", Alone("/5"));
+  Submit(lane, "/6");
+  first_.Go();
+  lane.Drain();
+  EXPECT_EQ(together_, (std::vector<Paths>{{"/1"}, {"/2", "/4", "/6"}, {"/3"}}));
+  EXPECT_EQ(alone_, Paths{"/5"});
+}
+
+TEST_F(SmallTasksTest, MayLieAboveAndBelowEachOtherButNotOnTheSamePlace) {
+  TaskLane lane(2, slots_, nullptr, 10);
+  Submit(lane, "/a");
+  ASSERT_TRUE(first_.WaitBegun());
+  Submit(lane, "/a/b");
+  lane.SettleBelow("/a");
+  EXPECT_EQ(together_, std::vector<Paths>{{"/a/b"}});
+  std::atomic<bool> submitted{false};
+  std::thread submitter([&] {
+    Submit(lane, "/a");
+    submitted = true;
+  });
+  EXPECT_FALSE(submitted);
+  first_.Go();
+  submitter.join();
+  lane.Drain();
+  EXPECT_EQ(together_, (std::vector<Paths>{{"/a/b"}, {"/a"}, {"/a"}}));
+}
+
+TEST_F(SmallTasksTest, WhatCannotBeDoneTogetherIsDoneAloneAfterwards) {
+  TaskLane lane(1, slots_, nullptr, 10);
+  Submit(lane, "/1");
+  ASSERT_TRUE(first_.WaitBegun());
+  for (const char* path : {"/a!", "/b", "/a!/c", "/d!"}) Submit(lane, path);
+  first_.Go();
+  lane.Drain();
+  EXPECT_EQ(together_, (std::vector<Paths>{{"/1"}, {"/a!", "/b", "/a!/c", "/d!"}}));
+  EXPECT_EQ(alone_, (Paths{"/a!", "/d!"}));
+}
+
+TEST_F(SmallTasksTest, WhatIsDoneAloneWaitsForWhatItMeets) {
+  TaskLane lane(2, slots_, nullptr, 1000);
+  Held below;
+  std::atomic<bool> above{false};
+  const TaskLane::Joint slow = [&](const Wishes& wishes) {
+    below.Task()();
+    return std::vector<bool>(wishes.size(), true);
+  };
+  const TaskLane::Joint never = [](const Wishes& wishes) {
+    return std::vector<bool>(wishes.size(), false);
+  };
+  lane.SubmitSmall(
+      {"/a/b"}, [] {}, slow);
+  ASSERT_TRUE(below.WaitBegun());
+  lane.SubmitSmall(
+      {"/a"}, [&] { above = true; }, never);
+  lane.SubmitSmall(
+      {"/c"}, [] {}, never);
+  lane.Settle("/c");
+  EXPECT_FALSE(above);
+  below.Go();
+  lane.Drain();
+  EXPECT_TRUE(above);
+}
+
+TEST_F(SmallTasksTest, TakesSoManyMoreOfThemAhead) {
+  TaskLane lane(1, slots_, nullptr, 3);
+  std::atomic<int> submitted{0};
+  std::thread submitter([&] {
+    for (int i = 0; i < 9; ++i) {
+      Submit(lane, "/" + std::to_string(i));
+      ++submitted;
+    }
+  });
+  EXPECT_TRUE(first_.WaitBegun());
+  EXPECT_TRUE(WaitUntil([&] { return submitted == 6; }));
+  EXPECT_EQ(6, submitted);
+  first_.Go();
+  submitter.join();
+  lane.Drain();
+}
+
+TEST_F(SmallTasksTest, WithNoOthersEachIsDoneAlone) {
+  TaskLane lane(2, slots_, nullptr, 1);
+  for (int i = 0; i < 20; ++i) Submit(lane, "/" + std::to_string(i));
+  lane.Drain();
+  EXPECT_TRUE(together_.empty());
+  EXPECT_EQ(alone_.size(), 20U);
+}
+
+TEST_F(TaskLaneTest, BeginsNothingWhileTheGateIsClosed) {
+  Gate gate;
+  gate.SetPaused(true);
+  TaskLane lane(2, slots_, &gate);
+  std::atomic<int> done{0};
+  lane.Submit("/a", [&] { ++done; });
+  lane.Submit("/b", [&] { ++done; });
+  EXPECT_EQ(0, done);
+  gate.SetPaused(false);
+  lane.Drain();
+  EXPECT_EQ(2, done);
+  gate.Stop();
+  lane.Submit("/c", [&] { ++done; });
+  EXPECT_THROW(lane.Drain(), Interrupted);
+  EXPECT_EQ(2, done);
+}
+
+TEST_F(SmallTasksTest, AFailureOfSeveralEndsTheLane) {
+  TaskLane lane(1, slots_);
+  const TaskLane::Joint broken = [](const Wishes&) -> std::vector<bool> {
+    throw Error(913, "broken");
+  };
+  lane.SubmitSmall(
+      {"/a"}, [] {}, broken);
+  EXPECT_THROW(lane.Drain(), Error);
+}
+
+// As KeepsTheOrderOfRandomTasks, with small tasks among them that cannot be done together now and
+// then.
+TEST_F(SmallTasksTest, KeepsTheOrderOfRandomTasks) {
+  std::mt19937 random(7);
+  std::mt19937 luck(8);
+  std::mutex mutex;
+  std::map<std::string, std::deque<int>> submitted;     // small ones
+  std::map<std::pair<std::string, bool>, int> last_at;  // by place and whether it was a small one
+  bool in_order = true;
+  int count = 0;
+  const auto record = [&](int number, const std::string& path, bool small) {
+    ++count;
+    for (const auto& [place, last] : last_at) {
+      const bool meet = small && place.second ? place.first == path : PathsMeet(place.first, path);
+      if (meet && last > number) in_order = false;
+    }
+    last_at[{path, small}] = number;
+  };
+  const TaskLane::Joint joint = [&](const Wishes& wishes) {
+    const std::lock_guard<std::mutex> lock(mutex);
+    std::vector<bool> done;
+    for (const std::string& path : PathsOf(wishes)) {
+      done.push_back(luck() % 4 != 0);
+      if (done.back()) record(submitted[path].front(), path, true);
+      submitted[path].pop_front();
+    }
+    return done;
+  };
+  TaskLane lane(4, slots_, nullptr, 5);
+  for (int i = 0; i < 3000; ++i) {
+    std::string path;
+    for (std::size_t depth = random() % 3 + 1; depth > 0; --depth) {
+      path += "/" + std::to_string(random() % 4);
+    }
+    const bool small = random() % 3 != 0;
+    const auto task = [&, i, path, small] {
+      const std::lock_guard<std::mutex> lock(mutex);
+      record(i, path, small);
+    };
+    if (small) {
+      {
+        const std::lock_guard<std::mutex> lock(mutex);
+        submitted[path].push_back(i);
+      }
+      lane.SubmitSmall({path}, task, joint);
+    } else {
+      lane.Submit(path, task);
+    }
+    if (random() % 50 == 0) lane.SettleBelow(path);
+  }
+  lane.Drain();
+  EXPECT_TRUE(in_order);
+  EXPECT_EQ(3000, count);
 }
 
 }  // namespace

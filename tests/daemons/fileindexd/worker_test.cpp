@@ -495,7 +495,7 @@ TEST_F(WorkerTest, AFileThatChangesAllTheTimeKeepsNoOtherWaiting) {
 
 TEST_F(WorkerTest, AStopInTheMiddleLeavesTheSnapshotAndIsNoFailure) {
   worker_->Step();
-  for (int i = 0; i < 50; ++i) {
+  for (int i = 0; i < 500; ++i) {
     const std::string path = "/v/s/" + std::to_string(i) + ".txt";
     disk_.WriteFile(path);
     Queue(EVENT_CREATE, path);

@@ -65,6 +65,64 @@ class ServiceTest : public ::testing::Test {
   ExtractService service_;
 };
 
+// A request for the documents of these paths, which need no escaping.
+std::string ManyRequest(const std::vector<std::string>& paths, bool need_meta) {
+  std::string request = "{\"command\":\"parse_many\",\"data\":{\"files\":[";
+  for (const std::string& path : paths) {
+    if (request.back() != '[') request += ',';
+    request += R"({"path":")" + path + R"(","options":{"need_meta":)";
+    request += need_meta ? "true}}" : "false}}";
+  }
+  return request + "]}}";
+}
+
+TEST_F(ServiceTest, ManyDocumentsAreThoseOfEachPath) {
+  test::WriteFile(dir_ / "b.txt", "Other words");
+  const std::vector<std::string> paths = {dir_ / "page.html", dir_ / "missing", dir_ / "b.txt",
+                                          dir_.path(), "relative"};
+  for (const bool need_meta : {true, false}) {
+    const Json::Value answer = Ask(ManyRequest(paths, need_meta));
+    EXPECT_EQ(answer.getMemberNames(), (Json::Value::Members{"data", "success"}));
+    EXPECT_TRUE(answer["success"].asBool());
+    const Json::Value& data = answer["data"];
+    ASSERT_EQ(data.size(), paths.size());
+    for (const Json::ArrayIndex i : {0, 2, 3}) {
+      EXPECT_EQ(data[i], service_.ParseFile(paths[i], need_meta)) << paths[i];
+    }
+    EXPECT_TRUE(data[1].isNull());
+    EXPECT_TRUE(data[4].isNull());
+  }
+  EXPECT_EQ(toString(Ask(ManyRequest({}, true))), R"({"data":[],"success":true})");
+}
+
+TEST_F(ServiceTest, ManyDocumentsAreAnsweredUpToABound) {
+  std::string words;
+  while (words.size() < kManyBytes / 2) words += "some more words ";
+  std::vector<std::string> paths;
+  for (int i = 0; i < 5; ++i) {
+    paths.push_back(dir_ / (std::to_string(i) + ".txt"));
+    test::WriteFile(paths.back(), words);
+  }
+  const Json::Value answer = Ask(ManyRequest(paths, true));
+  EXPECT_GE(answer["data"].size(), 1U);
+  EXPECT_LE(answer["data"].size(), 3U);
+  EXPECT_EQ(answer["data"][0]["TARNMDPath"].asString(), paths[0]);
+}
+
+TEST_F(ServiceTest, AWrongRequestForManyIsRefused) {
+  EXPECT_EQ(ErrorOf(R"({"command":"parse_many","data":{}})").substr(0, 4), "120 ");
+  EXPECT_EQ(ErrorOf(R"({"command":"parse_many","data":{"files":"/a"}})"),
+            "120 Not an array: files");
+  EXPECT_EQ(ErrorOf(R"({"command":"parse_many"})").substr(0, 4), "120 ");
+  EXPECT_EQ(toString(Ask(R"({"command":"parse_many","data":{"files":[7,{},"/"]}})")),
+            R"({"data":[null,null,null],"success":true})");
+}
+
+TEST_F(ServiceTest, AnExtractorThatStopsSaysSoForMany) {
+  pool_.Stop();
+  EXPECT_EQ(ErrorOf(ManyRequest({dir_ / "page.html"}, true)), "502 The extractor is stopping");
+}
+
 TEST_F(ServiceTest, ADocumentHasAttributesAndContent) {
   const std::string path = dir_ / "page.html";
   const Json::Value answer = Ask("{\"command\":\"parse\",\"data\":{\"path\":\"" + path +
