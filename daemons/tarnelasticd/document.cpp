@@ -12,10 +12,6 @@
 namespace quarry::engine {
 namespace {
 
-constexpr int kPathColumn = 1;
-constexpr int kExtraColumn = 2;
-constexpr int kFirstCell = 3;
-
 // The strings in a value, one below the other. An explicit stack, since depth is the peer's choice.
 std::string TextOf(const Json::Value& value) {
   std::string text;
@@ -116,29 +112,28 @@ void StoreField(const Field* field, const Json::Value& value, const std::string&
   }
   Cell cell = MakeCell(field->storage, value);
   if (std::holds_alternative<std::monostate>(cell)) (*extra)[name] = value;
-  document->cells[field->column] = std::move(cell);
+  document->row.cells[field->column] = std::move(cell);
 }
 
-Json::Value ReadCell(const Field& field, const Statement& row, int column) {
-  switch (row.Type(column)) {
-    case SQLITE_INTEGER:
-      if (field.storage == Storage::kBool) return row.Int(column) != 0;
-      return Json::Int64{row.Int(column)};
-    case SQLITE_FLOAT:
-      return row.Double(column);
-    case SQLITE_TEXT: {
-      const std::string_view text = row.Text(column);
-      return Json::Value(text.data(), text.data() + text.size());
-    }
-    default:
-      return {};
+Json::Value JsonString(std::string_view text) {
+  return Json::Value(text.data(), text.data() + text.size());
+}
+
+Json::Value ReadCell(const Field& field, const DocumentRow& row) {
+  const Cell& cell = row.cells[field.column];
+  if (const auto* number = std::get_if<std::int64_t>(&cell)) {
+    if (field.storage == Storage::kBool) return *number != 0;
+    return Json::Int64{*number};
   }
+  if (const auto* real = std::get_if<double>(&cell)) return *real;
+  if (const auto* text = std::get_if<std::string>(&cell)) return JsonString(*text);
+  return {};
 }
 
-Json::Value ReadExtra(const Statement& row) {
+Json::Value ReadExtra(const DocumentRow& row) {
   Json::Value extra(Json::objectValue);
-  if (row.IsNull(kExtraColumn)) return extra;
-  if (!fromString(extra, std::string(row.Text(kExtraColumn))) || !extra.isObject()) FailDamaged();
+  if (row.extra.empty()) return extra;
+  if (!fromString(extra, row.extra) || !extra.isObject()) FailDamaged();
   return extra;
 }
 
@@ -160,8 +155,8 @@ StoredDocument MakeDocument(const Schema& schema, std::string_view path,
                             const Json::Value& document) {
   if (!document.isObject()) throw Error(kMalformedRequest, "A document must be an object");
   StoredDocument stored;
-  stored.path = path;
-  stored.cells.resize(schema.row_columns());
+  stored.row.path = path;
+  stored.row.cells.resize(schema.row_columns());
   std::vector<std::string> texts(schema.text_columns());
   Json::Value extra(Json::objectValue);
   for (auto item = document.begin(); item != document.end(); ++item) {
@@ -170,32 +165,24 @@ StoredDocument MakeDocument(const Schema& schema, std::string_view path,
     StoreField(schema.Find(name), *item, name, &stored, &texts, &extra);
   }
   stored.body = Pack(texts);
-  if (!extra.empty()) stored.extra = toString(extra);
-  stored.labels.name = NameOf(schema, document, stored.path);
+  if (!extra.empty()) stored.row.extra = toString(extra);
+  stored.labels.name = NameOf(schema, document, stored.row.path);
   stored.labels.extra = ExtraLabel(schema, extra, stored.labels.name);
   return stored;
 }
 
-std::string RowColumns(const Schema& schema) {
-  std::string columns = "id,path,extra";
-  if (schema.row_columns() > 0) columns += ',' + Schema::ColumnList("c", schema.row_columns());
-  return columns;
-}
-
-Json::Value ReadRow(const Schema& schema, const Statement& row, const std::set<std::string>* only) {
+Json::Value ReadRow(const Schema& schema, const DocumentRow& row,
+                    const std::set<std::string>* only) {
   Json::Value document(Json::objectValue);
   const auto wanted = [only](const std::string& name) {
     return only == nullptr || only->count(name) > 0;
   };
-  if (wanted(schema.path_field())) {
-    const std::string_view path = row.Text(kPathColumn);
-    document[schema.path_field()] = Json::Value(path.data(), path.data() + path.size());
-  }
+  if (wanted(schema.path_field())) document[schema.path_field()] = JsonString(row.path);
   for (const auto& [name, field] : schema.fields()) {
     if (field.storage == Storage::kPath || field.storage == Storage::kText || !wanted(name)) {
       continue;
     }
-    Json::Value value = ReadCell(field, row, kFirstCell + static_cast<int>(field.column));
+    Json::Value value = ReadCell(field, row);
     if (!value.isNull()) document[name] = std::move(value);
   }
   // Parsing what is not listed costs more than all else, and is seldom asked for.
@@ -207,13 +194,13 @@ Json::Value ReadRow(const Schema& schema, const Statement& row, const std::set<s
   return document;
 }
 
-Labels ReadLabels(const Schema& schema, const Statement& row) {
+Labels ReadLabels(const Schema& schema, const DocumentRow& row) {
   Labels labels;
   Json::Value document(Json::objectValue);
   if (const Field* field = schema.Find(schema.name_field()); field != nullptr) {
-    document[field->name] = ReadCell(*field, row, kFirstCell + static_cast<int>(field->column));
+    document[field->name] = ReadCell(*field, row);
   }
-  labels.name = NameOf(schema, document, std::string(row.Text(kPathColumn)));
+  labels.name = NameOf(schema, document, row.path);
   labels.extra = ExtraLabel(schema, ReadExtra(row), labels.name);
   return labels;
 }

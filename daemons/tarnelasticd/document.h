@@ -28,10 +28,15 @@ struct Labels {
   bool operator==(const Labels& other) const = default;
 };
 
-struct StoredDocument {
+// What an index keeps of a document beside its full text.
+struct DocumentRow {
   std::string path;
-  std::vector<Cell> cells;  // one per column of the schema
+  std::vector<Cell> cells;  // one per field that is neither the path nor full text
   std::string extra;        // a JSON object, or empty
+};
+
+struct StoredDocument {
+  DocumentRow row;
   Labels labels;
   std::string body;  // the packed full text; empty when there is none
 };
@@ -42,15 +47,13 @@ struct StoredDocument {
 StoredDocument MakeDocument(const Schema& schema, std::string_view path,
                             const Json::Value& document);
 
-// docs' columns in the order that ReadRow expects: "id,path,extra,c0,...".
-std::string RowColumns(const Schema& schema);
-
-// The fields of the current row of a statement that selects RowColumns(). With `only`, which may be
-// null, no others. Full text is not among them. Throws Error kDamagedIndex when the row is broken.
-Json::Value ReadRow(const Schema& schema, const Statement& row, const std::set<std::string>* only);
+// The fields of a document. With `only`, which may be null, no others. Full text is not among them.
+// Throws Error kDamagedIndex when the row is broken.
+Json::Value ReadRow(const Schema& schema, const DocumentRow& row,
+                    const std::set<std::string>* only);
 
 // What the row's document is found by beside its full text.
-Labels ReadLabels(const Schema& schema, const Statement& row);
+Labels ReadLabels(const Schema& schema, const DocumentRow& row);
 
 // Adds the fields of a packed full text to `document` that it does not have already.
 void AddTexts(const Schema& schema, std::string_view packed, const std::set<std::string>* only,

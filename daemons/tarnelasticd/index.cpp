@@ -4,6 +4,7 @@
 #include <utility>
 
 #include "daemons/common/log.h"
+#include "daemons/tarnelasticd/attributes.h"
 #include "daemons/tarnelasticd/document.h"
 #include "daemons/tarnelasticd/index_files.h"
 #include "daemons/tarnelasticd/terms.h"
@@ -129,14 +130,18 @@ void Index::CopyDocuments(const Schema& schema, const std::string& database_path
   IndexWriter writer(database_path, std::make_shared<const Schema>(schema), limits_);
   const ReaderPool::Lease reader = store_->readers->Take();
   const Schema& old = *store_->schema;
-  Statement rows = reader->db().Prepare("SELECT " + RowColumns(old) + " FROM docs ORDER BY id");
+  Database* db = &reader->db();
+  TextReader attributes(db, kAttributes);
+  TextReader texts(db, kTexts);
+  Statement rows = db->Prepare("SELECT " + DocsColumns(old) + " FROM docs ORDER BY id");
   while (rows.Step()) {
-    Json::Value document = ReadRow(old, rows, nullptr);
-    const std::int64_t text = TextOf(&reader->db(), rows.Int(0));
-    AddTexts(old, ReadText(&reader->db(), text), nullptr, &document);
-    writer.Upsert(MakeDocument(schema, rows.Text(1), document));
+    const std::int64_t id = rows.Int(0);
+    const DocumentRow row = UnpackRow(old, rows, attributes.Read(id));
+    Json::Value document = ReadRow(old, row, nullptr);
+    AddTexts(old, texts.Read(TextOf(db, id)), nullptr, &document);
+    writer.Upsert(MakeDocument(schema, row.path, document));
   }
-  if (HasTerms(&reader->db())) writer.RequestTerms();
+  if (HasTerms(db)) writer.RequestTerms();
   writer.Commit();
 }
 

@@ -5,6 +5,7 @@
 #include <utility>
 #include <vector>
 
+#include "daemons/tarnelasticd/attributes.h"
 #include "daemons/tarnelasticd/doc_set.h"
 #include "daemons/tarnelasticd/engine_error.h"
 #include "daemons/tarnelasticd/request.h"
@@ -27,37 +28,6 @@ void Configure(Database* db) {
       "PRAGMA secure_delete=OFF;"
       // A log file that one large transaction has blown up is cut back afterwards.
       "PRAGMA wal_autocheckpoint=4000;PRAGMA journal_size_limit=67108864;");
-}
-
-std::string Placeholders(std::size_t first, std::size_t count) {
-  std::string list;
-  for (std::size_t i = 0; i < count; ++i) list += ",?" + std::to_string(first + i);
-  return list;
-}
-
-std::string InsertSql(const Schema& schema) {
-  return "INSERT INTO docs(" + RowColumns(schema) + ") VALUES(?1,?2,?3" +
-         Placeholders(4, schema.row_columns()) + ")";
-}
-
-std::string UpdateSql(const Schema& schema) {
-  std::string sql = "UPDATE docs SET path=?2,extra=?3";
-  for (std::size_t i = 0; i < schema.row_columns(); ++i) {
-    sql += ",c" + std::to_string(i) + "=?" + std::to_string(i + 4);
-  }
-  return sql + " WHERE id=?1";
-}
-
-void BindCell(Statement* statement, int index, const Cell& cell) {
-  if (const auto* number = std::get_if<std::int64_t>(&cell)) {
-    statement->Bind(index, *number);
-  } else if (const auto* real = std::get_if<double>(&cell)) {
-    statement->Bind(index, *real);
-  } else if (const auto* text = std::get_if<std::string>(&cell)) {
-    statement->Bind(index, std::string_view(*text));
-  } else {
-    statement->BindNull(index);
-  }
 }
 
 bool WantsText(const Schema& schema, const Selection& selection) {
@@ -88,11 +58,12 @@ IndexWriter::IndexWriter(const std::string& database_path, std::shared_ptr<const
       db_(database_path),
       tokenizer_(db_.handle()),
       buffer_(*schema_, &db_, tokenizer_),
-      texts_(&db_),
+      texts_(&db_, kTexts),
+      attributes_(&db_, kAttributes),
       sharing_(&db_),
-      insert_sql_(InsertSql(*schema_)),
-      update_sql_(UpdateSql(*schema_)),
-      select_row_sql_("SELECT " + RowColumns(*schema_) + " FROM docs WHERE path=?1") {
+      insert_sql_(InsertDocsSql(*schema_)),
+      update_sql_(UpdateDocsSql(*schema_)),
+      select_row_sql_("SELECT " + DocsColumns(*schema_) + " FROM docs WHERE path=?1") {
   Configure(&db_);
   LoadCounters();
 }
@@ -134,6 +105,7 @@ void IndexWriter::Begin() {
 void IndexWriter::Rollback() noexcept {
   buffer_.Clear();
   texts_.Clear();
+  attributes_.Clear();
   if (!uncommitted_) return;
   uncommitted_ = false;
   lost_ = true;
@@ -165,6 +137,7 @@ void IndexWriter::CommitNow() {
   transaction_bytes_ += buffer_.bytes();
   buffer_.Flush();
   texts_.Flush();
+  attributes_.Flush();
   if (terms_requested_) CollectTerms(&db_);
   db_.Prepare("INSERT OR REPLACE INTO meta(key,value) VALUES('documents',?1)")
       .Bind(1, documents_.load())
@@ -198,21 +171,22 @@ void IndexWriter::RequestTerms() {
   Change([this] { return terms_requested_ = true; });
 }
 
+DocumentRow IndexWriter::Unpack(const Statement& row) {
+  return UnpackRow(*schema_, row, attributes_.Read(row.Int(0)));
+}
+
 std::optional<IndexWriter::Found> IndexWriter::FindByPath(std::string_view path) {
   Statement row = db_.Prepare(select_row_sql_);
   row.Bind(1, path);
   if (!row.Step()) return std::nullopt;
-  return Found{row.Int(0), ReadLabels(*schema_, row)};
+  return Found{row.Int(0), ReadLabels(*schema_, Unpack(row))};
 }
 
-void IndexWriter::WriteRow(const std::string& sql, std::int64_t id,
-                           const StoredDocument& document) {
-  Statement row = db_.Prepare(sql);
-  row.Bind(1, id).Bind(2, std::string_view(document.path));
-  if (!document.extra.empty()) row.Bind(3, std::string_view(document.extra));
-  int index = 4;
-  for (const Cell& cell : document.cells) BindCell(&row, index++, cell);
-  row.Run();
+void IndexWriter::WriteRow(const std::string& sql, std::int64_t id, const DocumentRow& row) {
+  Statement statement = db_.Prepare(sql);
+  BindDocs(*schema_, id, row, &statement);
+  statement.Run();
+  attributes_.Write(id, PackAttributes(*schema_, row));
   transaction_bytes_ += kRowBytes;
 }
 
@@ -254,7 +228,7 @@ void IndexWriter::AddText(std::int64_t doc, std::string body) {
 
 void IndexWriter::Insert(StoredDocument document) {
   const std::int64_t id = NewId();
-  WriteRow(insert_sql_, id, document);
+  WriteRow(insert_sql_, id, document.row);
   buffer_.InsertLabels(id, document.labels);
   transaction_bytes_ += document.body.size();
   ++documents_;
@@ -267,7 +241,7 @@ void IndexWriter::Insert(StoredDocument document) {
 }
 
 void IndexWriter::Replace(const Found& old, StoredDocument document) {
-  WriteRow(update_sql_, old.id, document);
+  WriteRow(update_sql_, old.id, document.row);
   ChangeLabels(old, document.labels);
   ChangeText(old.id, std::move(document.body));
 }
@@ -276,13 +250,14 @@ void IndexWriter::Remove(const Found& old) {
   ChangeText(old.id, "");
   buffer_.ChangeLabels(old.id, old.labels, std::nullopt);
   db_.Prepare("DELETE FROM docs WHERE id=?1").Bind(1, old.id).Run();
+  attributes_.Write(old.id, "");
   transaction_bytes_ += kRowBytes;
   --documents_;
 }
 
 void IndexWriter::Upsert(StoredDocument document) {
   Change([&] {
-    const std::optional<Found> old = FindByPath(document.path);
+    const std::optional<Found> old = FindByPath(document.row.path);
     if (old) {
       Replace(*old, std::move(document));
     } else {
@@ -306,8 +281,9 @@ bool IndexWriter::SetLocked(std::string_view path, const Json::Value& changes) {
     Statement row = db_.Prepare(select_row_sql_);
     row.Bind(1, path);
     if (!row.Step()) return false;
-    found = {row.Int(0), ReadLabels(*schema_, row)};
-    document = ReadRow(*schema_, row, nullptr);
+    const DocumentRow unpacked = Unpack(row);
+    found = {row.Int(0), ReadLabels(*schema_, unpacked)};
+    document = ReadRow(*schema_, unpacked, nullptr);
   }
   const bool touches_text = TouchesText(*schema_, changes);
   if (touches_text) AddTexts(*schema_, ReadTextOf(found.id), nullptr, &document);
@@ -321,7 +297,7 @@ bool IndexWriter::SetLocked(std::string_view path, const Json::Value& changes) {
     Replace(found, MakeDocument(*schema_, new_path, document));
   } else {
     const StoredDocument stored = MakeDocument(*schema_, new_path, document);
-    WriteRow(update_sql_, found.id, stored);
+    WriteRow(update_sql_, found.id, stored.row);
     ChangeLabels(found, stored.labels);
   }
   return true;
@@ -342,9 +318,10 @@ std::int64_t IndexWriter::DeleteSelected(const Selection& selection) {
     const std::int64_t chunk = Change([&] {
       std::vector<Found> batch;
       {
-        Statement rows = SelectRows(*schema_, selection, RowColumns(*schema_),
-                                    std::min(left, kDeleteChunk), &db_);
-        while (rows.Step()) batch.push_back({rows.Int(0), ReadLabels(*schema_, rows)});
+        SelectedRows rows(*schema_, selection, std::min(left, kDeleteChunk), &db_);
+        while (rows.Step()) {
+          batch.push_back({rows.row().Int(0), ReadLabels(*schema_, Unpack(rows.row()))});
+        }
       }
       for (const Found& old : batch) Remove(old);
       return static_cast<std::int64_t>(batch.size());
@@ -361,12 +338,12 @@ Json::Value IndexWriter::Find(const Selection& selection) {
   Json::Value found(Json::arrayValue);
   std::size_t text_bytes = 0;
   const std::int64_t limit = std::min(selection.limit.value_or(kMaxFound + 1), kMaxFound + 1);
-  Statement rows = SelectRows(*schema_, selection, RowColumns(*schema_), limit, &db_);
+  SelectedRows rows(*schema_, selection, limit, &db_);
   while (rows.Step()) {
     if (found.size() >= kMaxFound) FailMalformed("Too many documents: ask with a limit");
-    Json::Value document = ReadRow(*schema_, rows, only);
+    Json::Value document = ReadRow(*schema_, Unpack(rows.row()), only);
     if (wants_text) {
-      const std::string body = ReadTextOf(rows.Int(0));
+      const std::string body = ReadTextOf(rows.row().Int(0));
       text_bytes += body.size();
       if (text_bytes > kMaxFoundText && !found.empty()) {
         FailMalformed("Too much text: ask with a limit");

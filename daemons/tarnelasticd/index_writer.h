@@ -102,7 +102,8 @@ class IndexWriter {
   void DropText(std::int64_t doc, std::int64_t text, std::string old);
   void AddText(std::int64_t doc, std::string body);
   std::int64_t NewId();
-  void WriteRow(const std::string& sql, std::int64_t id, const StoredDocument& document);
+  DocumentRow Unpack(const Statement& row);
+  void WriteRow(const std::string& sql, std::int64_t id, const DocumentRow& row);
   bool SetLocked(std::string_view path, const Json::Value& changes);
 
   std::shared_ptr<const Schema> schema_;
@@ -111,6 +112,7 @@ class IndexWriter {
   TextTokenizer tokenizer_;
   FtsBuffer buffer_;
   TextStore texts_;
+  TextStore attributes_;
   TextSharing sharing_;
   std::string insert_sql_;
   std::string update_sql_;

@@ -1,11 +1,14 @@
 #include "daemons/tarnelasticd/schema.h"
 
+#include <algorithm>
+
 #include "daemons/tarnelasticd/database.h"
 #include "daemons/tarnelasticd/engine_error.h"
 #include "daemons/tarnelasticd/field_names.h"
 #include "daemons/tarnelasticd/terms.h"
 #include "daemons/tarnelasticd/text_lengths.h"
 #include "daemons/tarnelasticd/text_sharing.h"
+#include "daemons/tarnelasticd/text_store.h"
 #include "daemons/tarnelasticd/text_tokenizer.h"
 
 namespace quarry::engine {
@@ -23,6 +26,11 @@ double WeightOf(const std::string& name) {
   };
   const auto found = weights.find(name);
   return found == weights.end() ? 1 : found->second;
+}
+
+// Of all other fields the index is asked only once it has the document.
+bool IsLookedUp(const std::string& name) {
+  return name == kFieldChanged || name == kFieldExtension || name == kFieldIsDir;
 }
 
 [[noreturn]] void Refuse(const std::string& why) {
@@ -74,7 +82,7 @@ Schema::Schema(const Json::Value& mappings) : mappings_(mappings) {
   const Json::Value& defaults = ObjectIn(mappings, "default");
   const Json::Value& properties = ObjectIn(mappings, "properties");
   if (properties.size() > kMaxFields) Refuse("there are too many fields");
-  fields_[path_field_] = {path_field_, Storage::kPath, 0, 1};
+  fields_[path_field_] = {path_field_, Storage::kPath, 0, 1, true};
   // FTS5 writes the number of a column down with each word, but for the first column's: that is for
   // the field with the most words.
   if (properties.isMember(kFieldContent)) {
@@ -105,7 +113,8 @@ void Schema::AddField(const std::string& name, const Json::Value& settings,
     storage = Storage::kString;
   }
   std::size_t& columns = storage == Storage::kText ? text_columns_ : row_columns_;
-  fields_[name] = {name, storage, columns++, WeightOf(name)};
+  fields_[name] = {name, storage, columns++, WeightOf(name),
+                   storage != Storage::kText && IsLookedUp(name)};
 }
 
 const Field* Schema::Find(const std::string& name) const {
@@ -123,9 +132,18 @@ std::vector<double> Schema::Weights() const {
 
 std::string Schema::ColumnOf(const std::string& field) const {
   const Field* found = Find(field);
-  if (found == nullptr || found->storage == Storage::kText) return "";
+  if (found == nullptr || !found->in_docs) return "";
   if (found->storage == Storage::kPath) return "path";
   return std::string("c").append(std::to_string(found->column));
+}
+
+std::vector<std::size_t> Schema::DocsColumns() const {
+  std::vector<std::size_t> columns;
+  for (const auto& [name, field] : fields_) {
+    if (field.in_docs && field.storage != Storage::kPath) columns.push_back(field.column);
+  }
+  std::sort(columns.begin(), columns.end());
+  return columns;
 }
 
 std::string Schema::ColumnList(std::string_view prefix, std::size_t count) {
@@ -139,16 +157,15 @@ std::string Schema::ColumnList(std::string_view prefix, std::size_t count) {
 
 std::string Schema::CreateStatements() const {
   std::string sql = "CREATE TABLE meta(key TEXT PRIMARY KEY, value) WITHOUT ROWID;";
-  sql += "CREATE TABLE docs(id INTEGER PRIMARY KEY, path TEXT NOT NULL UNIQUE, extra TEXT";
+  sql += "CREATE TABLE docs(id INTEGER PRIMARY KEY, path TEXT NOT NULL UNIQUE, odd_parent";
   // Columns carry numbers, not the names of fields: those come from outside, and SQL's names know
   // no difference of case.
-  for (std::size_t i = 0; i < row_columns_; ++i) sql += ", c" + std::to_string(i);
-  sql += ");CREATE TABLE texts(id INTEGER PRIMARY KEY, packed BLOB NOT NULL);";
+  for (const std::size_t column : DocsColumns()) sql += ", c" + std::to_string(column);
+  sql += ");CREATE INDEX docs_odd_parent ON docs(odd_parent,path) WHERE odd_parent IS NOT NULL;";
+  sql += CreateTextTable(kAttributes) + CreateTextTable(kTexts);
   const auto add_index = [&](const std::string& name, const std::string& columns) {
     sql += "CREATE INDEX " + name + " ON docs(" + columns + ");";
   };
-  const std::string parent = ColumnOf(kFieldParent);
-  if (!parent.empty()) add_index("docs_parent", parent + ",path");
   const std::string changed = ColumnOf(kFieldChanged);
   if (!changed.empty()) add_index("docs_changed", changed);
   const std::string extension = ColumnOf(kFieldExtension);

@@ -2,8 +2,9 @@
 //
 // Tables of an index's database:
 //   meta    key, value: the version of this layout, the mappings, how many documents there are
-//   docs    one row per document: its path, a column per listed field that is no full text, and
-//           what is not listed as JSON
+//   docs    one row per document: its path, and a column per field that documents are found or
+//           ordered by as a whole; selection.h says what odd_parent is
+//   attributes  what else is known of the documents; attributes.h and text_store.h say more
 //   texts   the full texts of documents, packed and compressed; text_store.h says more
 //   text_copies, text_hashes  which documents share a text; text_sharing.h says more
 //   body    FTS5 over the full texts, a column per field; without content of its own. Its rows have
@@ -27,7 +28,7 @@
 namespace quarry::engine {
 
 // The version of the layout. A database of another version counts as damaged: it is made anew.
-constexpr int kLayoutVersion = 6;
+constexpr int kLayoutVersion = 7;
 
 // How a field's values are kept.
 enum class Storage {
@@ -42,10 +43,13 @@ enum class Storage {
 struct Field {
   std::string name;
   Storage storage = Storage::kString;
-  // Which of docs' own columns, or of body's for kText, holds it; for kPath 0 and without meaning.
+  // Which of body's columns holds it, for kText; for kPath 0 and without meaning; else its number
+  // among the fields that are neither.
   std::size_t column = 0;
   // What a hit in this field counts, for kText.
   double weight = 1;
+  // Whether docs has a column of its own for it.
+  bool in_docs = false;
 };
 
 // Immutable; any thread.
@@ -66,7 +70,10 @@ class Schema {
   // The listed field of that name, or null.
   const Field* Find(const std::string& name) const;
   const std::map<std::string, Field>& fields() const { return fields_; }
+  // How many fields are neither the path nor full text.
   std::size_t row_columns() const { return row_columns_; }
+  // The numbers of those that docs has a column for, ascending.
+  std::vector<std::size_t> DocsColumns() const;
   std::size_t text_columns() const { return text_columns_; }
   // Weights of body's columns, in order.
   std::vector<double> Weights() const;

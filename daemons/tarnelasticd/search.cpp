@@ -7,6 +7,7 @@
 
 #include "common/error.h"
 #include "common/file_util.h"
+#include "daemons/tarnelasticd/attributes.h"
 #include "daemons/tarnelasticd/document.h"
 #include "daemons/tarnelasticd/field_names.h"
 #include "daemons/tarnelasticd/page.h"
@@ -121,13 +122,15 @@ Json::Value SnippetJson(const Snippet& snippet) {
 
 Json::Value AttributesJson(const SearchedIndex& index, const Ranked& ranked) {
   static const std::set<std::string> fields = {kFieldName, kFieldIsDir, kFieldSize, kFieldChanged};
-  Statement row =
-      index.reader->db().Prepare("SELECT " + RowColumns(*index.schema) + " FROM docs WHERE id=?1");
+  Database* db = &index.reader->db();
+  Statement row = db->Prepare("SELECT " + DocsColumns(*index.schema) + " FROM docs WHERE id=?1");
   row.Bind(1, ranked.id);
   Json::Value hit(Json::objectValue);
   if (!row.Step()) return hit;
   const std::string path(row.Text(1));
-  const Json::Value document = ReadRow(*index.schema, row, &fields);
+  const std::string attributes = ReadText(db, kAttributes, ranked.id);
+  const DocumentRow unpacked = UnpackRow(*index.schema, row, attributes);
+  const Json::Value document = ReadRow(*index.schema, unpacked, &fields);
   const Json::Value& name = document[kFieldName];
   hit["index"] = index.id;
   hit["path"] = path;
@@ -144,7 +147,7 @@ Json::Value HitJson(const SearchedIndex& index, const Ranked& ranked,
   Json::Value hit = AttributesJson(index, ranked);
   if (snippet_length == 0) return hit;
   Database* db = &index.reader->db();
-  const std::string packed = ReadText(db, TextOf(db, ranked.id));
+  const std::string packed = ReadText(db, kTexts, TextOf(db, ranked.id));
   if (packed.empty()) return hit;
   hit["snippet"] = SnippetJson(ChooseSnippet(index, packed, terms, snippet_length));
   return hit;

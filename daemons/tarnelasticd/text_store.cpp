@@ -26,7 +26,15 @@ std::size_t CostOf(std::string_view text) {
   throw Error(kDamagedIndex, "Stored texts are damaged");
 }
 
-constexpr char kSelectRow[] = "SELECT id,packed FROM texts WHERE id<=?1 ORDER BY id DESC LIMIT 1";
+// So many rows are kept: when documents are read in order of their paths, these are of a few rows
+// at a time.
+constexpr std::size_t kKeptRows = 16;
+
+std::string Select(const char* columns, const TextTable& table, const char* rest) {
+  return std::string("SELECT ") + columns + " FROM " + table.name + " WHERE " + rest;
+}
+
+constexpr char kRowOf[] = "id<=?1 ORDER BY id DESC LIMIT 1";
 
 // Calls visit(id, text) for each text of a row until it returns false. The ids ascend.
 template <typename Visit>
@@ -43,18 +51,49 @@ void ForEachText(std::int64_t row, std::string_view bytes, Visit visit) {
 
 }  // namespace
 
-std::string ReadText(Database* db, std::int64_t id) {
+std::string CreateTextTable(const TextTable& table) {
+  return std::string("CREATE TABLE ") + table.name +
+         "(id INTEGER PRIMARY KEY, packed BLOB NOT NULL);";
+}
+
+TextReader::TextReader(Database* db, const TextTable& table)
+    : db_(db),
+      find_sql_(Select("id", table, kRowOf)),
+      load_sql_(Select("packed", table, "id=?1")) {}
+
+const std::string& TextReader::Row(std::int64_t key) {
+  const auto kept = rows_.find(key);
+  if (kept != rows_.end()) return kept->second;
+  if (rows_.size() >= kKeptRows) rows_.clear();
+  Statement row = db_->Prepare(load_sql_);
+  std::string bytes = row.Bind(1, key).Step() ? Decompress(row.Blob(0)) : std::string();
+  return rows_.emplace(key, std::move(bytes)).first->second;
+}
+
+std::string TextReader::Read(std::int64_t id) {
   std::string found;
-  Statement row = db->Prepare(kSelectRow);
+  Statement row = db_->Prepare(find_sql_);
   row.Bind(1, id);
   if (!row.Step()) return found;
-  const std::string bytes = Decompress(row.Blob(1));
-  ForEachText(row.Int(0), bytes, [&](std::int64_t at, std::string_view text) {
+  ForEachText(row.Int(0), Row(row.Int(0)), [&](std::int64_t at, std::string_view text) {
     if (at == id) found = text;
     return at < id;
   });
   return found;
 }
+
+std::string ReadText(Database* db, const TextTable& table, std::int64_t id) {
+  return TextReader(db, table).Read(id);
+}
+
+TextStore::TextStore(Database* db, const TextTable& table)
+    : db_(db),
+      table_(table),
+      select_sql_(Select("id,packed", table, kRowOf)),
+      next_sql_(Select("min(id)", table, "id>?1")),
+      delete_sql_(std::string("DELETE FROM ") + table.name + " WHERE id=?1"),
+      insert_sql_(std::string("INSERT INTO ") + table.name + "(id,packed) VALUES(?1,?2)"),
+      reader_(db, table) {}
 
 TextStore::Rows::iterator TextStore::FindOpen(std::int64_t id) {
   auto row = rows_.upper_bound(id);
@@ -66,7 +105,7 @@ TextStore::Rows::iterator TextStore::FindOpen(std::int64_t id) {
 // The first id behind `id` that belongs to another row.
 std::int64_t TextStore::EndBehind(std::int64_t id) {
   std::int64_t end = std::numeric_limits<std::int64_t>::max();
-  Statement next = db_->Prepare("SELECT min(id) FROM texts WHERE id>?1");
+  Statement next = db_->Prepare(next_sql_);
   next.Bind(1, id).Step();
   if (!next.IsNull(0)) end = next.Int(0);
   const auto open = rows_.upper_bound(id);
@@ -78,7 +117,7 @@ TextStore::Rows::iterator TextStore::Load(std::int64_t id) {
   std::int64_t key = id;
   Row row;
   row.end = EndBehind(id);
-  Statement stored = db_->Prepare(kSelectRow);
+  Statement stored = db_->Prepare(select_sql_);
   stored.Bind(1, id);
   if (stored.Step()) {
     key = stored.Int(0);
@@ -100,7 +139,7 @@ TextStore::Rows::iterator TextStore::Open(std::int64_t id) {
   auto found = FindOpen(id);
   if (found == rows_.end()) found = Load(id);
   Row& row = found->second;
-  if (row.bytes < kRowBytes || id <= row.texts.rbegin()->first) return found;
+  if (row.bytes < table_.row_bytes || id <= row.texts.rbegin()->first) return found;
   Row behind;
   behind.end = std::exchange(row.end, id);
   return rows_.emplace(id, std::move(behind)).first;
@@ -108,7 +147,7 @@ TextStore::Rows::iterator TextStore::Open(std::int64_t id) {
 
 std::string TextStore::Read(std::int64_t id) {
   const auto row = FindOpen(id);
-  if (row == rows_.end()) return ReadText(db_, id);
+  if (row == rows_.end()) return reader_.Read(id);
   const auto text = row->second.texts.find(id);
   return text == row->second.texts.end() ? std::string() : text->second;
 }
@@ -126,13 +165,14 @@ void TextStore::Write(std::int64_t id, std::string text) {
 // A row that has grown becomes several. A text that fills one has one of its own, so that its
 // neighbours are read without it.
 void TextStore::WriteOut(std::int64_t key, const Row& row) {
-  if (row.stored) db_->Prepare("DELETE FROM texts WHERE id=?1").Bind(1, key).Run();
-  Statement insert = db_->Prepare("INSERT INTO texts(id,packed) VALUES(?1,?2)");
+  if (row.stored) db_->Prepare(delete_sql_).Bind(1, key).Run();
+  Statement insert = db_->Prepare(insert_sql_);
   for (auto text = row.texts.begin(); text != row.texts.end();) {
     const std::int64_t first = text->first;
     std::string bytes;
-    for (std::int64_t last = first; text != row.texts.end() && bytes.size() < kRowBytes; ++text) {
-      if (!bytes.empty() && text->second.size() >= kRowBytes) break;
+    for (std::int64_t last = first; text != row.texts.end() && bytes.size() < table_.row_bytes;
+         ++text) {
+      if (!bytes.empty() && text->second.size() >= table_.row_bytes) break;
       AppendNumber(&bytes, static_cast<std::uint64_t>(text->first - last));
       AppendNumber(&bytes, text->second.size());
       bytes += text->second;
@@ -149,6 +189,7 @@ void TextStore::Flush() {
 }
 
 void TextStore::Clear() {
+  reader_.Clear();
   rows_.clear();
   open_bytes_ = 0;
 }

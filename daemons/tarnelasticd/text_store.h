@@ -1,10 +1,10 @@
-// Where the full texts of documents are kept.
+// Where the full texts, and what else is known of documents, are kept.
 //
 // Short texts compress badly by themselves, and rows that are cut into pages waste part of the last
-// one. So the texts of neighbouring documents share a row of "texts", compressed together: its id
-// is that of the first of these documents, and it reaches to the next row. In it stand, in order of
-// the documents, for each the distance of its id from the one before, the size of its text, and the
-// text. A document without text is not in it.
+// one. So texts with neighbouring ids share a row of a table, compressed together: its id is that
+// of the first of these texts, and it reaches to the next row. In it stand, in order of their ids,
+// for each text the distance of its id from the one before, its size, and its bytes. What has no
+// text is not in it.
 
 #ifndef QUARRY_DAEMONS_TARNELASTICD_TEXT_STORE_H_
 #define QUARRY_DAEMONS_TARNELASTICD_TEXT_STORE_H_
@@ -19,28 +19,59 @@
 
 namespace quarry::engine {
 
-// The text of the document, empty when it has none. Throws Error kDamagedIndex when it is broken.
-std::string ReadText(Database* db, std::int64_t id);
+// A table of that form: id INTEGER PRIMARY KEY, packed BLOB NOT NULL.
+struct TextTable {
+  const char* name;
+  // A row takes further texts while those it has take fewer bytes.
+  std::size_t row_bytes;
+};
+// Full texts: a row is read for each hit that shows some of its text.
+constexpr TextTable kTexts = {"texts", std::size_t{128} << 10};
+// Attributes: they are short, and often wanted of single documents.
+constexpr TextTable kAttributes = {"attributes", std::size_t{16} << 10};
+
+std::string CreateTextTable(const TextTable& table);
+
+// Reads what is in a table. One thread at a time.
+class TextReader {
+ public:
+  // `db` must outlive the reader.
+  TextReader(Database* db, const TextTable& table);
+
+  // The text with that id, empty when there is none. Rows that were read are kept for the texts
+  // beside it, until Clear(). Throws Error kDamagedIndex when it is broken.
+  std::string Read(std::int64_t id);
+  // To be called when the table has changed.
+  void Clear() { rows_.clear(); }
+
+ private:
+  const std::string& Row(std::int64_t key);
+
+  Database* db_;
+  const std::string find_sql_;
+  const std::string load_sql_;
+  std::map<std::int64_t, std::string> rows_;  // by their ids
+};
+
+// The same for one text.
+std::string ReadText(Database* db, const TextTable& table, std::int64_t id);
 
 // Changes texts inside of the transaction that is open in a database. Rows that change stay open,
 // so that changes of neighbours cost one row. One thread at a time.
 class TextStore {
  public:
   // `db` must outlive the store.
-  explicit TextStore(Database* db) : db_(db) {}
+  TextStore(Database* db, const TextTable& table);
 
-  // As ReadText(), with all changes.
+  // As TextReader::Read(), with all changes.
   std::string Read(std::int64_t id);
-  // Replaces the document's text; an empty one is none. May write out what is open.
+  // Replaces a text; an empty one is none. May write out what is open.
   void Write(std::int64_t id, std::string text);
 
   // Writes everything out. To be called before a commit.
   void Flush();
   // Forgets what is open. To be called after the transaction was rolled back.
   void Clear();
-
-  // A row takes further documents while its texts take fewer bytes than this.
-  static constexpr std::size_t kRowBytes = std::size_t{128} << 10;
 
  private:
   using Texts = std::map<std::int64_t, std::string>;
@@ -59,6 +90,12 @@ class TextStore {
   void WriteOut(std::int64_t key, const Row& row);
 
   Database* db_;
+  const TextTable table_;
+  const std::string select_sql_;
+  const std::string next_sql_;
+  const std::string delete_sql_;
+  const std::string insert_sql_;
+  TextReader reader_;
   Rows rows_;  // by the first id that is their own; they never meet
   std::size_t open_bytes_ = 0;
 };

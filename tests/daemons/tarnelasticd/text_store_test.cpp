@@ -40,7 +40,7 @@ class TextStoreTest : public testing::Test {
   }
 
   Database db_{":memory:"};
-  TextStore store_{&db_};
+  TextStore store_{&db_, kTexts};
 };
 
 TEST_F(TextStoreTest, HasNoTextOfUnknownDocuments) {
@@ -49,9 +49,9 @@ TEST_F(TextStoreTest, HasNoTextOfUnknownDocuments) {
   EXPECT_EQ(store_.Read(4), "");
   EXPECT_EQ(store_.Read(6), "");
   store_.Flush();
-  EXPECT_EQ(ReadText(&db_, 4), "");
-  EXPECT_EQ(ReadText(&db_, 6), "");
-  EXPECT_EQ(ReadText(&db_, std::numeric_limits<std::int64_t>::max()), "");
+  EXPECT_EQ(ReadText(&db_, kTexts, 4), "");
+  EXPECT_EQ(ReadText(&db_, kTexts, 6), "");
+  EXPECT_EQ(ReadText(&db_, kTexts, std::numeric_limits<std::int64_t>::max()), "");
 }
 
 TEST_F(TextStoreTest, ReadsWhatWasWrittenBeforeAndAfterFlush) {
@@ -61,8 +61,8 @@ TEST_F(TextStoreTest, ReadsWhatWasWrittenBeforeAndAfterFlush) {
   EXPECT_EQ(Rows(), 0);
   store_.Flush();
   EXPECT_EQ(store_.Read(3), "three");
-  EXPECT_EQ(ReadText(&db_, 1), std::string("a\0b", 3));
-  EXPECT_EQ(ReadText(&db_, 3), "three");
+  EXPECT_EQ(ReadText(&db_, kTexts, 1), std::string("a\0b", 3));
+  EXPECT_EQ(ReadText(&db_, kTexts, 3), "three");
 }
 
 TEST_F(TextStoreTest, NeighboursShareARow) {
@@ -76,7 +76,7 @@ TEST_F(TextStoreTest, NeighboursShareARow) {
 
 TEST_F(TextStoreTest, AFullRowTakesNoMoreDocuments) {
   std::mt19937 random(1);
-  const std::string large = RandomText(&random, TextStore::kRowBytes);
+  const std::string large = RandomText(&random, kTexts.row_bytes);
   store_.Write(1, large);
   store_.Write(2, "small");
   store_.Flush();
@@ -85,10 +85,10 @@ TEST_F(TextStoreTest, AFullRowTakesNoMoreDocuments) {
   store_.Write(4, "small");
   store_.Flush();
   EXPECT_EQ(Rows(), 4);
-  EXPECT_EQ(ReadText(&db_, 1), large);
-  EXPECT_EQ(ReadText(&db_, 2), "small");
-  EXPECT_EQ(ReadText(&db_, 3), large);
-  EXPECT_EQ(ReadText(&db_, 4), "small");
+  EXPECT_EQ(ReadText(&db_, kTexts, 1), large);
+  EXPECT_EQ(ReadText(&db_, kTexts, 2), "small");
+  EXPECT_EQ(ReadText(&db_, kTexts, 3), large);
+  EXPECT_EQ(ReadText(&db_, kTexts, 4), "small");
 }
 
 TEST_F(TextStoreTest, ARowThatGrowsBecomesSeveral) {
@@ -98,7 +98,7 @@ TEST_F(TextStoreTest, ARowThatGrowsBecomesSeveral) {
   store_.Flush();
   EXPECT_EQ(Rows(), 1);
   for (std::int64_t id = 0; id < 10; ++id) {
-    expected[id] = RandomText(&random, TextStore::kRowBytes / 2);
+    expected[id] = RandomText(&random, kTexts.row_bytes / 2);
     store_.Write(id, expected[id]);
   }
   store_.Flush();
@@ -113,8 +113,8 @@ TEST_F(TextStoreTest, ARowWithoutTextsIsGone) {
   store_.Write(7, "");
   EXPECT_EQ(store_.Read(7), "");
   store_.Flush();
-  EXPECT_EQ(ReadText(&db_, 7), "");
-  EXPECT_EQ(ReadText(&db_, 8), "eight");
+  EXPECT_EQ(ReadText(&db_, kTexts, 7), "");
+  EXPECT_EQ(ReadText(&db_, kTexts, 8), "eight");
   store_.Write(8, "");
   store_.Flush();
   EXPECT_EQ(Rows(), 0);
@@ -139,21 +139,21 @@ TEST_F(TextStoreTest, DamageIsTold) {
   const std::string cut = Compress(std::string("\0\x7fshort", 7));
   db_.Prepare("INSERT INTO texts(id,packed) VALUES(1,?1)").BindBlob(1, cut).Run();
   db_.Execute("INSERT INTO texts(id,packed) VALUES(5,x'00')");
-  EXPECT_THROW(ReadText(&db_, 1), Error);
-  EXPECT_THROW(ReadText(&db_, 5), Error);
+  EXPECT_THROW(ReadText(&db_, kTexts, 1), Error);
+  EXPECT_THROW(ReadText(&db_, kTexts, 5), Error);
   EXPECT_THROW(store_.Write(1, "x"), Error);
 }
 
 TEST_F(TextStoreTest, ATextThatFillsARowHasOneOfItsOwn) {
-  const std::string large(TextStore::kRowBytes, 'x');
+  const std::string large(kTexts.row_bytes, 'x');
   store_.Write(1, "before");
   store_.Write(2, large);
   store_.Write(3, "behind");
   store_.Flush();
   EXPECT_EQ(Rows(), 3);
-  EXPECT_EQ(ReadText(&db_, 1), "before");
-  EXPECT_EQ(ReadText(&db_, 2), large);
-  EXPECT_EQ(ReadText(&db_, 3), "behind");
+  EXPECT_EQ(ReadText(&db_, kTexts, 1), "before");
+  EXPECT_EQ(ReadText(&db_, kTexts, 2), large);
+  EXPECT_EQ(ReadText(&db_, kTexts, 3), "behind");
 }
 
 // Two texts of one document, or of one that another row has, could not all be kept.
@@ -236,7 +236,7 @@ TEST_F(TextStoreTest, BehavesLikeAMap) {
   ExpectTexts(expected, kIds);
   store_.Flush();
   ExpectTexts(expected, kIds);
-  for (std::int64_t id = 0; id < kIds; ++id) ASSERT_EQ(ReadText(&db_, id), store_.Read(id));
+  for (std::int64_t id = 0; id < kIds; ++id) ASSERT_EQ(ReadText(&db_, kTexts, id), store_.Read(id));
 }
 
 }  // namespace
