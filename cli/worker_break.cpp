@@ -44,9 +44,12 @@ void TellToGoOn(const std::string& share) noexcept {
 }  // namespace
 
 WorkerBreak::WorkerBreak(const std::string& share) : share_(share) {
+  Json::Value data = ShareData(share_);
+  // Nobody else would tell the daemon to go on if this process were killed.
+  data["while_running"] = true;
   const auto deadline = std::chrono::steady_clock::now() + kPatience;
   while (daemon::IsListening(IndexDaemonSocket())) {
-    AskIndexDaemon("worker_delete", ShareData(share_));
+    AskIndexDaemon("worker_delete", data);
     if (!HasWorker(share_)) return;
     if (std::chrono::steady_clock::now() > deadline) {
       TellToGoOn(share_);

@@ -21,49 +21,51 @@ std::string ShareName(const Json::Value& data) {
   return share;
 }
 
-Json::Value SettingChanged(CommandTarget& target, const Json::Value& data) {
+Json::Value SettingChanged(CommandTarget& target, const Json::Value& data, pid_t) {
   bool is_upsert = false;
   GetJsonValue<bool>(is_upsert, data, "is_upsert", true);
   target.SettingChanged(ShareName(data), is_upsert);
   return Json::Value();
 }
 
-Json::Value Pause(CommandTarget& target, const Json::Value& data) {
+Json::Value Pause(CommandTarget& target, const Json::Value& data, pid_t) {
   long long resume_time = 0;
   GetJsonValue<long long>(resume_time, data, "resume_time", true);
   target.Pause(resume_time);
   return Json::Value();
 }
 
-Json::Value Resume(CommandTarget& target, const Json::Value&) {
+Json::Value Resume(CommandTarget& target, const Json::Value&, pid_t) {
   target.Resume();
   return Json::Value();
 }
 
-Json::Value CreateWorker(CommandTarget& target, const Json::Value& data) {
+Json::Value CreateWorker(CommandTarget& target, const Json::Value& data, pid_t) {
   target.CreateWorker(ShareName(data));
   return Json::Value();
 }
 
-Json::Value DeleteWorker(CommandTarget& target, const Json::Value& data) {
-  target.DeleteWorker(ShareName(data));
+Json::Value DeleteWorker(CommandTarget& target, const Json::Value& data, pid_t peer) {
+  bool while_running = false;
+  GetJsonValue<bool>(while_running, data, "while_running", false);
+  target.DeleteWorker(ShareName(data), while_running ? peer : 0);
   return Json::Value();
 }
 
-Json::Value Status(CommandTarget& target, const Json::Value&) {
+Json::Value Status(CommandTarget& target, const Json::Value&, pid_t) {
   Json::Value status = target.Status();
   status["version"] = kProtocolVersion;
   return status;
 }
 
-Json::Value Ping(CommandTarget&, const Json::Value&) {
+Json::Value Ping(CommandTarget&, const Json::Value&, pid_t) {
   Json::Value pong;
   pong["version"] = kProtocolVersion;
   pong["pid"] = getpid();
   return pong;
 }
 
-using Command = Json::Value (*)(CommandTarget& target, const Json::Value& data);
+using Command = Json::Value (*)(CommandTarget& target, const Json::Value& data, pid_t peer);
 
 const std::map<std::string, Command>& Commands() {
   static const std::map<std::string, Command> commands = {
@@ -78,21 +80,21 @@ const std::map<std::string, Command>& Commands() {
   return commands;
 }
 
-Json::Value Run(CommandTarget& target, const std::string& text) {
+Json::Value Run(CommandTarget& target, const std::string& text, pid_t peer) {
   Json::Value request;
   if (!fromString(request, text)) throw Error(kErrorBadParameter, "The request is not JSON");
   std::string type;
   GetJsonValue<std::string>(type, request, "type", true);
   const auto command = Commands().find(type);
   if (command == Commands().end()) throw Error(kErrorBadParameter, "Unknown type: " + type);
-  return command->second(target, request.isMember("data") ? request["data"] : Json::Value());
+  return command->second(target, request.isMember("data") ? request["data"] : Json::Value(), peer);
 }
 
 }  // namespace
 
-std::string HandleCommand(CommandTarget& target, const std::string& request) {
+std::string HandleCommand(CommandTarget& target, const std::string& request, pid_t peer) {
   try {
-    return toString(daemon::SuccessReply(Run(target, request)));
+    return toString(daemon::SuccessReply(Run(target, request, peer)));
   } catch (const Error& error) {
     return toString(daemon::FailureReply(error.code(), error.reason()));
   } catch (const std::exception& error) {

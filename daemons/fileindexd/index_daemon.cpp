@@ -52,8 +52,8 @@ IndexDaemon::IndexDaemon(std::size_t threads, bool full_speed)
       workers_([this](const std::string& share) { return MakeWorker(share); }),
       server_(std::make_unique<daemon::SocketServer>(
           CommandSocketPath(),
-          [this](const std::string& request, const daemon::Peer&) {
-            return HandleCommand(*this, request);
+          [this](const std::string& request, const daemon::Peer& peer) {
+            return HandleCommand(*this, request, peer.pid);
           },
           ServerOptions())) {}
 
@@ -130,9 +130,9 @@ void IndexDaemon::CreateWorker(const std::string& share) {
   workers_.Reload();
 }
 
-void IndexDaemon::DeleteWorker(const std::string& share) {
+void IndexDaemon::DeleteWorker(const std::string& share, pid_t while_running) {
   Guarded("folder list", [this] { workers_.SetShares(LoadIndexedShares()); });
-  workers_.Delete(share);
+  workers_.Delete(share, while_running);
 }
 
 Json::Value IndexDaemon::Status() const {

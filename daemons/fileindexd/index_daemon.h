@@ -43,7 +43,7 @@ class IndexDaemon : private CommandTarget {
   void Pause(long long resume_time) override;
   void Resume() override;
   void CreateWorker(const std::string& share) override;
-  void DeleteWorker(const std::string& share) override;
+  void DeleteWorker(const std::string& share, pid_t while_running) override;
   Json::Value Status() const override;
 
   std::unique_ptr<Worker> MakeWorker(const std::string& share);

@@ -1,5 +1,10 @@
 #include "daemons/fileindexd/worker_table.h"
 
+#include <poll.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <cerrno>
 #include <utility>
 
 namespace quarry::fileindexd {
@@ -20,6 +25,16 @@ Json::Value WithoutWorker(const std::string& share, const char* state) {
   return report;
 }
 
+// A descriptor that becomes readable at the process's end; invalid where the kernel has none.
+UniqueFd Watch(pid_t process) {
+  return UniqueFd(static_cast<int>(syscall(SYS_pidfd_open, process, 0)));
+}
+
+bool HasEnded(const UniqueFd& process) {
+  pollfd poller{process.get(), POLLIN, 0};
+  return process.valid() && poll(&poller, 1, 0) > 0;
+}
+
 }  // namespace
 
 WorkerTable::~WorkerTable() {
@@ -36,13 +51,18 @@ void WorkerTable::SetShares(const std::set<std::string>& shares) {
     if (shares_.count(share) == 0) gone.insert(share);
   }
   for (const std::string& share : gone) Retire(share);
-  std::erase_if(deleted_, [&](const std::string& share) { return shares_.count(share) == 0; });
+  std::erase_if(deleted_, [&](const auto& entry) { return shares_.count(entry.first) == 0; });
   Tend();
 }
 
-void WorkerTable::Delete(const std::string& share) {
+void WorkerTable::Delete(const std::string& share, pid_t while_running) {
   if (shares_.count(share) == 0) return;
-  deleted_.insert(share);
+  UniqueFd process;
+  if (while_running > 0) {
+    process = Watch(while_running);
+    if (!process.valid() && errno == ESRCH) return;
+  }
+  deleted_[share] = std::move(process);
   Retire(share);
 }
 
@@ -85,6 +105,7 @@ void WorkerTable::Start(const std::string& share) {
 }
 
 void WorkerTable::Tend() {
+  std::erase_if(deleted_, [](const auto& entry) { return HasEnded(entry.second); });
   for (auto it = leaving_.begin(); it != leaving_.end();) {
     if (it->second->ended) {
       it->second->thread.join();
@@ -101,7 +122,7 @@ void WorkerTable::Tend() {
 
 Json::Value WorkerTable::Report() const {
   std::map<std::string, Json::Value> reports;
-  for (const std::string& share : deleted_) {
+  for (const auto& [share, process] : deleted_) {
     if (shares_.count(share) > 0) reports[share] = WithoutWorker(share, "stopped");
   }
   for (const auto& [share, running] : leaving_) reports[share] = WithoutWorker(share, "stopping");

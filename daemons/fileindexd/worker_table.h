@@ -4,6 +4,7 @@
 #define QUARRY_DAEMONS_FILEINDEXD_WORKER_TABLE_H_
 
 #include <json/json.h>
+#include <sys/types.h>
 
 #include <atomic>
 #include <chrono>
@@ -14,6 +15,7 @@
 #include <string>
 #include <thread>
 
+#include "common/unique_fd.h"
 #include "daemons/fileindexd/worker.h"
 
 namespace quarry::fileindexd {
@@ -35,8 +37,9 @@ class WorkerTable {
   void SetShares(const std::set<std::string>& shares);
 
   // The worker of a share with indexed folders stops, and none is started until the share is
-  // allowed one again, or has had no indexed folder in between.
-  void Delete(const std::string& share);
+  // allowed one again, or has had no indexed folder in between. With a process given it is allowed
+  // one, too, as soon as that process has ended; 0 is none.
+  void Delete(const std::string& share, pid_t while_running = 0);
   void Allow(const std::string& share);
 
   void SetPaused(bool paused);
@@ -65,8 +68,9 @@ class WorkerTable {
 
   const Factory factory_;
   bool paused_ = false;
-  std::set<std::string> shares_;   // with indexed folders
-  std::set<std::string> deleted_;  // by command
+  std::set<std::string> shares_;  // with indexed folders
+  // By command, with the descriptor of the process that is to be outlived, if any.
+  std::map<std::string, UniqueFd> deleted_;
   std::map<std::string, std::unique_ptr<Running>> workers_;
   // Stopped, but perhaps not yet ended; several of one share cannot be.
   std::map<std::string, std::unique_ptr<Running>> leaving_;

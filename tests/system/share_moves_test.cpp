@@ -9,7 +9,10 @@
 #include <filesystem>
 
 #include "cli/supervisor/child.h"
+#include "cli/system.h"
 #include "common/file_util.h"
+#include "common/lock_file.h"
+#include "common/sdk/share.h"
 #include "platform/linux/share_move.h"
 #include "platform/linux/share_registry.h"
 #include "tests/support/files.h"
@@ -194,6 +197,34 @@ TEST_F(ShareMovesTest, MigrationKilledAnywhereAndRunAgain) {
     std::swap(from, to);
   }
   ExpectArrived(from + "/docs");
+}
+
+// The state of the share's worker, as the index daemon reports it.
+std::string WorkerState() {
+  const Json::Value report = cli::AskIndexDaemon("status", Json::Value());
+  return report["shares"].size() == 1 ? report["shares"][0]["state"].asString() : "";
+}
+
+// Nobody may have to start the index daemon anew because somebody had second thoughts.
+TEST_F(ShareMovesTest, AKilledMoveLeavesNoShareWithoutItsWorker) {
+  const std::string other = system_.Files() + "/other";
+  {
+    // The queue's lock keeps the command from replacing the share's record.
+    const LockFile lock(sdk::SDKShare("docs").GetQueuePath(), true);
+    cli::Child move(RunningSystem::Program(), {"share", "migrate", "docs", other},
+                    system_.Files() + "/move.log");
+    EXPECT_TRUE(WaitUntil([] { return WorkerState() == "stopped"; }));
+    EXPECT_TRUE(WaitUntil([&] { return IsDirExist(other + "/docs", false); }));
+    move.Signal(SIGKILL);
+    EXPECT_TRUE(move.WaitEnded(60'000));
+    EXPECT_EQ(move.Ended().value_or("still running"), "signal 9");
+  }
+  EXPECT_TRUE(WaitUntil([] { return WorkerState() == "retrying"; })) << WorkerState();
+  // As if it had never been asked for.
+  std::filesystem::rename(other + "/docs", docs_);
+  ExpectArrived(docs_);
+  system_.Run({"share", "migrate", "docs", other});
+  ExpectArrived(other + "/docs");
 }
 
 // What a kill right after the share's record was replaced leaves: directory, record and queue are

@@ -23,7 +23,7 @@ class MockTarget : public CommandTarget {
   MOCK_METHOD(void, Pause, (long long resume_time), (override));
   MOCK_METHOD(void, Resume, (), (override));
   MOCK_METHOD(void, CreateWorker, (const std::string& share), (override));
-  MOCK_METHOD(void, DeleteWorker, (const std::string& share), (override));
+  MOCK_METHOD(void, DeleteWorker, (const std::string& share, pid_t while_running), (override));
   MOCK_METHOD(Json::Value, Status, (), (const, override));
 };
 
@@ -32,12 +32,12 @@ class CommandHandlerTest : public ::testing::Test {
   // The answer to a request's text.
   Json::Value Ask(const std::string& text) {
     Json::Value answer;
-    EXPECT_TRUE(fromString(answer, HandleCommand(target_, text)));
+    EXPECT_TRUE(fromString(answer, HandleCommand(target_, text, 4711)));
     return answer;
   }
 
   void ExpectDone(const std::string& text) {
-    EXPECT_EQ("{\"success\":true}", HandleCommand(target_, text)) << text;
+    EXPECT_EQ("{\"success\":true}", HandleCommand(target_, text, 4711)) << text;
   }
 
   void ExpectRefused(const std::string& text, const std::string& reason) {
@@ -77,8 +77,12 @@ TEST_F(CommandHandlerTest, ResumeWithAnyDataOrNone) {
 TEST_F(CommandHandlerTest, WorkerCreateAndDelete) {
   EXPECT_CALL(target_, CreateWorker("photo"));
   ExpectDone(R"({"type":"worker_create","data":{"share_name":"photo"}})");
-  EXPECT_CALL(target_, DeleteWorker("photo"));
+  EXPECT_CALL(target_, DeleteWorker("photo", 0)).Times(3);
   ExpectDone(R"({"type":"worker_delete","data":{"share_name":"photo"}})");
+  ExpectDone(R"({"type":"worker_delete","data":{"share_name":"photo","while_running":false}})");
+  ExpectDone(R"({"type":"worker_delete","data":{"share_name":"photo","while_running":"x"}})");
+  EXPECT_CALL(target_, DeleteWorker("photo", 4711));
+  ExpectDone(R"({"type":"worker_delete","data":{"share_name":"photo","while_running":true}})");
 }
 
 TEST_F(CommandHandlerTest, StatusIsHandedOutWithTheVersion) {

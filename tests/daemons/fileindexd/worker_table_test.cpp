@@ -1,7 +1,11 @@
 #include "daemons/fileindexd/worker_table.h"
 
 #include <gtest/gtest.h>
+#include <sys/prctl.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
+#include <csignal>
 #include <deque>
 #include <future>
 #include <map>
@@ -69,6 +73,50 @@ TEST_F(WorkerTableTest, ADeletedWorkerStaysAwayUntilItIsAllowed) {
   table_.Allow("s");
   EXPECT_TRUE(Becomes("s", "idle"));
   EXPECT_EQ(2, made_["s"]);
+}
+
+// A process that does nothing until it is killed.
+pid_t StartIdler() {
+  const pid_t pid = fork();
+  if (pid != 0) return pid;
+  prctl(PR_SET_PDEATHSIG, SIGKILL);
+  while (true) pause();
+}
+
+void Kill(pid_t pid) {
+  ASSERT_EQ(kill(pid, SIGKILL), 0);
+  ASSERT_EQ(waitpid(pid, nullptr, 0), pid);
+}
+
+TEST_F(WorkerTableTest, ADeletedWorkerComesBackAfterTheProcessThatWantedItAway) {
+  const pid_t process = StartIdler();
+  ASSERT_GT(process, 0);
+  table_.SetShares({"s"});
+  ASSERT_TRUE(Becomes("s", "idle"));
+  table_.Delete("s", process);
+  EXPECT_TRUE(Becomes("s", "stopped"));
+  EXPECT_EQ("stopped", State("s"));
+  Kill(process);
+  EXPECT_TRUE(Becomes("s", "idle"));
+  // One that has ended already wants nothing any more.
+  table_.Delete("s", process);
+  EXPECT_EQ("idle", State("s"));
+  EXPECT_EQ(2, made_["s"]);
+}
+
+TEST_F(WorkerTableTest, TheLastWhoDeletesAWorkerSaysForHowLong) {
+  const pid_t first = StartIdler();
+  const pid_t second = StartIdler();
+  table_.SetShares({"s"});
+  table_.Delete("s", first);
+  table_.Delete("s", second);
+  Kill(first);
+  EXPECT_TRUE(Becomes("s", "stopped"));
+  table_.Delete("s");
+  Kill(second);
+  EXPECT_EQ("stopped", State("s"));
+  table_.Allow("s");
+  EXPECT_TRUE(Becomes("s", "idle"));
 }
 
 TEST_F(WorkerTableTest, ADeletedWorkerIsForgottenWithTheSharesFolders) {
