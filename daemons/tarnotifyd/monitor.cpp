@@ -64,12 +64,16 @@ Monitor::Monitor(std::unique_ptr<ChangeSource> source, Now now)
     : now_(std::move(now)), source_(std::move(source)) {}
 
 void Monitor::Step(int timeout_ms) {
-  const Ready ready = Wait(MillisecondsToDo(timeout_ms));
+  const bool may_read = now_() >= next_read_;
+  const Ready ready = Wait(MillisecondsToDo(timeout_ms, may_read), may_read);
   const bool refresh = now_() >= next_refresh_;
   if (refresh) next_refresh_ = now_() + kRefresh;
   if (ready.registrations || refresh) FollowRegistrations();
   if (refresh) Guarded([this] { source_->Refresh(*this); });
-  if (ready.source) Guarded([this] { source_->Read(*this); });
+  if (ready.source) {
+    Guarded([this] { source_->Read(*this); });
+    next_read_ = now_() + kBetweenReads;
+  }
   for (const auto& feed : feeds_) feed->Step(now_());
   if (refresh) report_(Status());
 }
@@ -104,8 +108,8 @@ void Monitor::Finish() {
 }
 
 // How long nothing is due.
-int Monitor::MillisecondsToDo(int at_most) const {
-  Clock::time_point due = next_refresh_;
+int Monitor::MillisecondsToDo(int at_most, bool may_read) const {
+  Clock::time_point due = may_read ? next_refresh_ : std::min(next_refresh_, next_read_);
   for (const auto& feed : feeds_) {
     if (const auto feed_due = feed->Due()) due = std::min(due, *feed_due);
   }
@@ -114,8 +118,9 @@ int Monitor::MillisecondsToDo(int at_most) const {
   return at_most < 0 || left < at_most ? static_cast<int>(left) : at_most;
 }
 
-Monitor::Ready Monitor::Wait(int timeout_ms) const {
-  pollfd polled[] = {{source_->Descriptor(), POLLIN, 0},
+// A negative descriptor is passed over.
+Monitor::Ready Monitor::Wait(int timeout_ms, bool may_read) const {
+  pollfd polled[] = {{may_read ? source_->Descriptor() : -1, POLLIN, 0},
                      {registrations_.Descriptor(), POLLIN, 0},
                      {wake_fd_, POLLIN, 0}};
   if (poll(polled, std::size(polled), timeout_ms) <= 0) return {};

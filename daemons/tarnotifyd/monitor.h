@@ -25,6 +25,10 @@ class Monitor : private ChangeSink {
  public:
   using Now = std::function<Clock::time_point()>;
 
+  // Between two readings of what has happened: under load the kernel gathers it meanwhile, and
+  // folds some of it. Less than a feed gathers anyway before it writes.
+  static constexpr std::chrono::milliseconds kBetweenReads{20};
+
   explicit Monitor(std::unique_ptr<ChangeSource> source, Now now = Clock::now);
 
   // Waits up to `timeout_ms` for something to do, and does it.
@@ -50,8 +54,8 @@ class Monitor : private ChangeSink {
     bool source = false;
     bool registrations = false;
   };
-  Ready Wait(int timeout_ms) const;
-  int MillisecondsToDo(int at_most) const;
+  Ready Wait(int timeout_ms, bool may_read) const;
+  int MillisecondsToDo(int at_most, bool may_read) const;
   void Guarded(const std::function<void()>& action);
   void FollowRegistrations();
   void TakeOver(const QueuePlaces& queues);
@@ -70,6 +74,7 @@ class Monitor : private ChangeSink {
   std::vector<std::string> ignore_;
   PlaceIndex::Wanted wanted_, wanted_old_;  // kept for their memory
   Clock::time_point next_refresh_{};
+  Clock::time_point next_read_{};
   int wake_fd_ = -1;
   std::function<void(const Json::Value&)> report_ = [](const Json::Value&) {};
 };

@@ -248,6 +248,24 @@ TEST_F(MonitorTest, TheSourceLooksAgainEverySecond) {
   EXPECT_EQ(source_->refreshed_, before + 1);
 }
 
+TEST_F(MonitorTest, ReadsAtOnceAndThenLetsChangesGather) {
+  Step();
+  now_ += std::chrono::milliseconds(100);
+  int reads = 0;
+  const auto count = [&](ChangeSink&) { ++reads; };
+  source_->Tell(count);
+  monitor_.Step(0);
+  EXPECT_EQ(reads, 1);
+  source_->Tell(count);
+  now_ += Monitor::kBetweenReads - std::chrono::milliseconds(1);
+  monitor_.Step(0);
+  EXPECT_EQ(reads, 1);
+  // Nothing wakes it up then but the time that has passed.
+  now_ += std::chrono::milliseconds(1);
+  monitor_.Step(-1);
+  EXPECT_EQ(reads, 2);
+}
+
 TEST_F(MonitorTest, SaysHowItDoesEverySecond) {
   std::vector<std::string> reports;
   monitor_.ReportTo([&](const Json::Value& report) { reports.push_back(toString(report)); });
