@@ -16,7 +16,10 @@ namespace {
 
 using std::chrono::milliseconds;
 
+// Where nothing has changed all is done within a second, of which little is to be waited away.
 constexpr milliseconds kLookEvery{100};
+constexpr milliseconds kLookAtFirstEvery{20};
+constexpr std::chrono::seconds kAtFirst{2};
 // A daemon that died is back well within this time.
 constexpr std::chrono::seconds kSilence{60};
 
@@ -46,7 +49,8 @@ void RefuseToWaitForEver(const Json::Value& status) {
 
 void WaitUntilIndexed(const std::string& share_path) {
   const MovingLine line;
-  auto heard = std::chrono::steady_clock::now();
+  const auto begin = std::chrono::steady_clock::now();
+  auto heard = begin;
   for (;;) {
     const Json::Value report = IndexDaemonReport();
     const Json::Value status = FolderStatus(*Governing(share_path), report);
@@ -58,7 +62,7 @@ void WaitUntilIndexed(const std::string& share_path) {
       throw Problem("The index daemon (fileindexd) does not answer; see \"quarry status\".");
     }
     line.Show(Progress(status));
-    std::this_thread::sleep_for(kLookEvery);
+    std::this_thread::sleep_for(now - begin < kAtFirst ? kLookAtFirstEvery : kLookEvery);
   }
 }
 

@@ -146,6 +146,28 @@ void ElasticIndex::Rename(const std::string& new_path, const std::string& old_pa
   elastic::IndexRename(share_, new_path, old_path);
 }
 
+// Asks a question that changes nothing on a connection that is kept, since a walk has one for each
+// directory. Returns whether there is an answer: an engine that is busy, or does not answer, is to
+// be asked again by somebody with more patience. Throws what a refusal says.
+bool ElasticIndex::AskQuickly(const Json::Value& request, Json::Value* response) {
+  bool success = false;
+  int code = kErrorEngineBusy;
+  std::string message;
+  try {
+    const std::lock_guard<std::mutex> lock(mutex_);
+    if (!engine_) engine_.emplace("The search engine (tarnelasticd)", EngineSocketPath());
+    *response = engine_->Request(request);
+    GetJsonValue(success, *response, "success", true);
+    if (success) return true;
+    GetJsonValue(code, (*response)["error"], "code", true);
+    GetJsonValue(message, (*response)["error"], "msg", true);
+  } catch (const Error&) {
+    return false;
+  }
+  if (code == kErrorEngineBusy || code == kErrorEngineBusyMemory) return false;
+  throw Error(code, "Request failed, msg=" + message);
+}
+
 std::vector<Document> ElasticIndex::Query(const char* kind, const char* field,
                                           const std::string& value, const std::string& after,
                                           std::size_t limit) {
@@ -161,8 +183,10 @@ std::vector<Document> ElasticIndex::Query(const char* kind, const char* field,
     data["query"]["load_field"].append(name);
   }
   Json::Value response;
-  const Exchange exchange(rest_);
-  elastic::SendRequest(response, request);
+  if (!AskQuickly(request, &response)) {
+    const Exchange exchange(rest_);
+    elastic::SendRequest(response, request);
+  }
   if (!response["data"].isArray()) {
     throw Error(kErrorEngineQuery, "The search engine's list of documents is malformed");
   }

@@ -5,11 +5,13 @@
 
 #include <json/json.h>
 
+#include <mutex>
 #include <optional>
 #include <string>
 #include <vector>
 
 #include "comm/comm.h"
+#include "daemons/common/client.h"
 #include "daemons/fileindexd/gate.h"
 #include "daemons/fileindexd/index.h"
 
@@ -42,12 +44,15 @@ class ElasticIndex : public Index {
 
  private:
   Json::Value EngineStatus();
+  bool AskQuickly(const Json::Value& request, Json::Value* response);
   std::vector<Document> Query(const char* kind, const char* field, const std::string& value,
                               const std::string& after, std::size_t limit);
 
   const std::string share_;
   const std::string id_;
   const fileindex::elastic::BusyWait::Function rest_;
+  std::mutex mutex_;
+  std::optional<daemon::Client> engine_;  // for questions, one at a time
 };
 
 // Where the engine and the reader of files listen.

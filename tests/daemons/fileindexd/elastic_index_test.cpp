@@ -33,6 +33,7 @@ class ScriptedEngine {
     const std::lock_guard<std::mutex> lock(mutex_);
     answers_.push_back(text);
   }
+  std::size_t ConnectionCount() const { return server_.ConnectionCount(); }
   std::vector<std::string> Asked() {
     const std::lock_guard<std::mutex> lock(mutex_);
     return std::exchange(asked_, {});
@@ -196,6 +197,40 @@ TEST_F(ElasticIndexTest, ABusyEngineIsAskedAgainSoon) {
   engine_->Answer(kBusy);
   index_.Delete("/v/a");
   EXPECT_EQ(2U, engine_->Asked().size());
+}
+
+constexpr char kNone[] = R"({"success":true,"data":[]})";
+
+TEST_F(ElasticIndexTest, AQuestionIsAskedAgainWhileTheEngineIsBusy) {
+  engine_->Answer(kBusy);
+  engine_->Answer(kNone);
+  EXPECT_FALSE(index_.Find("/v/a"));
+  EXPECT_EQ(engine_->Asked().size(), 2U);
+}
+
+TEST_F(ElasticIndexTest, ARefusedQuestionSaysWhy) {
+  engine_->Answer(R"({"success":false,"error":{"code":1403,"msg":"There is no such index"}})");
+  try {
+    index_.Find("/v/a");
+    ADD_FAILURE();
+  } catch (const Error& error) {
+    EXPECT_EQ(error.code(), 1403);
+    EXPECT_EQ(error.reason(), "Request failed, msg=There is no such index");
+  }
+  EXPECT_EQ(engine_->Asked().size(), 1U);
+}
+
+TEST_F(ElasticIndexTest, QuestionsShareAConnectionUntilTheEngineIsStartedAnew) {
+  for (int i = 0; i < 5; ++i) {
+    engine_->Answer(kNone);
+    index_.Find("/v/a");
+  }
+  EXPECT_EQ(engine_->ConnectionCount(), 1U);
+  engine_.reset();
+  engine_ = std::make_unique<ScriptedEngine>(EngineSocketPath());
+  engine_->Answer(kNone);
+  EXPECT_FALSE(index_.Find("/v/a"));
+  EXPECT_EQ(engine_->Asked().size(), 1U);
 }
 
 TEST_F(ElasticIndexTest, ABusyEngineIsAskedUntilTheWorkerStops) {
