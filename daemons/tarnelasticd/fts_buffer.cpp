@@ -1,14 +1,36 @@
 #include "daemons/tarnelasticd/fts_buffer.h"
 
 #include <algorithm>
+#include <optional>
 #include <utility>
 
+#include "daemons/tarnelasticd/engine_error.h"
+#include "daemons/tarnelasticd/fts_number.h"
+#include "daemons/tarnelasticd/segment_writer.h"
 #include "daemons/tarnelasticd/text_lengths.h"
 
 namespace quarry::engine {
 namespace {
 
 constexpr std::size_t kEntryBytes = 160;
+
+constexpr const char* kBody = "body";
+constexpr char kMainIndex = '0';
+// So many of a level become one. A search looks into each.
+constexpr std::size_t kManySegments = 8;
+// Leaves that are merged at least, so that small segments do not come to be many.
+constexpr std::int64_t kLeastMerge = 16;
+
+// Has FTS5 write out what it has in memory, as its own bookkeeping is about to be changed. Asked
+// for nothing, it takes part in the transaction from now on, and so is told of savepoints.
+void WriteOutFts(Database* db) {
+  db->Execute("INSERT INTO body(body,rank) VALUES('merge',0);SAVEPOINT own;RELEASE own");
+}
+
+// Has FTS5 read its bookkeeping anew.
+void ForgetFts(Database* db) {
+  db->Execute("SAVEPOINT own;ROLLBACK TO own;RELEASE own");
+}
 
 std::size_t SizeOf(const std::string& text) {
   return text.size();
@@ -54,7 +76,10 @@ FtsBuffer::FtsBuffer(const Schema& schema, Database* db, const TextTokenizer& to
       body_(
           MakeTable("body", Schema::ColumnList("t", schema.text_columns()), schema.text_columns())),
       label_(MakeTable("labels", "name,extra", 2)),
-      name_(MakeTable("names", "name", 1)) {}
+      name_(MakeTable("names", "name", 1)),
+      has_own_segments_(ReadStructure(db, kBody).has_value()),
+      lists_(tokenizer),
+      listed_words_(schema.text_columns()) {}
 
 void FtsBuffer::Run(const std::string& sql, std::int64_t id,
                     const std::vector<std::string_view>& texts) {
@@ -76,7 +101,81 @@ void FtsBuffer::InsertLabels(std::int64_t doc, const Labels& labels) {
 }
 
 void FtsBuffer::InsertBody(std::int64_t text, std::string_view body) {
-  RunBody(body_.insert, text, body);
+  if (!AddToLists(text, body)) RunBody(body_.insert, text, body);
+}
+
+// Whether the lists have taken the text; what they do not take is for FTS5.
+bool FtsBuffer::AddToLists(std::int64_t id, std::string_view body) {
+  if (!has_own_segments_ || body.empty() || id <= last_listed_) return false;
+  const std::vector<std::size_t> words = lists_.Add(id, UnpackTexts(schema_, body));
+  if (words.empty()) return false;
+  last_listed_ = id;
+  ++listed_;
+  std::string sizes;
+  for (std::size_t i = 0; i < words.size(); ++i) {
+    listed_words_[i] += words[i];
+    AppendVarint(&sizes, words[i]);
+  }
+  db_->Prepare("INSERT INTO body_docsize(id,sz) VALUES(?1,?2)")
+      .Bind(1, id)
+      .BindBlob(2, sizes)
+      .Run();
+  return true;
+}
+
+// Before anything else is done to these rows: a segment holds against those written before.
+void FtsBuffer::FlushLists() {
+  if (listed_ == 0) return;
+  WriteOutFts(db_);
+  AddToTotals(db_, kBody, listed_, listed_words_);
+  std::optional<FtsStructure> structure = ReadStructure(db_, kBody);
+  if (!structure) throw Error(kDamagedIndex, "The full text is not as it should be");
+  const std::int64_t leaves = lists_.empty() ? 0 : WriteSegment(&*structure);
+  ClearLists();
+  ForgetFts(db_);
+  if (leaves > 0) MergeSegments(*structure, leaves);
+}
+
+// FTS5 merges of itself when it writes. It is asked for as much work as it would do then, so that
+// no commit waits for all of it.
+void FtsBuffer::MergeSegments(const FtsStructure& structure, std::int64_t written) {
+  const bool is_due = std::any_of(
+      structure.levels.begin(), structure.levels.end(), [](const FtsStructure::Level& level) {
+        return level.merging > 0 || level.segments.size() >= kManySegments;
+      });
+  if (!is_due) return;
+  const auto levels = static_cast<std::int64_t>(structure.levels.size());
+  db_->Prepare("INSERT INTO body(body,rank) VALUES('merge',?1)")
+      .Bind(1, written * levels + kLeastMerge)
+      .Run();
+}
+
+// Returns how many leaves it has.
+std::int64_t FtsBuffer::WriteSegment(FtsStructure* structure) {
+  Segment segment;
+  segment.id = structure->FreeSegment();
+  if (segment.id == 0) throw Error(kDamagedIndex, "The full text has too many parts");
+  segment.first_leaf = 1;
+  SegmentWriter writer(db_, kBody, segment.id);
+  std::string key;
+  lists_.ForEach([&](std::string_view word, std::string_view list) {
+    key = kMainIndex;
+    key += word;
+    writer.Add(key, list);
+  });
+  segment.last_leaf = writer.Finish();
+  if (structure->levels.empty()) structure->levels.emplace_back();
+  structure->levels.front().segments.push_back(segment);
+  structure->leaves_written += segment.last_leaf;
+  WriteStructure(db_, kBody, *structure);
+  return segment.last_leaf;
+}
+
+void FtsBuffer::ClearLists() {
+  lists_.Clear();
+  last_listed_ = 0;
+  listed_ = 0;
+  std::fill(listed_words_.begin(), listed_words_.end(), 0);
 }
 
 void FtsBuffer::ChangeBody(std::int64_t text, std::string old, std::string now) {
@@ -103,6 +202,7 @@ void FtsBuffer::FlushLabels(std::int64_t id, const Change<std::optional<Labels>>
 }
 
 void FtsBuffer::Flush() {
+  FlushLists();
   for (const auto& [id, change] : bodies_) {
     RunBody(body_.remove, id, change.old);
     RunBody(body_.insert, id, change.now);
@@ -119,6 +219,7 @@ void FtsBuffer::FlushLengths() {
 }
 
 void FtsBuffer::Clear() {
+  ClearLists();
   noted_.clear();
   bodies_.clear();
   labels_.clear();

@@ -3,7 +3,8 @@
 // FTS5 writes a whole segment each time row ids do not ascend, so changes in arbitrary order would
 // cost one segment each. They are collected here and applied in order of row ids; a row that
 // changes several times is written once. New rows, whose ids ascend by themselves, do not wait:
-// cutting them into words is most of the work of a first index, and others can go on meanwhile.
+// cutting them into words is most of the work of a first index, and others can go on meanwhile. The
+// words of their full texts make up segments of our own, see word_lists.h.
 
 #ifndef QUARRY_DAEMONS_TARNELASTICD_FTS_BUFFER_H_
 #define QUARRY_DAEMONS_TARNELASTICD_FTS_BUFFER_H_
@@ -18,8 +19,10 @@
 
 #include "daemons/tarnelasticd/database.h"
 #include "daemons/tarnelasticd/document.h"
+#include "daemons/tarnelasticd/fts_structure.h"
 #include "daemons/tarnelasticd/schema.h"
 #include "daemons/tarnelasticd/text_tokenizer.h"
+#include "daemons/tarnelasticd/word_lists.h"
 
 namespace quarry::engine {
 
@@ -39,8 +42,9 @@ class FtsBuffer {
   void NoteText(std::int64_t doc);
   void ChangeLabels(std::int64_t id, std::optional<Labels> old, std::optional<Labels> now);
 
-  // Roughly the memory that is held.
+  // Roughly the memory that changes hold, and that the words of new texts do.
   std::size_t bytes() const { return bytes_; }
+  std::size_t list_bytes() const { return lists_.bytes(); }
 
   // Applies everything, and is empty then.
   void Flush();
@@ -62,6 +66,11 @@ class FtsBuffer {
 
   void Run(const std::string& sql, std::int64_t id, const std::vector<std::string_view>& texts);
   void RunBody(const std::string& sql, std::int64_t id, std::string_view body);
+  bool AddToLists(std::int64_t id, std::string_view body);
+  void FlushLists();
+  std::int64_t WriteSegment(FtsStructure* structure);
+  void MergeSegments(const FtsStructure& structure, std::int64_t written);
+  void ClearLists();
   void FlushLabels(std::int64_t id, const Change<std::optional<Labels>>& change);
   void FlushLengths();
 
@@ -75,6 +84,12 @@ class FtsBuffer {
   std::map<std::int64_t, Change<std::optional<Labels>>> labels_;
   std::vector<std::int64_t> noted_;  // documents with another full text than before
   std::size_t bytes_ = 0;
+
+  const bool has_own_segments_;  // whether the tables behind FTS5 are understood
+  WordLists lists_;
+  std::int64_t last_listed_ = 0;
+  std::uint64_t listed_ = 0;                 // rows in lists_
+  std::vector<std::uint64_t> listed_words_;  // by columns
 };
 
 // The text under which a file name stands in "names": folded, between marks that no other text

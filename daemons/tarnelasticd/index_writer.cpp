@@ -120,7 +120,7 @@ void IndexWriter::Rollback() noexcept {
 
 // Checked with each change, since a writer that is never idle leaves CommitIfOld() no turn.
 void IndexWriter::KeepWithinLimits() {
-  if (buffer_.bytes() >= limits_.flush_bytes) {
+  if (buffer_.bytes() >= limits_.flush_bytes || buffer_.list_bytes() >= limits_.list_bytes) {
     transaction_bytes_ += buffer_.bytes();
     buffer_.Flush();
   }

@@ -29,6 +29,8 @@ namespace quarry::engine {
 struct WriterLimits {
   // Changes of full text are handed to FTS5 when they take so much memory.
   std::size_t flush_bytes = std::size_t{8} << 20;
+  // The words of new texts are written as a segment when they take so much memory.
+  std::size_t list_bytes = std::size_t{16} << 20;
   // A transaction ends when it has taken so much text, or has been open so long.
   std::size_t commit_bytes = std::size_t{256} << 20;
   std::chrono::steady_clock::duration commit_age = std::chrono::seconds(3);

@@ -2,33 +2,19 @@
 
 #include <algorithm>
 #include <cstring>
+#include <iterator>
 #include <memory>
+#include <optional>
 #include <utility>
 
 #include "daemons/tarnelasticd/doc_set.h"
-#include "daemons/tarnelasticd/engine_error.h"
+#include "daemons/tarnelasticd/fts_structure.h"
 
 namespace quarry::engine {
 namespace {
 
 constexpr char kMainIndex = '0';
-constexpr int kUnderstoodVersion = 4;
-constexpr std::int64_t kStructureRow = 10;
-constexpr std::size_t kCookie = 4;  // bytes before the structure
 constexpr std::size_t kBatch = 1024;
-
-constexpr std::int64_t kMaxSegmentId = (std::int64_t{1} << 16) - 1;
-constexpr std::int64_t kMaxLeaf = (std::int64_t{1} << 31) - 1;
-
-void CheckSegment(const Segment& segment) {
-  const auto is_within = [](std::int64_t value, std::int64_t most) {
-    return value >= 0 && value <= most;
-  };
-  if (!is_within(segment.id, kMaxSegmentId) || !is_within(segment.first_leaf, kMaxLeaf) ||
-      !is_within(segment.last_leaf, kMaxLeaf)) {
-    throw Error(kDamagedIndex, "The full text is not as it should be");
-  }
-}
 
 constexpr std::uint64_t kOnes = 0x0101010101010101U;
 constexpr std::uint64_t kHighBits = 0x8080808080808080U;
@@ -142,37 +128,13 @@ PostingLists::PostingLists(Database* db, std::string table, std::int64_t last_id
       last_id_(last_id),
       weights_(std::move(weights)),
       check_(std::move(check)) {
-  Statement version = db_->Prepare("SELECT v FROM " + table_ + "_config WHERE k='version'");
-  if (!version.Step() || version.Int(0) != kUnderstoodVersion) return;
-  Statement row = db_->Prepare("SELECT block FROM " + table_ + "_data WHERE id=?1");
-  row.Bind(1, kStructureRow);
-  if (row.Step()) ReadStructure(row.Blob(0));
-}
-
-void PostingLists::ReadStructure(std::string_view record) {
-  // The second form of this record, with a byte that no first one has here, is another version's.
-  if (record.size() <= kCookie || static_cast<unsigned char>(record[kCookie]) == 0xff) return;
-  const char* at = record.data() + kCookie;
-  const char* const end = record.data() + record.size();
-  const auto take = [&] { return static_cast<std::int64_t>(TakeVarint(&at, end)); };
-  const std::int64_t levels = take();
-  take();  // how many segments there are in all
-  take();  // how many leaves have ever been written
-  for (std::int64_t level = 0; level < levels; ++level) {
-    take();  // how many of them are being merged
-    const std::int64_t count = take();
-    std::vector<Segment> segments;
-    for (std::int64_t i = 0; i < count; ++i) {
-      Segment segment;
-      segment.id = take();
-      segment.first_leaf = take();
-      segment.last_leaf = take();
-      CheckSegment(segment);
-      if (segment.first_leaf > 0) segments.push_back(segment);
-    }
-    segments_.insert(segments_.end(), segments.rbegin(), segments.rend());
-  }
+  const std::optional<FtsStructure> structure = ReadStructure(db_, table_);
+  if (!structure) return;
   is_readable_ = true;
+  for (const FtsStructure::Level& level : structure->levels) {
+    std::copy_if(level.segments.rbegin(), level.segments.rend(), std::back_inserter(segments_),
+                 [](const Segment& segment) { return segment.first_leaf > 0; });
+  }
 }
 
 void PostingLists::ForEach(std::string_view word, bool prefix, const Visitor& visit) {

@@ -48,7 +48,6 @@ class PostingLists {
  private:
   class Gatherer;
 
-  void ReadStructure(std::string_view record);
   void GatherWord(const std::string& key, Gatherer* gatherer);
   // Calls word_end(key) behind each word that any row has.
   template <typename WordEnd>

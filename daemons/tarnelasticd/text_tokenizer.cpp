@@ -1,6 +1,7 @@
 #include "daemons/tarnelasticd/text_tokenizer.h"
 
 #include <algorithm>
+#include <array>
 #include <climits>
 #include <exception>
 
@@ -9,6 +10,27 @@
 
 namespace quarry::engine {
 namespace {
+
+constexpr unsigned char kSeparator = 0;
+constexpr unsigned char kNotAscii = 0xff;
+
+// What each byte becomes in a word, or kSeparator, or kNotAscii.
+constexpr std::array<unsigned char, 256> MakeFolding() {
+  std::array<unsigned char, 256> folding{};
+  for (std::size_t c = '0'; c <= '9'; ++c) folding[c] = static_cast<unsigned char>(c);
+  for (std::size_t c = 'a'; c <= 'z'; ++c) {
+    folding[c] = static_cast<unsigned char>(c);
+    folding[c - 'a' + 'A'] = static_cast<unsigned char>(c);
+  }
+  for (std::size_t c = 0x80; c <= 0xff; ++c) folding[c] = kNotAscii;
+  return folding;
+}
+
+constexpr std::array<unsigned char, 256> kFolding = MakeFolding();
+
+unsigned char FoldingOf(char c) {
+  return kFolding[static_cast<unsigned char>(c)];
+}
 
 constexpr const char* kReplacement = "\xEF\xBF\xBD";
 
@@ -100,6 +122,36 @@ void TextTokenizer::ForEach(std::string_view text, const Visitor& visit) const {
   if (context.failure) std::rethrow_exception(context.failure);
   if (result != SQLITE_OK && result != SQLITE_DONE) {
     ThrowSqlite(nullptr, result, "Cannot cut a text into words");
+  }
+}
+
+std::size_t TextTokenizer::SkipSeparators(std::string_view text) {
+  std::size_t at = 0;
+  while (at < text.size() && FoldingOf(text[at]) == kSeparator) ++at;
+  return at;
+}
+
+std::size_t TextTokenizer::FindAsciiSeparator(std::string_view text) {
+  std::size_t at = 0;
+  while (at < text.size() && FoldingOf(text[at]) != kSeparator) ++at;
+  return at;
+}
+
+// The size of the word at the beginning of `text`, or 0 when it may have more than ASCII.
+std::size_t TextTokenizer::FoldAsciiWord(std::string_view text, std::string* folded) {
+  std::size_t end = std::min(folded->size(), text.size());
+  char* out = folded->data();
+  for (std::size_t size = 0;; ++size) {
+    if (size == end) {
+      if (size == text.size()) return size;
+      folded->resize(std::max<std::size_t>(64, 2 * size));
+      end = std::min(folded->size(), text.size());
+      out = folded->data();
+    }
+    const unsigned char c = FoldingOf(text[size]);
+    if (c == kSeparator) return size;
+    if (c == kNotAscii) return 0;
+    out[size] = static_cast<char>(c);
   }
 }
 

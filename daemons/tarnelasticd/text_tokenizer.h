@@ -31,6 +31,31 @@ class TextTokenizer {
   using Visitor = std::function<bool(std::string_view word, std::size_t begin, std::size_t end)>;
   void ForEach(std::string_view text, const Visitor& visit) const;
 
+  // Calls visit(word) with the same words. Several times as fast where the text is ASCII.
+  template <typename Visit>
+  void EachWord(std::string_view text, Visit visit) const {
+    std::string folded;
+    while (true) {
+      const std::size_t begin = SkipSeparators(text);
+      if (begin == text.size()) return;
+      text.remove_prefix(begin);
+      const std::size_t size = FoldAsciiWord(text, &folded);
+      if (size == 0) {
+        // Words that are not ASCII are left to the tokenizer, which keeps nothing from one to the
+        // next: up to where it certainly is between two words.
+        const std::size_t end = FindAsciiSeparator(text);
+        ForEach(text.substr(0, end), [&visit](std::string_view word, std::size_t, std::size_t) {
+          visit(word);
+          return true;
+        });
+        text.remove_prefix(end);
+      } else {
+        visit(std::string_view(folded).substr(0, size));
+        text.remove_prefix(size);
+      }
+    }
+  }
+
   std::vector<std::string> Words(std::string_view text) const;
 
   // The text with its words folded and all between them kept, but for control characters, which
@@ -39,6 +64,10 @@ class TextTokenizer {
   std::string Fold(std::string_view text) const;
 
  private:
+  static std::size_t SkipSeparators(std::string_view text);
+  static std::size_t FindAsciiSeparator(std::string_view text);
+  static std::size_t FoldAsciiWord(std::string_view text, std::string* folded);
+
   fts5_tokenizer functions_{};
   Fts5Tokenizer* tokenizer_ = nullptr;
 };

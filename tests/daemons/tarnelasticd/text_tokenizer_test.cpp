@@ -44,6 +44,26 @@ TEST_F(TextTokenizerTest, FoldsNamesWithWhatStandsBetween) {
   EXPECT_EQ(tokenizer_->Fold(""), "");
 }
 
+// The fast way against FTS5's own, with bytes of all kinds close to each other.
+TEST_F(TextTokenizerTest, FindsTheSameWordsFast) {
+  const std::vector<std::string> pieces = {
+      "a",    "Z",    "0",        "word",     std::string(100, 'x'), " ",        "-",
+      "\n",   "_",    "\x7F",     "\xC3\x89", "e\xCC\x81",           "\xCC\x81", "\xE4\xB8\xAD",
+      "\xFF", "\x80", "\xC3",     "\xE4\xB8", "\xF0\x9F\x98\x80",    "\xC2\xA0", "\xE2\x80\xA6",
+      "`",    "{",    "\xC2\xB2", "@",        std::string(1, '\0'),  "[",        "/"};
+  std::mt19937 random(12);
+  for (int round = 0; round < 20000; ++round) {
+    std::string text;
+    for (auto i = random() % 16; i > 0; --i) {
+      text += random() % 4 == 0 ? std::string(1, static_cast<char>(random() % 256))
+                                : pieces[random() % pieces.size()];
+    }
+    std::vector<std::string> words;
+    tokenizer_->EachWord(text, [&words](std::string_view word) { words.emplace_back(word); });
+    ASSERT_EQ(words, tokenizer_->Words(text)) << testing::PrintToString(text);
+  }
+}
+
 TEST_F(TextTokenizerTest, TakesAnyBytes) {
   std::mt19937 random(11);
   for (int round = 0; round < 20000; ++round) {

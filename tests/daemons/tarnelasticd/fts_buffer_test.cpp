@@ -1,0 +1,343 @@
+// Full text that is written by way of segments of our own, against the same written by FTS5 alone.
+
+#include "daemons/tarnelasticd/fts_buffer.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <iterator>
+#include <map>
+#include <memory>
+#include <random>
+#include <vector>
+
+#include "common/json.h"
+#include "daemons/tarnelasticd/engine_error.h"
+#include "daemons/tarnelasticd/varint.h"
+#include "tests/support/files.h"
+#include "tests/support/temp_dir.h"
+
+namespace quarry::engine {
+namespace {
+
+using Columns = std::vector<std::string>;
+
+Schema ThreeTexts() {
+  Json::Value mappings;
+  for (const char* name : {"A", "B", "C"}) mappings["properties"][name]["type"] = "text";
+  return Schema(mappings);
+}
+
+std::string Pack(const Columns& columns) {
+  std::string packed;
+  for (std::size_t i = 0; i < columns.size(); ++i) {
+    if (columns[i].empty()) continue;
+    AppendNumber(&packed, i);
+    AppendNumber(&packed, columns[i].size());
+    packed += columns[i];
+  }
+  return packed;
+}
+
+class FtsBufferTest : public testing::Test {
+ protected:
+  FtsBufferTest() {
+    model_ = Make("model");
+    Make("tested");
+    Open();
+  }
+
+  std::unique_ptr<Database> Make(const std::string& name) {
+    test::WriteFile(dir_ / name, "");
+    auto db = Connect(name);
+    db->Execute(schema_.CreateStatements());
+    return db;
+  }
+  std::unique_ptr<Database> Connect(const std::string& name) {
+    auto db = std::make_unique<Database>(dir_ / name);
+    db->Execute(
+        "PRAGMA synchronous=OFF;PRAGMA journal_mode=MEMORY;"
+        "CREATE VIRTUAL TABLE temp.places USING fts5vocab(main,body,instance)");
+    return db;
+  }
+
+  // Anew, as after a restart.
+  void Open() {
+    buffer_.reset();
+    tokenizer_.reset();
+    db_ = Connect("tested");
+    tokenizer_ = std::make_unique<TextTokenizer>(db_->handle());
+    buffer_ = std::make_unique<FtsBuffer>(schema_, db_.get(), *tokenizer_);
+  }
+
+  void Begin() {
+    db_->Execute("BEGIN");
+    model_->Execute("BEGIN");
+    before_ = texts_;
+  }
+  void Commit() {
+    buffer_->Flush();
+    db_->Execute("COMMIT");
+    model_->Execute("COMMIT");
+  }
+  void Rollback() {
+    buffer_->Clear();
+    db_->Execute("ROLLBACK");
+    model_->Execute("ROLLBACK");
+    texts_ = before_;
+  }
+
+  void Insert(std::int64_t id, const Columns& columns) {
+    buffer_->InsertBody(id, Pack(columns));
+    RunModel("INSERT INTO body(rowid,t0,t1,t2) VALUES(?1,?2,?3,?4)", id, columns);
+    texts_[id] = columns;
+  }
+  void Remove(std::int64_t id) {
+    buffer_->ChangeBody(id, Pack(texts_[id]), "");
+    RunModel("INSERT INTO body(body,rowid,t0,t1,t2) VALUES('delete',?1,?2,?3,?4)", id, texts_[id]);
+    texts_.erase(id);
+  }
+  void Change(std::int64_t id, const Columns& columns) {
+    buffer_->ChangeBody(id, Pack(texts_[id]), Pack(columns));
+    RunModel("INSERT INTO body(body,rowid,t0,t1,t2) VALUES('delete',?1,?2,?3,?4)", id, texts_[id]);
+    RunModel("INSERT INTO body(rowid,t0,t1,t2) VALUES(?1,?2,?3,?4)", id, columns);
+    texts_[id] = columns;
+  }
+  void RunModel(const std::string& sql, std::int64_t id, const Columns& columns) {
+    Statement statement = model_->Prepare(sql);
+    statement.Bind(1, id);
+    for (int i = 0; i < 3; ++i) {
+      statement.Bind(i + 2, std::string_view(columns[static_cast<std::size_t>(i)]));
+    }
+    statement.Run();
+  }
+
+  static std::vector<std::string> Rows(Database* db, const std::string& sql) {
+    std::vector<std::string> rows;
+    Statement statement = db->Prepare(sql);
+    while (statement.Step()) rows.emplace_back(statement.Text(0));
+    return rows;
+  }
+  // Every place of every word, lengths and totals are the same, and FTS5 finds nothing wrong.
+  void ExpectSame() {
+    db_->Execute("INSERT INTO body(body) VALUES('integrity-check')");
+    for (const char* sql :
+         {"SELECT term||' '||doc||' '||col||' '||offset FROM temp.places ORDER BY term,doc,col,"
+          "offset",
+          "SELECT id||' '||hex(sz) FROM body_docsize ORDER BY id",
+          "SELECT hex(block) FROM body_data WHERE id=1"}) {
+      EXPECT_EQ(Rows(db_.get(), sql), Rows(model_.get(), sql)) << sql;
+    }
+  }
+  std::int64_t Number(const std::string& sql) {
+    Statement statement = db_->Prepare(sql);
+    return statement.Step() ? statement.Int(0) : -1;
+  }
+  // Segments have places for their words, one for each first leaf at least.
+  std::int64_t Segments() { return Number("SELECT count(DISTINCT segid) FROM body_idx"); }
+
+  // `words` words, the first ones of the vocabulary much more often than the others.
+  std::string Text(std::size_t words, std::size_t vocabulary) {
+    std::string text;
+    for (std::size_t i = 0; i < words; ++i) {
+      const auto number = static_cast<std::uint64_t>(
+          std::pow(vocabulary, std::uniform_real_distribution<>(0, 1)(random_)));
+      text += "w" + std::to_string(number * 2654435761U % 1000003) + " ";
+    }
+    return text;
+  }
+
+  const Schema schema_ = ThreeTexts();
+  test::TempDir dir_;
+  std::unique_ptr<Database> model_;
+  std::unique_ptr<Database> db_;
+  std::unique_ptr<TextTokenizer> tokenizer_;
+  std::unique_ptr<FtsBuffer> buffer_;
+  std::map<std::int64_t, Columns> texts_;
+  std::map<std::int64_t, Columns> before_;
+  std::mt19937_64 random_{17};
+};
+
+TEST_F(FtsBufferTest, WritesOneSegmentForNewTexts) {
+  Begin();
+  Insert(1, {"one two one", "", "three"});
+  Insert(2, {"", "two", ""});
+  Commit();
+  EXPECT_EQ(Segments(), 1);
+  ExpectSame();
+}
+
+TEST_F(FtsBufferTest, KnowsOfTextsWithoutWords) {
+  Begin();
+  Insert(1, {"--", "", ""});
+  Commit();
+  EXPECT_EQ(Segments(), 0);
+  ExpectSame();
+}
+
+TEST_F(FtsBufferTest, SpreadsListsOverLeaves) {
+  Begin();
+  std::string text;
+  for (int i = 0; i < 9000; ++i) text += i % 300 == 0 ? "rare " : "often ";
+  for (int i = 1; i < 40; ++i) Insert(3 * i, {text, "often", Text(2000, 20000)});
+  Commit();
+  EXPECT_GT(Number("SELECT count(*) FROM body_data"), 50);
+  EXPECT_LE(Number("SELECT max(length(block)) FROM body_data"), 4096);
+  ExpectSame();
+}
+
+TEST_F(FtsBufferTest, TakesLongWordsAndTexts) {
+  Begin();
+  for (const std::size_t size : {400U, 999U, 1000U, 1001U, 5000U, 40000U}) {
+    Insert(static_cast<std::int64_t>(size),
+           {"a " + std::string(size, 'x'), std::string(size, 'y'), "b"});
+  }
+  for (int i = 0; i < 30; ++i) {
+    Insert(50000 + i, {"a " + std::string(900, 'z') + std::to_string(i), "", ""});
+  }
+  Insert(60000, {Text(900000, 3000), "c", ""});
+  Insert(60001, {"a", "c", ""});
+  Commit();
+  ExpectSame();
+}
+
+TEST_F(FtsBufferTest, TakesAnyBytes) {
+  Begin();
+  for (int id = 1; id < 300; ++id) {
+    Columns columns(3);
+    for (std::string& text : columns) {
+      for (auto i = random_() % 60; i > 0; --i) text += static_cast<char>(random_() % 256);
+    }
+    if (columns[0].empty()) columns[0] = "x";
+    Insert(id, columns);
+  }
+  Commit();
+  ExpectSame();
+}
+
+TEST_F(FtsBufferTest, RemovesWhatItsSegmentsHold) {
+  Begin();
+  Insert(1, {"one two", "", ""});
+  Insert(2, {"two three", "", ""});
+  Remove(1);
+  Commit();
+  ExpectSame();
+  Begin();
+  Change(2, {"three four", "", "five"});
+  Insert(3, {"two", "", ""});
+  Commit();
+  ExpectSame();
+}
+
+// A number that is given out again after its text has gone.
+TEST_F(FtsBufferTest, HoldsAgainstOlderSegments) {
+  Begin();
+  Insert(1, {"one two", "", ""});
+  Commit();
+  Begin();
+  Remove(1);
+  Commit();
+  Open();
+  Begin();
+  Insert(1, {"two three", "", ""});
+  Commit();
+  ExpectSame();
+}
+
+TEST_F(FtsBufferTest, ForgetsWhatIsRolledBack) {
+  Begin();
+  Insert(1, {"one", "", ""});
+  Commit();
+  Begin();
+  Insert(2, {"two", "", ""});
+  buffer_->Flush();
+  Insert(3, {"three", "", ""});
+  Rollback();
+  ExpectSame();
+  Begin();
+  Insert(2, {"other", "", ""});
+  Commit();
+  ExpectSame();
+}
+
+TEST_F(FtsBufferTest, KeepsSegmentsFew) {
+  for (int id = 1; id <= 200; ++id) {
+    Begin();
+    Insert(id, {Text(50, 1000), "", ""});
+    Commit();
+    EXPECT_LE(Segments(), 24);
+  }
+  ExpectSame();
+}
+
+TEST_F(FtsBufferTest, TellsMemory) {
+  Begin();
+  EXPECT_EQ(buffer_->list_bytes(), 0U);
+  Insert(1, {Text(3000, 3000), "", ""});
+  EXPECT_GT(buffer_->list_bytes(), 3000U);
+  buffer_->Flush();
+  EXPECT_EQ(buffer_->list_bytes(), 0U);
+  Rollback();
+}
+
+// Another library's tables are not touched.
+TEST_F(FtsBufferTest, LeavesToFts5WhatIsNotUnderstood) {
+  db_->Execute("UPDATE body_config SET v=5 WHERE k='version'");
+  buffer_ = std::make_unique<FtsBuffer>(schema_, db_.get(), *tokenizer_);
+  db_->Execute("UPDATE body_config SET v=4 WHERE k='version'");
+  Begin();
+  Insert(1, {"one", "", ""});
+  EXPECT_EQ(buffer_->list_bytes(), 0U);
+  Commit();
+  ExpectSame();
+}
+
+TEST_F(FtsBufferTest, ReportsDamage) {
+  Begin();
+  Insert(1, {"one", "", ""});
+  db_->Execute("UPDATE body_data SET block=x'00000000ff' WHERE id=10");
+  try {
+    buffer_->Flush();
+    FAIL() << "no damage was found";
+  } catch (const Error& error) {
+    EXPECT_EQ(error.code(), static_cast<int>(kDamagedIndex));
+  }
+  Rollback();
+}
+
+TEST_F(FtsBufferTest, HoldsWhatFts5DoesThroughRandomChanges) {
+  std::int64_t next = 1;
+  for (int round = 0; round < 120; ++round) {
+    if (round % 30 == 29) Open();
+    Begin();
+    for (auto i = random_() % 12; i > 0; --i) {
+      const std::uint64_t what = random_() % 10;
+      const Columns columns = {Text(1 + random_() % 300, 4000), Text(random_() % 3, 50),
+                               random_() % 200 == 0 ? std::string(2000, 'q') : ""};
+      if (what < 6 || texts_.empty()) {
+        Insert(next, columns);
+        next += static_cast<std::int64_t>(1 + random_() % 3);
+      } else {
+        auto some = texts_.begin();
+        std::advance(some, static_cast<std::ptrdiff_t>(random_() % texts_.size()));
+        if (what < 8) {
+          Remove(some->first);
+        } else {
+          Change(some->first, columns);
+        }
+      }
+      if (random_() % 8 == 0) buffer_->Flush();
+    }
+    if (random_() % 6 == 0) {
+      Rollback();
+    } else {
+      Commit();
+    }
+    if (round % 10 == 0) ExpectSame();
+  }
+  ExpectSame();
+}
+
+}  // namespace
+}  // namespace quarry::engine
