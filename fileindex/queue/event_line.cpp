@@ -52,9 +52,9 @@ class Scanner {
 enum Key : unsigned { kUnknown = 0, kEvent = 1, kIsDir = 2, kPath = 4, kPathOld = 8, kData = 16 };
 
 Key TakeKey(Scanner& line) {
-  if (line.Take("\"path\":")) return kPath;
   if (line.Take("\"event\":")) return kEvent;
   if (line.Take("\"is_dir\":")) return kIsDir;
+  if (line.Take("\"path\":")) return kPath;
   if (line.Take("\"path_old\":")) return kPathOld;
   if (line.Take("\"data\":")) return kData;
   return kUnknown;
@@ -88,11 +88,12 @@ bool TakeMember(Scanner& line, EventLine& event, unsigned& met) {
 
 }  // namespace
 
-bool ReadEventLine(std::string_view text, EventLine& event) {
-  // Without these a text ends at the next quotation mark, and its bytes stand for themselves.
-  if (text.find('\\') != std::string_view::npos || text.find('\0') != std::string_view::npos) {
-    return false;
-  }
+bool IsPlain(std::string_view text) {
+  return text.find('\\') == std::string_view::npos && text.find('\0') == std::string_view::npos;
+}
+
+bool ReadEventLine(std::string_view text, EventLine& event, bool is_plain) {
+  if (!is_plain && !IsPlain(text)) return false;
   event = EventLine();
   Scanner line(text);
   unsigned met = 0;

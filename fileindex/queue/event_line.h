@@ -16,10 +16,15 @@ struct EventLine {
   std::string_view path_old;
 };
 
+// Whether a text has neither backslashes nor NUL bytes. Without these a JSON text ends at the next
+// quotation mark, and its bytes stand for themselves.
+bool IsPlain(std::string_view text);
+
 // Reads a line as the monitor writes it: an object of the known keys, each once at most, without
 // white space, escapes, NUL bytes or data. Returns false for any other line: it may still be an
-// event, which Event finds out. What this takes, Event takes with the same fields.
-bool ReadEventLine(std::string_view line, EventLine& event);
+// event, which Event finds out. What this takes, Event takes with the same fields. `is_plain` says
+// that IsPlain is known to hold for the line.
+bool ReadEventLine(std::string_view line, EventLine& event, bool is_plain = false);
 
 }  // namespace quarry::fileindex
 

@@ -4,6 +4,8 @@
 #include <iterator>
 #include <string>
 
+#include "fileindex/queue/large_pages.h"
+
 namespace quarry::fileindex {
 namespace {
 
@@ -132,6 +134,7 @@ const std::shared_ptr<OPNode>& Ledger::Child(OPNode& node, std::string_view name
     Touch(*node.children[found]);
     return node.children[found];
   }
+  MakeRoom(node.children);
   node.children.push_back(pool != nullptr
                               ? pool->Make<OPNode>(node.shared_from_this(), kUnnamed)
                               : std::make_shared<OPNode>(node.shared_from_this(), kUnnamed));

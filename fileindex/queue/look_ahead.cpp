@@ -23,7 +23,7 @@ bool LookAhead::Read(QueueReader& input) {
     QueueLine& line = lines_[count_];
     line = QueueLine();
     if (!input.Next(line.text)) break;
-    line.is_usual = ReadEventLine(line.text, line.event);
+    line.is_usual = ReadEventLine(line.text, line.event, input.is_plain());
     if (line.is_usual) ReadUsual(line, previous);
     previous = line.is_usual ? &line : nullptr;
     ++count_;

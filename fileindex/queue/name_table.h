@@ -8,6 +8,8 @@
 #include <string_view>
 #include <vector>
 
+#include "fileindex/queue/large_pages.h"
+
 namespace quarry::fileindex {
 
 // The positions of named things in a list that somebody else keeps. A slot takes eight bytes, and
@@ -61,7 +63,11 @@ class NameTable {
   }
 
   void Grow() {
-    std::vector<Slot> old(slots_.size() + slots_.size() / 2 + 8);
+    const std::size_t size = slots_.size() + slots_.size() / 2 + 8;
+    std::vector<Slot> old;
+    old.reserve(size);
+    PreferLargePages(old.data(), size * sizeof(Slot));
+    old.resize(size);
     old.swap(slots_);
     for (const Slot& slot : old) {
       if (slot.position != kNone) Put(slot);

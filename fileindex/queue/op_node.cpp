@@ -17,6 +17,8 @@ OP::OP(std::shared_ptr<OPNode> op_node, FileIndexOP kind, const std::string& sou
        const Json::Value& payload)
     : node(std::move(op_node)), op(kind), src(source), data(payload) {}
 
+OP::OP(std::shared_ptr<OPNode> op_node, FileIndexOP kind) : node(std::move(op_node)), op(kind) {}
+
 OP::~OP() = default;
 
 void OP::MergeData(const Json::Value& other) {

@@ -10,6 +10,7 @@
 #include "common/error.h"
 #include "common/log.h"
 #include "fileindex/queue/event_line.h"
+#include "fileindex/queue/large_pages.h"
 #include "fileindex/queue/ledger.h"
 #include "fileindex/queue/look_ahead.h"
 #include "fileindex/queue/pool.h"
@@ -109,7 +110,7 @@ void RefuseNul(const std::string& path) {
   }
 }
 
-const std::string kNoSource;
+const Json::Value kNoData;
 
 // How many records ahead of the one that is let go memory is asked for.
 constexpr std::size_t kAhead = 16;
@@ -189,7 +190,7 @@ void OPTree::InsertLine(const QueueLine& line, LookAhead& ahead, std::shared_ptr
       last = NodeAt(line.event.path);
       ahead.Learn(line, *last);
     }
-    Insert(last, line.event, Json::Value::nullSingleton());
+    Insert(last, line.event, kNoData);
   } catch (const Error& error) {
     last.reset();
     ++skipped_lines_;
@@ -219,7 +220,7 @@ void OPTree::Insert(const std::shared_ptr<OPNode>& node, const EventLine& event,
 
 void OPTree::InsertAny(std::shared_ptr<OPNode> node, const EventLine& event,
                        const Json::Value& data) {
-  const auto rec = std::make_shared<OP>(node, OP_NONE, "", Json::Value::nullSingleton());
+  const auto rec = std::make_shared<OP>(node, OP_NONE);
   const auto has = [&event](EventKind kind) { return (event.op & kind) != 0; };
   const auto has_for_dir = [&](EventKind kind) { return has(kind) && event.is_dir; };
   const auto has_for_file = [&](EventKind kind) { return has(kind) && !event.is_dir; };
@@ -259,6 +260,7 @@ std::shared_ptr<OPNode> OPTree::NodeAt(std::string_view path) {
 
 void OPTree::Attach(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& rec) {
   if (std::exchange(rec->attached_, true)) return;
+  MakeRoom(ops);
   ops.push_back(rec);
   node->ops.push_back(rec);
   Ledger::Touch(*node);
@@ -275,10 +277,9 @@ void OPTree::Fold(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>
 // Most events are absorbed by what is pending already: only the others get a record.
 void OPTree::FoldOnly(const std::shared_ptr<OPNode>& node, const RuleRow& rules) {
   FileIndexOP kind = rules.kind;
-  const Json::Value& no_data = Json::Value::nullSingleton();
   Ledger::ForEachOwn(*node, nullptr,
-                     [&](OP& pending) { return Meet(pending, kind, no_data, rules); });
-  if (kind != OP_NONE) Attach(node, pool_->Make<OP>(node, kind, kNoSource, no_data));
+                     [&](OP& pending) { return Meet(pending, kind, kNoData, rules); });
+  if (kind != OP_NONE) Attach(node, pool_->Make<OP>(node, kind));
 }
 
 void OPTree::HandleCreate(std::shared_ptr<OPNode> node, std::shared_ptr<OP> rec) {
@@ -343,7 +344,7 @@ void OPTree::TraverseNodeDescendant(std::shared_ptr<OPNode> node,
 std::int32_t OPTree::ProcessOP(std::function<void(std::shared_ptr<OP>)> fn) {
   if (crashed) {
     LogLine(QUARRY_SITE("optree"), "Queue crashed: " + queue_path);
-    fn(std::make_shared<OP>(root, OP_FULL_REINDEX, "", Json::Value()));
+    fn(std::make_shared<OP>(root, OP_FULL_REINDEX));
     return 1;
   }
   for (std::size_t i = 0; i < ops.size(); ++i) {

@@ -47,6 +47,8 @@ struct RuleRow;
 class QUARRY_EXPORT OP {
  public:
   OP(std::shared_ptr<OPNode> node, FileIndexOP op, const std::string& src, const Json::Value& data);
+  // The same without an old path and data.
+  OP(std::shared_ptr<OPNode> node, FileIndexOP op);
   ~OP();
 
   // Merges the configuration change `other` into `data`: each of the switches "document", "audio",

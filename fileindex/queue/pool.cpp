@@ -3,9 +3,10 @@
 #include <sys/mman.h>
 
 #include <atomic>
-#include <cerrno>
 #include <cstdint>
 #include <new>
+
+#include "fileindex/queue/large_pages.h"
 
 #if defined(__has_feature)
 #if __has_feature(address_sanitizer)
@@ -25,7 +26,7 @@
 namespace quarry::fileindex {
 namespace {
 
-constexpr std::size_t kChunkSize = std::size_t{2} << 20;  // a large page's, and its alignment
+constexpr std::size_t kChunkSize = kLargePage;  // and its alignment
 // What a chunk that the pool still hands out from seems to hold, beside what it does.
 constexpr std::size_t kOpen = SIZE_MAX / 2;
 
@@ -75,11 +76,7 @@ void Pool::Begin() {
   Finish();
   void* const place = MapChunk();
   ++chunks_in_use;
-  if (is_large_) {
-    const int saved_errno = errno;
-    madvise(place, kChunkSize, MADV_HUGEPAGE);
-    errno = saved_errno;
-  }
+  if (is_large_) PreferLargePages(place, kChunkSize);
   chunk_ = new (place) Chunk;
   used_ = sizeof(Chunk);
   is_large_ = true;

@@ -7,6 +7,8 @@
 #include <cerrno>
 #include <cstring>
 
+#include "fileindex/queue/event_line.h"
+
 namespace quarry::fileindex {
 namespace {
 
@@ -40,6 +42,9 @@ void QueueReader::MakeRoom() {
   end_ -= begin_;
   searched_ -= begin_;
   begin_ = 0;
+  // What is left of a buffer that was not plain may be; a line of many buffers is not gone through
+  // again for each.
+  if (!is_plain_ && end_ < kBufferSize) is_plain_ = IsPlain({buffer_.data(), end_});
   if (end_ == buffer_.size()) buffer_.resize(2 * buffer_.size());
 }
 
@@ -54,8 +59,11 @@ bool QueueReader::Fill() {
   } while (count < 0 && errno == EINTR);
   failed_ = count < 0;
   at_end_ = count == 0;
-  if (count > 0) end_ += static_cast<size_t>(count);
-  return count > 0;
+  if (count <= 0) return false;
+  const std::string_view added(buffer_.data() + end_, static_cast<size_t>(count));
+  is_plain_ = is_plain_ && IsPlain(added);
+  end_ += added.size();
+  return true;
 }
 
 }  // namespace quarry::fileindex

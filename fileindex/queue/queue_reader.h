@@ -22,6 +22,10 @@ class QueueReader {
   // has_line().
   bool Next(std::string_view& line);
 
+  // Whether the line that Next handed out last is known to have neither backslashes nor NUL bytes:
+  // for the whole buffer at once, that is found out in no time.
+  bool is_plain() const { return is_plain_; }
+
   // Whether the next line is at hand, whole.
   bool has_line() const { return newline_ != nullptr; }
 
@@ -39,6 +43,7 @@ class QueueReader {
   bool failed_;
   bool at_end_ = false;
   bool line_ended_ = false;
+  bool is_plain_ = true;  // the buffer
   std::vector<char> buffer_;
   size_t begin_ = 0;  // what has not been handed out yet is buffer_[begin_, end_)
   size_t end_ = 0;

@@ -57,8 +57,7 @@ std::vector<std::shared_ptr<OP>> Relocation::Deliver(const OP* current,
     OPNode& to = Target(i);
     if (Ledger::Receive(to, std::move(stops_[i].bundle), current)) unsettled.push_back(&to);
     if (stops_[i].carried == OP_NONE) continue;
-    carriers.push_back(
-        std::make_shared<OP>(to.shared_from_this(), stops_[i].carried, "", Json::Value()));
+    carriers.push_back(std::make_shared<OP>(to.shared_from_this(), stops_[i].carried));
   }
   return carriers;
 }

@@ -64,6 +64,13 @@ bool IsTaken(std::string_view line) {
 bool ExpectSame(const std::string& line) {
   EventLine event;
   const bool taken = ReadEventLine(line, event);
+  if (IsPlain(line)) {
+    EventLine plain;
+    EXPECT_EQ(ReadEventLine(line, plain, true), taken) << line;
+    if (taken) {
+      EXPECT_EQ(ByQuickReader(plain), ByQuickReader(event)) << line;
+    }
+  }
   const std::string expected = BySlowReader(line);
   if (taken) {
     EXPECT_EQ(ByQuickReader(event), expected) << line;

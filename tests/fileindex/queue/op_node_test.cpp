@@ -49,6 +49,20 @@ TEST_F(OPNodeTest, NewNodeIsEmpty) {
   EXPECT_TRUE(node.ops.empty());
 }
 
+TEST_F(OPNodeTest, NewRecordHasWhatItIsGiven) {
+  const auto node = root_->GetChild("a");
+  const OP plain(node, OP_ATTR);
+  EXPECT_EQ(plain.node, node);
+  EXPECT_EQ(plain.op, OP_ATTR);
+  EXPECT_EQ(plain.src, "");
+  EXPECT_TRUE(plain.data.isNull());
+  const OP whole(node, OP_RENAME, "/old", Json::Value(7));
+  EXPECT_EQ(whole.node, node);
+  EXPECT_EQ(whole.op, OP_RENAME);
+  EXPECT_EQ(whole.src, "/old");
+  EXPECT_EQ(whole.data, Json::Value(7));
+}
+
 TEST_F(OPNodeTest, SameNameIsTheSameChild) {
   const auto a = root_->GetChild("a");
   EXPECT_EQ(root_->GetChild("a"), a);

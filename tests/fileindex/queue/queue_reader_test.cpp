@@ -8,6 +8,7 @@
 #include <string_view>
 #include <vector>
 
+#include "fileindex/queue/event_line.h"
 #include "tests/fileindex/queue/queue_lines.h"
 
 namespace quarry::fileindex {
@@ -78,6 +79,49 @@ TEST(QueueReaderTest, TellsWhetherALineWasEnded) {
   EXPECT_FALSE(reader.line_ended());
   EXPECT_FALSE(reader.Next(line));
   EXPECT_FALSE(reader.failed());
+}
+
+// What it calls plain is; and it does so of all lines where none has such bytes.
+TEST(QueueReaderTest, TellsWhichLinesArePlain) {
+  std::string text;
+  for (int i = 0; i < 50'000; ++i) {
+    text += std::to_string(i);
+    if (i % 20'011 == 20'010) text += i % 2 == 0 ? '\\' : '\0';
+    text += '\n';
+  }
+  const QueueFile queue(text);
+  QueueReader reader(queue.path());
+  int plain = 0;
+  for (std::string_view line; reader.Next(line);) {
+    if (!reader.is_plain()) continue;
+    ++plain;
+    ASSERT_TRUE(IsPlain(line)) << line;
+  }
+  EXPECT_GT(plain, 20'000);  // three buffers of five
+  EXPECT_LT(plain, 49'998);
+}
+
+TEST(QueueReaderTest, LinesArePlainAgainBehindAnEndedBuffer) {
+  const std::string filler(64 * 1024 - 3, 'f');
+  const QueueFile queue("\\" + filler + "\n\nplain\n");
+  QueueReader reader(queue.path());
+  std::string_view line;
+  ASSERT_TRUE(reader.Next(line));
+  EXPECT_FALSE(reader.is_plain());
+  ASSERT_TRUE(reader.Next(line));
+  EXPECT_EQ(line, "");
+  ASSERT_TRUE(reader.Next(line));
+  EXPECT_EQ(line, "plain");
+  EXPECT_TRUE(reader.is_plain());
+}
+
+TEST(QueueReaderTest, AHalfLineThatIsNotPlainStaysSo) {
+  const QueueFile queue("\\" + std::string(100'000, 'f') + "\n");
+  QueueReader reader(queue.path());
+  std::string_view line;
+  ASSERT_TRUE(reader.Next(line));
+  EXPECT_EQ(line.size(), 100'001u);
+  EXPECT_FALSE(reader.is_plain());
 }
 
 TEST(QueueReaderTest, WhatCannotBeReadFails) {

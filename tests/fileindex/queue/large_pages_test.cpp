@@ -1,0 +1,55 @@
+#include "fileindex/queue/large_pages.h"
+
+#include <gtest/gtest.h>
+
+#include <cerrno>
+#include <cstddef>
+#include <memory>
+#include <vector>
+
+namespace quarry::fileindex {
+namespace {
+
+TEST(LargePagesTest, AskingForThemChangesNothing) {
+  std::vector<char> memory(3 * kLargePage, 'm');
+  errno = EAGAIN;
+  PreferLargePages(memory.data(), memory.size());
+  PreferLargePages(memory.data(), 10);
+  PreferLargePages(memory.data(), 0);
+  PreferLargePages(nullptr, 0);
+  EXPECT_EQ(errno, EAGAIN);
+  EXPECT_EQ(memory, std::vector<char>(3 * kLargePage, 'm'));
+}
+
+TEST(LargePagesTest, NoErrorIsLeftWhereNoMemoryIs) {
+  std::vector<char> memory(3 * kLargePage);
+  const char* const place = memory.data();
+  memory = std::vector<char>();
+  errno = 0;
+  PreferLargePages(place, 3 * kLargePage);
+  EXPECT_EQ(errno, 0);
+}
+
+TEST(LargePagesTest, ShortListsGrowByThemselves) {
+  std::vector<int> list(10);
+  list.shrink_to_fit();
+  MakeRoom(list);
+  EXPECT_EQ(list.capacity(), 10u);
+}
+
+TEST(LargePagesTest, LongListsGetTwiceTheRoomAndKeepTheirElements) {
+  std::vector<std::unique_ptr<std::size_t>> list;
+  const std::size_t count = kLargePage / sizeof(list[0]);
+  list.reserve(count);
+  while (list.size() < count) list.push_back(std::make_unique<std::size_t>(list.size()));
+  MakeRoom(list);
+  EXPECT_EQ(list.capacity(), 2 * count);
+  ASSERT_EQ(list.size(), count);
+  for (std::size_t i = 0; i < count; ++i) ASSERT_EQ(*list[i], i);
+  list.push_back(nullptr);
+  MakeRoom(list);
+  EXPECT_EQ(list.capacity(), 2 * count);
+}
+
+}  // namespace
+}  // namespace quarry::fileindex
