@@ -59,7 +59,7 @@ std::string LastLine(const std::string& path) {
 }
 
 // Whether the rename of the documents has been queued, which is the last thing that the library
-// does. Nobody else writes to the queue before the move is ended.
+// does. Where the monitor has written behind it, it is queued once more, which does no harm.
 bool IsRenameQueued(const SharePlan& plan) {
   Json::Value line;
   return fromString(line, LastLine(sdk::SDKShare(plan.to).GetQueuePath())) && line.isObject() &&

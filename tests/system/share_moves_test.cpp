@@ -11,8 +11,10 @@
 #include "cli/supervisor/child.h"
 #include "cli/system.h"
 #include "common/file_util.h"
+#include "common/json.h"
 #include "common/lock_file.h"
 #include "common/sdk/share.h"
+#include "fileindex/queue/event.h"
 #include "platform/linux/share_move.h"
 #include "platform/linux/share_registry.h"
 #include "tests/support/files.h"
@@ -244,6 +246,36 @@ TEST_F(ShareMovesTest, AMoveThatWasCutShortIsNamedAndEnded) {
   system_.Run({"share", "rename", "docs", "papers"});
   system_.Run({"share", "resume", "papers"});
   ExpectArrived(papers);
+}
+
+std::string Line(int event, const std::string& path, const std::string& old_path) {
+  Json::Value line;
+  line["event"] = event;
+  line["is_dir"] = true;
+  line["path"] = path;
+  line["path_old"] = old_path;
+  return toString(line) + "\n";
+}
+
+// What a kill at the very end leaves when the monitor has written behind the rename: it is queued
+// once more, and done once.
+TEST_F(ShareMovesTest, ALineBehindTheRenameDoesNoHarm) {
+  const std::string other = system_.Files() + "/other";
+  const std::string moved = other + "/docs";
+  system_.Run({"pause"});
+  std::filesystem::rename(docs_, moved);
+  platform::MoveShare("docs", moved);
+  const std::string queues = TestRoot() + "/var/lib/quarry/queue";
+  ASSERT_EQ(ListDir(queues).size(), 1U);
+  const std::string queue = queues + "/" + ListDir(queues)[0];
+  const std::string rename = Line(fileindex::EVENT_RENAME, moved, docs_);
+  WriteFile(queue, ReadFile(queue) + rename + Line(fileindex::EVENT_DELETE, moved + "/gone", ""));
+  system_.Run({"share", "migrate", "docs", other});
+  const std::string lines = ReadFile(queue);
+  const std::string twice = "\"path_old\":\"" + docs_ + "\"";
+  EXPECT_NE(lines.find(twice), lines.rfind(twice)) << lines;
+  system_.Run({"resume"});
+  ExpectArrived(moved);
 }
 
 TEST_F(ShareMovesTest, AShareThatIsNotIndexedNeedsNoSystem) {
