@@ -13,12 +13,21 @@ namespace {
 // Grown in such steps, so that memory follows what the file really holds.
 constexpr std::size_t kReadStep = std::size_t{1} << 20;
 
-// How much to make room for at a time: what the file says it has, and a byte more, by which its end
-// is seen. Room costs time even where nothing comes, for it is cleared.
-std::size_t StepFor(int fd) {
+// To see the end of what was read, or what has come since.
+constexpr std::size_t kLeastRoom = std::size_t{4} << 10;
+
+// What the file says it has.
+std::size_t SizeOf(int fd) {
   struct stat status {};
-  if (fstat(fd, &status) != 0 || status.st_size < 0) return kReadStep;
-  return std::min(kReadStep, std::max(kHeadBytes, static_cast<std::size_t>(status.st_size)) + 1);
+  if (fstat(fd, &status) != 0 || status.st_size < 0) return 0;
+  return static_cast<std::size_t>(status.st_size);
+}
+
+// How much to make room for behind what there is: for no more than is to be expected, since room is
+// cleared, which takes time even where nothing comes.
+std::size_t RoomFor(std::size_t got, std::size_t expected) {
+  const std::size_t room = got < expected ? expected - got + 1 : got / 8;
+  return std::clamp(room, kLeastRoom, kReadStep);
 }
 
 }  // namespace
@@ -31,10 +40,10 @@ Source Source::OfBytes(std::string bytes, std::string extension) {
 }
 
 void Source::ReadUpTo(std::size_t size) {
-  if (!at_end_ && step_ == 0) step_ = StepFor(fd_);
+  if (!at_end_ && !expected_) expected_ = SizeOf(fd_);
   while (!at_end_ && bytes_.size() < size) {
     const std::size_t got = bytes_.size();
-    bytes_.resize(std::min(size, got + step_));
+    bytes_.resize(std::min(size, got + RoomFor(got, *expected_)));
     ssize_t count = 0;
     do {
       count = pread(fd_, bytes_.data() + got, bytes_.size() - got, static_cast<off_t>(got));

@@ -4,6 +4,7 @@
 #define QUARRY_DAEMONS_TARNCONTENTEXTRACTD_SOURCE_H_
 
 #include <cstddef>
+#include <optional>
 #include <string>
 #include <string_view>
 
@@ -39,7 +40,7 @@ class Source {
   int fd_;
   std::string extension_;
   std::string bytes_;
-  std::size_t step_ = 0;  // bytes to make room for at a time; 0: not yet known
+  std::optional<std::size_t> expected_;  // bytes in all, once asked
   bool at_end_ = false;
 };
 

@@ -51,6 +51,15 @@ TEST_F(SourceTest, AFileThatCannotBeReadSeemsToEnd) {
   EXPECT_EQ(Source(directory.get(), "").Bytes(), "");
 }
 
+TEST_F(SourceTest, AFileThatGrowsIsReadOn) {
+  const UniqueFd file = FileOf(std::string(2 * kHeadBytes, 'x'));
+  Source source(file.get(), "");
+  EXPECT_EQ(source.Head().size(), kHeadBytes);
+  const std::string more(std::size_t{3} << 20, 'y');
+  test::WriteFile(dir_ / "file", std::string(2 * kHeadBytes, 'x') + more);
+  EXPECT_TRUE(source.Bytes() == std::string(2 * kHeadBytes, 'x') + more);
+}
+
 TEST_F(SourceTest, AFileThatShrinksEndsWhereItEnds) {
   const UniqueFd file = FileOf(std::string(2 * kHeadBytes, 'x'));
   Source source(file.get(), "");
