@@ -2,9 +2,11 @@
 
 #include <sys/random.h>
 
+#include <algorithm>
 #include <array>
 #include <cstdio>
 #include <new>
+#include <optional>
 #include <utility>
 #include <vector>
 
@@ -62,6 +64,49 @@ std::optional<std::string> OptionalName(const Json::Value& data, const char* key
   return NameProperty(data, key);
 }
 
+const std::string kUpsert = "document_upsert_by_id";
+
+// The requests from `element` on that store documents in the same index.
+std::vector<const Json::Value*> UpsertsOfOneIndex(Json::Value::const_iterator element,
+                                                  Json::Value::const_iterator end) {
+  std::vector<const Json::Value*> upserts;
+  const Json::Value* id = nullptr;
+  for (; element != end; ++element) {
+    if (!element->isObject() || (*element)["command"] != kUpsert) break;
+    const Json::Value& data = (*element)["data"];
+    if (!data.isObject() || (id != nullptr && data["id"] != *id)) break;
+    id = &data["id"];
+    upserts.push_back(&*element);
+  }
+  return upserts;
+}
+
+// Runs `action`, whose want of memory is an Error like others.
+template <typename Action>
+auto ReportingMemory(Action action) {
+  try {
+    return action();
+  } catch (const std::bad_alloc&) {
+    throw Error(kErrorEngineBusyMemory, "Out of memory");
+  }
+}
+
+// The answer to a request that `action` makes the data of. `name` is the command, or becomes it.
+template <typename Action>
+Json::Value Answer(const std::string& name, Action action) {
+  try {
+    return SuccessReply(action());
+  } catch (const Error& error) {
+    LogFailure(name, error);
+    return FailureReply(error.code(), error.reason());
+  } catch (const Json::Exception& failure) {
+    return FailureReply(kMalformedRequest, failure.what());
+  } catch (const std::exception& failure) {
+    LogFailure(name, Error(kInternalFailure, failure.what()));
+    return FailureReply(kInternalFailure, failure.what());
+  }
+}
+
 // Damage that shows up during work is remembered, so that the next index_create repairs it.
 template <typename Action>
 auto NotingDamage(Index* index, Action action) {
@@ -93,7 +138,7 @@ const std::map<std::string, Engine::Command>& Engine::Commands() {
       {"index_resume", {&Engine::IndexResume, true}},
       {"index_config_set", {&Engine::IndexConfigSet, true}},
       {"index_check", {&Engine::IndexCheck, false}},
-      {"document_upsert_by_id", {&Engine::DocumentUpsert, false}},
+      {kUpsert, {&Engine::DocumentUpsert, false}},
       {"document_set_by_id", {&Engine::DocumentSet, false}},
       {"document_del_by_id", {&Engine::DocumentDelete, false}},
       {"document_del_by_query", {&Engine::DocumentDeleteByQuery, false}},
@@ -127,28 +172,75 @@ Json::Value Engine::HandleBatch(const Json::Value& elements) {
   if (!elements.isArray()) return FailureReply(kMalformedRequest, "Not an array: compound");
   Json::Value response = SuccessReply(Json::Value(Json::arrayValue));
   response["has_fail"] = false;
-  for (const Json::Value& element : elements) {
-    Json::Value answer = HandleOne(element);
-    if (!answer["success"].asBool()) response["has_fail"] = true;
-    response["data"].append(std::move(answer));
+  for (auto element = elements.begin(); element != elements.end();) {
+    const std::vector<const Json::Value*> upserts = UpsertsOfOneIndex(element, elements.end());
+    std::vector<Json::Value> answers;
+    if (upserts.size() > 1) {
+      answers = UpsertAll(upserts);
+    } else {
+      answers.push_back(HandleOne(*element));
+    }
+    for (Json::Value& answer : answers) {
+      if (!answer["success"].asBool()) response["has_fail"] = true;
+      response["data"].append(std::move(answer));
+      ++element;
+    }
   }
   return response;
 }
 
 Json::Value Engine::HandleOne(const Json::Value& request) {
   std::string name = "A request";
-  try {
+  return Answer(name, [&] {
     name = StringProperty(request, "command");
-    return SuccessReply(RunCommand(name, request));
-  } catch (const Error& error) {
-    LogFailure(name, error);
-    return FailureReply(error.code(), error.reason());
-  } catch (const Json::Exception& failure) {
-    return FailureReply(kMalformedRequest, failure.what());
-  } catch (const std::exception& failure) {
-    LogFailure(name, Error(kInternalFailure, failure.what()));
-    return FailureReply(kInternalFailure, failure.what());
+    return RunCommand(name, request);
+  });
+}
+
+// Documents in a row cost the writer one turn, and are made ready before it. Each is answered as it
+// would be by itself.
+std::vector<Json::Value> Engine::UpsertAll(const std::vector<const Json::Value*>& requests) {
+  std::vector<Json::Value> answers(requests.size());
+  const Json::Value all = Answer(
+      kUpsert, [&] { return ReportingMemory([&] { return UpsertInto(requests, &answers); }); });
+  if (all["success"].asBool()) return answers;
+  for (Json::Value& answer : answers) {
+    if (answer.isNull() || answer["success"].asBool()) answer = all;
   }
+  return answers;
+}
+
+Json::Value Engine::UpsertInto(const std::vector<const Json::Value*>& requests,
+                               std::vector<Json::Value>* answers) {
+  const auto answer = [answers](std::size_t i, auto action) {
+    (*answers)[i] = Answer(kUpsert, [&] {
+      return ReportingMemory([&] {
+        action();
+        return Json::Value();
+      });
+    });
+  };
+  const auto data_of = [&](std::size_t i) -> const Json::Value& { return (*requests[i])["data"]; };
+  const std::shared_ptr<Index> index = catalog_.Find(NameProperty(data_of(0), "id"));
+  std::size_t bytes = 0;
+  for (const Json::Value* request : requests) bytes += EstimateMemory((*request)["data"]["data"]);
+  const MemoryBudget::Share memory(&memory_, bytes);
+  Index::Access access(index.get());
+  std::vector<std::optional<StoredDocument>> documents(requests.size());
+  for (std::size_t i = 0; i < requests.size(); ++i) {
+    answer(i, [&] {
+      const std::string path = NameProperty(data_of(i), "doc_id");
+      documents[i] = MakeDocument(*access.schema(), path, ObjectProperty(data_of(i), "data"));
+    });
+  }
+  access.Write([&](IndexWriter& writer) {
+    for (std::size_t i = 0; i < requests.size(); ++i) {
+      if (!documents[i]) continue;
+      answer(i,
+             [&] { NotingDamage(index.get(), [&] { writer.Upsert(std::move(*documents[i])); }); });
+    }
+  });
+  return {};
 }
 
 Json::Value Engine::RunCommand(const std::string& name, const Json::Value& request) {
@@ -157,11 +249,9 @@ Json::Value Engine::RunCommand(const std::string& name, const Json::Value& reque
   static const Json::Value none(Json::objectValue);
   const bool has_data = name != "engine_status" || request.isMember("data");
   try {
-    try {
+    return ReportingMemory([&] {
       return (this->*command->second.run)(has_data ? ObjectProperty(request, "data") : none);
-    } catch (const std::bad_alloc&) {
-      throw Error(kErrorEngineBusyMemory, "Out of memory");
-    }
+    });
   } catch (const Error& error) {
     if (!command->second.never_busy || error.code() != kErrorEngineBusyMemory) throw;
     throw Error(kOutOfMemory, error.reason());

@@ -11,6 +11,7 @@
 #include <cstdint>
 #include <map>
 #include <string>
+#include <vector>
 
 #include "daemons/tarnelasticd/catalog.h"
 #include "daemons/tarnelasticd/memory_budget.h"
@@ -61,6 +62,9 @@ class Engine {
   static const std::map<std::string, Command>& Commands();
 
   Json::Value HandleOne(const Json::Value& request);
+  std::vector<Json::Value> UpsertAll(const std::vector<const Json::Value*>& requests);
+  Json::Value UpsertInto(const std::vector<const Json::Value*>& requests,
+                         std::vector<Json::Value>* answers);
   Json::Value HandleBatch(const Json::Value& elements);
   Json::Value RunCommand(const std::string& name, const Json::Value& request);
 

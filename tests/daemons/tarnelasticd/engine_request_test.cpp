@@ -256,6 +256,48 @@ TEST_F(RequestTest, RunsBatchesInOrderAndAnswersPerElement) {
   EXPECT_THAT(Below("/s/"), testing::ElementsAre("/s/1.txt"));
 }
 
+// Documents in a row, which are stored together, are answered as each would be by itself.
+TEST_F(RequestTest, AnswersDocumentsOfBatchesOneByOne) {
+  for (const char* id : {"a", "b", "paused"}) Create(id);
+  Json::Value id;
+  id["id"] = "paused";
+  Ask("index_pause", id);
+  std::vector<Json::Value> requests;
+  for (int i = 0; i < 40; ++i) {
+    const std::string path = "/s/" + std::to_string(i % 23) + ".txt";
+    const char* index = i < 15 ? "a" : i < 25 ? "b" : i < 30 ? "paused" : i < 33 ? "none" : "a";
+    requests.push_back(UpsertRequest(index, FileDocument(path, "text" + std::to_string(i))));
+  }
+  requests[1]["data"].removeMember("doc_id");
+  requests[3]["data"]["doc_id"] = 7;
+  requests[4]["data"]["data"] = "no object";
+  requests[6]["data"].removeMember("data");
+  requests[8].removeMember("data");
+  requests[10]["command"] = 5;
+  requests[11]["data"]["id"] = 3;
+  requests[12]["data"]["id"] = "";
+  requests[13] = 7;
+  for (int i = 36; i < 40; ++i) requests[static_cast<std::size_t>(i)]["data"].removeMember("id");
+  Json::Value batch;
+  Json::Value expected(Json::arrayValue);
+  for (const Json::Value& request : requests) batch["compound"].append(request);
+  for (const Json::Value& request : requests) expected.append(engine_->Handle(request));
+  const std::vector<std::string> below_a = Below("/s", "a");
+  const std::vector<std::string> below_b = Below("/s", "b");
+  for (const char* index : {"a", "b"}) {
+    id["id"] = index;
+    Ask("index_delete", id);
+    Create(index);
+  }
+  const Json::Value response = engine_->Handle(batch);
+  EXPECT_TRUE(response["has_fail"].asBool());
+  EXPECT_EQ(response["data"], expected);
+  EXPECT_EQ(Below("/s", "a"), below_a);
+  EXPECT_EQ(Below("/s", "b"), below_b);
+  EXPECT_FALSE(below_a.empty());
+  EXPECT_FALSE(below_b.empty());
+}
+
 TEST_F(RequestTest, AnswersAnEmptyBatchAndRefusesOneThatIsNoArray) {
   EXPECT_EQ(engine_->HandleText(R"({"compound":[]})"),
             R"({"data":[],"has_fail":false,"success":true})");
