@@ -60,7 +60,7 @@ class LookAhead {
     std::string path;
     OPNode* node;
   };
-  static constexpr std::size_t kMostDirectories = 32768;
+  static constexpr std::size_t kMostDirectories = 131072;
   static constexpr std::size_t kLongestPath = 512;
 
   void ReadUsual(QueueLine& line, const QueueLine* previous) const;

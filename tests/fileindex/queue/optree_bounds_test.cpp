@@ -65,22 +65,21 @@ TEST_F(BoundsTest, DirectoryOfAMillionFiles) {
 TEST_F(BoundsTest, FilesInManyDirectoriesInTurn) {
   std::string lines;
   for (int turn = 0; turn < 2; ++turn) {
-    for (int i = 0; i < 40'000; ++i) {
-      const std::string directory = Nth("/s/directory-", i);
-      lines += Line(EVENT_MODIFY, directory + Nth("/file-", turn));
-      lines += Line(EVENT_MODIFY, directory + "/same");
+    for (int i = 0; i < 140'000; ++i) {
+      lines += "{\"event\":2,\"path\":\"" + Nth("/s/directory-", i) + Nth("/file-", turn) + "\"}\n";
     }
   }
   const QueueFile queue(lines);
   OPTree tree(queue.path());
-  ASSERT_EQ(tree.ops.size(), 120'000u);
-  EXPECT_EQ(tree.GetNodeByPath("/s")->children.size(), 40'000u);
-  const auto& last = tree.GetNodeByPath("/s/directory-39999")->children;
-  ASSERT_EQ(last.size(), 3u);
-  EXPECT_EQ(last[0]->name, "file-0");
-  EXPECT_EQ(last[1]->name, "same");
-  EXPECT_EQ(last[1]->ops.size(), 1u);
-  EXPECT_EQ(last[2]->name, "file-1");
+  ASSERT_EQ(tree.ops.size(), 280'000u);
+  EXPECT_EQ(tree.GetNodeByPath("/s")->children.size(), 140'000u);
+  for (const int i : {0, 131'071, 131'072, 139'999}) {
+    const auto& files = tree.GetNodeByPath(Nth("/s/directory-", i))->children;
+    ASSERT_EQ(files.size(), 2u);
+    EXPECT_EQ(files[0]->name, "file-0");
+    EXPECT_EQ(files[1]->name, "file-1");
+    EXPECT_EQ(files[1]->ops.size(), 1u);
+  }
 }
 
 TEST_F(BoundsTest, PathOfTwoThousandComponents) {
