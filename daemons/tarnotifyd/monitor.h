@@ -26,8 +26,9 @@ class Monitor : private ChangeSink {
   using Now = std::function<Clock::time_point()>;
 
   // Between two readings of what has happened: under load the kernel gathers it meanwhile, and
-  // folds some of it. Less than a feed gathers anyway before it writes.
-  static constexpr std::chrono::milliseconds kBetweenReads{20};
+  // folds some of it. Short, since a file that is written is told of when the reading after shows
+  // it closed.
+  static constexpr std::chrono::milliseconds kBetweenReads{5};
 
   explicit Monitor(std::unique_ptr<ChangeSource> source, Now now = Clock::now);
 
