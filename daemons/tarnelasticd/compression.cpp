@@ -10,7 +10,7 @@ namespace quarry::engine {
 namespace {
 
 // Text at this level costs less time than cutting it into words does.
-constexpr int kLevel = 5;
+constexpr int kLevel = 6;
 // A request cannot bring more; a frame that claims more is damaged.
 constexpr unsigned long long kMaxBytes = 1ULL << 30;
 

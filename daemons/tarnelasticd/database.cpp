@@ -196,6 +196,18 @@ void Database::EmptyLog() noexcept {
   sqlite3_busy_timeout(handle(), kBusyTimeoutMs);
 }
 
+void Database::GiveBackFreePages() noexcept {
+  constexpr std::int64_t kFewOf = 32;
+  try {
+    Statement free = Prepare("PRAGMA freelist_count");
+    Statement all = Prepare("PRAGMA page_count");
+    if (!free.Step() || !all.Step() || free.Int(0) * kFewOf <= all.Int(0)) return;
+  } catch (const Error&) {
+    return;
+  }
+  sqlite3_exec(handle(), "PRAGMA incremental_vacuum", nullptr, nullptr, nullptr);
+}
+
 bool Database::HasMoved() const {
   int moved = 0;
   sqlite3_file_control(handle(), "main", SQLITE_FCNTL_HAS_MOVED, &moved);

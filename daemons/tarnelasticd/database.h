@@ -79,6 +79,9 @@ class Database {
   // Writes the log back into the database and cuts it to nothing, if nobody reads just now. Never
   // waits; a failure is left to the next commit.
   void EmptyLog() noexcept;
+  // Takes free pages out of the database when they are more than a few of all. No transaction may
+  // be open. Never waits; a failure is left to the next commit.
+  void GiveBackFreePages() noexcept;
   // Whether the file that is open is no longer the one at its path.
   bool HasMoved() const;
 

@@ -143,8 +143,9 @@ void IndexWriter::CommitNow() {
       .Bind(1, documents_.load())
       .Run();
   db_.Execute("COMMIT");
-  terms_requested_ = false;
   uncommitted_ = false;
+  // The end of a pass: what it has left free may not be needed again for long.
+  if (std::exchange(terms_requested_, false)) db_.GiveBackFreePages();
   // Else the log stays as large as the transaction was for as long as nobody writes.
   if (transaction_bytes_ >= kLargeTransaction) db_.EmptyLog();
 }

@@ -137,6 +137,19 @@ PostingLists::PostingLists(Database* db, std::string table, std::int64_t last_id
   }
 }
 
+// A large one would be written anew for minutes, and is merged step by step as it grows anyway.
+bool PostingLists::IsWorthMerging() const {
+  constexpr std::int64_t kMaxLeaves = 20000;
+  std::int64_t all = 0;
+  std::int64_t largest = 0;
+  for (const Segment& segment : segments_) {
+    const std::int64_t leaves = segment.last_leaf - segment.first_leaf + 1;
+    all += leaves;
+    largest = std::max(largest, leaves);
+  }
+  return all <= kMaxLeaves && (all - largest) * 8 > all;
+}
+
 void PostingLists::ForEach(std::string_view word, bool prefix, const Visitor& visit) {
   const std::string key = kMainIndex + std::string(word);
   Gatherer gatherer(weights_, last_id_, visit);

@@ -35,6 +35,10 @@ class PostingLists {
   // library to come may be, FTS5 must be asked.
   bool IsReadable() const { return is_readable_; }
 
+  // Whether the table is small, and so much of it lies outside of its largest segment that making
+  // one of all saves noticeable room.
+  bool IsWorthMerging() const;
+
   // Calls `visit` with the documents that have `word`, or a word that begins with it; no document
   // twice with one word, in no certain order. `word` is one that the table's tokenizer makes.
   using Visitor = std::function<void(const std::vector<Posting>& some)>;

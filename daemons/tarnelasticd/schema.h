@@ -28,7 +28,7 @@
 namespace quarry::engine {
 
 // The version of the layout. A database of another version counts as damaged: it is made anew.
-constexpr int kLayoutVersion = 7;
+constexpr int kLayoutVersion = 8;
 
 // How a field's values are kept.
 enum class Storage {

@@ -67,7 +67,7 @@ std::vector<NearTerm> NearInAll(const std::vector<SearchedIndex>& indexes, const
   }
   std::vector<NearTerm> all;
   for (auto& [text, found] : near) {
-    found.term.documents = DocumentsOfAll(indexes, text);
+    if (indexes.size() > 1) found.term.documents = DocumentsOfAll(indexes, text);
     all.push_back(std::move(found));
   }
   return all;
@@ -170,11 +170,13 @@ Json::Value CompleteWord(const CompletionRequest& request,
     const std::string prefix = FoldedPrefix(index.reader->tokenizer(), request.prefix);
     if (prefix.empty()) break;
     for (const Term& term : TermsThatBegin(&index.reader->db(), prefix, request.size)) {
-      found.emplace(term.text, 0);
+      found.emplace(term.text, term.documents);
     }
   }
   std::vector<Term> terms;
-  for (const auto& [text, none] : found) terms.push_back({text, DocumentsOfAll(indexes, text)});
+  for (const auto& [text, documents] : found) {
+    terms.push_back({text, indexes.size() > 1 ? DocumentsOfAll(indexes, text) : documents});
+  }
   std::stable_sort(terms.begin(), terms.end(),
                    [](const Term& a, const Term& b) { return a.documents > b.documents; });
   if (terms.size() > request.size) terms.resize(request.size);

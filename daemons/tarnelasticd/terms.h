@@ -1,9 +1,9 @@
 // The words of one index that are there to be suggested.
 //
-// The table "terms" keeps them in order of their bytes, a few hundred to a row. In a row stand, for
-// each word, how many bytes it shares with the one before, how many more it has, these, and how
-// many documents have it. Reading through all of them is faster than any index that would lead to
-// the few words that are similar to one.
+// The table "terms" keeps them in order of their bytes, thousands to a row, compressed. In a row
+// stand, for each word, how many bytes it shares with the one before, how many more it has, these,
+// and how many documents have it. Reading through all of them is faster than any index that would
+// lead to the few words that are similar to one.
 
 #ifndef QUARRY_DAEMONS_TARNELASTICD_TERMS_H_
 #define QUARRY_DAEMONS_TARNELASTICD_TERMS_H_
@@ -31,8 +31,9 @@ constexpr std::int64_t kMaxTermLetters = 40;
 // The statements that make the tables.
 std::string CreateTermTables();
 
-// Collects the words of all documents anew, inside the transaction that is open. Throws Error as
-// Database does, as all below do.
+// Collects the words of all documents anew, inside the transaction that is open. Where the full
+// text of a small index has come in many pieces it is put together first. Throws Error as Database
+// does, as all below do.
 void CollectTerms(Database* db);
 
 // Whether words have been collected, and there were any.

@@ -7,6 +7,7 @@
 #include <random>
 #include <set>
 
+#include "daemons/tarnelasticd/compression.h"
 #include "daemons/tarnelasticd/edit_distance.h"
 #include "daemons/tarnelasticd/index_files.h"
 #include "daemons/tarnelasticd/text_tokenizer.h"
@@ -150,10 +151,10 @@ class ManyTermsTest : public TermsTest {
     }
     return word;
   }
-  void AddDocuments() {
+  void AddDocuments(int first = 0) {
     std::vector<std::string> words;
     for (int i = 0; i < 3000; ++i) words.push_back(Word());
-    for (int document = 0; document < 20; ++document) {
+    for (int document = first; document < first + 20; ++document) {
       std::string text;
       for (int i = 0; i < 1500; ++i) text += words[random_() % words.size()] + ' ';
       Upsert(FileDocument("/s/" + std::to_string(document), text));
@@ -218,15 +219,16 @@ TEST_F(ManyTermsTest, SurviveDamage) {
   Collect();
   std::string block;
   {
-    Statement row = db_->Prepare("SELECT words FROM terms WHERE id=2");
+    Statement row = db_->Prepare("SELECT words FROM terms WHERE id=1");
     ASSERT_TRUE(row.Step());
-    block = row.Blob(0);
+    block = Decompress(row.Blob(0));
   }
   int damaged = 0;
   for (int i = 0; i < 300; ++i) {
     std::string broken = block.substr(0, random_() % block.size() + 1);
     broken[random_() % broken.size()] = static_cast<char>(random_());
-    db_->Prepare("UPDATE terms SET words=?1 WHERE id=2").BindBlob(1, broken).Run();
+    const std::string packed = random_() % 8 == 0 ? broken : Compress(broken);
+    db_->Prepare("UPDATE terms SET words=?1 WHERE id=1").BindBlob(1, packed).Run();
     try {
       Near("abcd", 2);
       Begin("a");
@@ -237,6 +239,28 @@ TEST_F(ManyTermsTest, SurviveDamage) {
     }
   }
   EXPECT_GT(damaged, 100);
+}
+
+// What came in pieces is one afterwards, and the room that this frees is given back.
+TEST_F(ManyTermsTest, PutASmallIndexTogether) {
+  AddDocuments();
+  Add("/t/1", "several pieces");
+  AddDocuments(20);
+  Add("/t/2", "several");
+  const std::string segments = "SELECT count(DISTINCT id>>37) FROM body_data WHERE id>10";
+  const auto count = [this](const std::string& sql) {
+    Statement row = db_->Prepare(sql);
+    return row.Step() ? row.Int(0) : -1;
+  };
+  db_ = std::make_unique<Database>(DatabasePath(DirectoryOf("a")));
+  EXPECT_GT(count(segments), 1);
+  const Json::Value before = Search("several");
+  Collect();
+  EXPECT_EQ(count(segments), 1);
+  EXPECT_LE(count("PRAGMA freelist_count") * 32, count("PRAGMA page_count"));
+  const Json::Value after = Search("several");
+  EXPECT_EQ(before["total"].asInt(), 2);
+  EXPECT_EQ(after, before);
 }
 
 // A copy counts as a document, though its text is kept once.
