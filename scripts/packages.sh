@@ -4,7 +4,7 @@
 build_packages=(
   g++ cmake ninja-build pkg-config ccache
   libjsoncpp-dev libsqlite3-dev libzstd-dev libicu-dev libxml2-dev libuchardet-dev libmd4c-dev
-  libseccomp-dev libcli11-dev libedit-dev
+  libseccomp-dev libsodium-dev libcli11-dev libedit-dev
 )
 # What the tests need beside them.
 test_packages=(libgtest-dev libgmock-dev mandoc)

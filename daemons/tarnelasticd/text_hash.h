@@ -12,9 +12,9 @@ namespace quarry::engine {
 constexpr std::size_t kHashKeyBytes = 16;
 constexpr std::size_t kTextHashBytes = 16;
 
-// SipHash-2-4 of 128 bits. Who does not know the key cannot make two texts of one hash, nor one
+// BLAKE2b of 128 bits, keyed. Who does not know the key cannot make two texts of one hash, nor one
 // with the hash of somebody else's text, so equal hashes can be taken for equal texts. `key` has
-// kHashKeyBytes. Any thread.
+// kHashKeyBytes. Any thread. Throws as RandomHashKey does.
 std::string TextHash(std::string_view key, std::string_view text);
 
 // A key that nobody can guess. Throws Error kErrorSystem when the system gives none.
