@@ -150,7 +150,9 @@ void FoldLog(const std::string& database) {
 
 // Small tables are flushed often anyway; the texts gain from larger pieces.
 void FillDatabase(Database* db, const Schema& schema) {
-  db->Execute("PRAGMA auto_vacuum=INCREMENTAL;PRAGMA journal_mode=DELETE;PRAGMA synchronous=FULL;BEGIN IMMEDIATE");
+  db->Execute(
+      "PRAGMA auto_vacuum=INCREMENTAL;PRAGMA journal_mode=DELETE;PRAGMA synchronous=FULL;BEGIN "
+      "IMMEDIATE");
   db->Execute(schema.CreateStatements());
   db->Execute("INSERT INTO body(body,rank) VALUES('hashsize',8388608)");
   Statement insert = db->Prepare("INSERT INTO meta(key,value) VALUES(?1,?2)");
