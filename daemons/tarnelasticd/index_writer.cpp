@@ -73,9 +73,7 @@ IndexWriter::~IndexWriter() {
 }
 
 void IndexWriter::LoadCounters() {
-  const std::int64_t last = LastId(&db_);
-  if (last != 0) CheckId(last);
-  next_id_ = last + 1;
+  next_id_ = LastId(&db_) + 1;
   Statement count = db_.Prepare("SELECT value FROM meta WHERE key='documents'");
   documents_ = count.Step() ? count.Int(0) : 0;
 }
@@ -312,18 +310,31 @@ bool IndexWriter::Delete(std::string_view path) {
   });
 }
 
+// The first selected documents; `rest` selects those behind them afterwards.
+std::vector<IndexWriter::Found> IndexWriter::TakeSelected(std::int64_t limit, Selection* rest) {
+  std::vector<Found> batch;
+  std::optional<std::string> last;
+  {
+    SelectedRows rows(*schema_, *rest, limit, &db_);
+    while (rows.Step()) {
+      DocumentRow row = Unpack(rows.row());
+      batch.push_back({rows.row().Int(0), ReadLabels(*schema_, row)});
+      last = std::move(row.path);
+    }
+  }
+  if (last) rest->after = std::move(last);
+  return batch;
+}
+
+// Each chunk goes on behind the one before: what lies between the documents of a folder stays, and
+// must not be stepped over again and again.
 std::int64_t IndexWriter::DeleteSelected(const Selection& selection) {
   std::int64_t left = selection.limit.value_or(std::numeric_limits<std::int64_t>::max());
   std::int64_t deleted = 0;
+  Selection rest = selection;
   for (;;) {
     const std::int64_t chunk = Change([&] {
-      std::vector<Found> batch;
-      {
-        SelectedRows rows(*schema_, selection, std::min(left, kDeleteChunk), &db_);
-        while (rows.Step()) {
-          batch.push_back({rows.row().Int(0), ReadLabels(*schema_, Unpack(rows.row()))});
-        }
-      }
+      const std::vector<Found> batch = TakeSelected(std::min(left, kDeleteChunk), &rest);
       for (const Found& old : batch) Remove(old);
       return static_cast<std::int64_t>(batch.size());
     });

@@ -12,6 +12,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "daemons/tarnelasticd/database.h"
 #include "daemons/tarnelasticd/document.h"
@@ -95,6 +96,7 @@ class IndexWriter {
   bool IsOld() const;
 
   std::optional<Found> FindByPath(std::string_view path);
+  std::vector<Found> TakeSelected(std::int64_t limit, Selection* rest);
   void Insert(StoredDocument document);
   void Replace(const Found& old, StoredDocument document);
   void Remove(const Found& old);

@@ -21,7 +21,9 @@ std::int64_t LastId(Database* db) {
   Statement last = db->Prepare(
       "SELECT max(coalesce((SELECT max(id) FROM docs),0),"
       "coalesce((SELECT max(doc) FROM text_copies),0))");
-  return last.Step() ? last.Int(0) : 0;
+  const std::int64_t id = last.Step() ? last.Int(0) : 0;
+  if (id != 0) CheckId(id);
+  return id;
 }
 
 std::vector<TextCopy> ReadTextCopies(Database* db) {

@@ -27,7 +27,8 @@ std::string CreateSharingTables();
 // number. Throws Error as Database does.
 std::int64_t TextOf(Database* db, std::int64_t doc);
 
-// The largest number that a document or a text has; 0 where there is neither.
+// The largest number that a document or a text has; 0 where there is neither. Throws Error
+// kDamagedIndex when it is one that cannot be.
 std::int64_t LastId(Database* db);
 
 // One row of the table. Numbers fit; see kMaxId.

@@ -26,9 +26,10 @@ std::size_t CostOf(std::string_view text) {
   throw Error(kDamagedIndex, "Stored texts are damaged");
 }
 
-// So many rows are kept: when documents are read in order of their paths, these are of a few rows
-// at a time.
+// So many rows are kept, and so many bytes beside the row at hand: when documents are read in order
+// of their paths, these are of a few rows at a time. A text that has a row of its own may be large.
 constexpr std::size_t kKeptRows = 16;
+constexpr std::size_t kKeptBytes = std::size_t{4} << 20;
 
 std::string Select(const char* columns, const TextTable& table, const char* rest) {
   return std::string("SELECT ") + columns + " FROM " + table.name + " WHERE " + rest;
@@ -64,10 +65,16 @@ TextReader::TextReader(Database* db, const TextTable& table)
 const std::string& TextReader::Row(std::int64_t key) {
   const auto kept = rows_.find(key);
   if (kept != rows_.end()) return kept->second;
-  if (rows_.size() >= kKeptRows) rows_.clear();
+  if (rows_.size() >= kKeptRows || kept_bytes_ >= kKeptBytes) Clear();
   Statement row = db_->Prepare(load_sql_);
   std::string bytes = row.Bind(1, key).Step() ? Decompress(row.Blob(0)) : std::string();
+  kept_bytes_ += bytes.size();
   return rows_.emplace(key, std::move(bytes)).first->second;
+}
+
+void TextReader::Clear() {
+  rows_.clear();
+  kept_bytes_ = 0;
 }
 
 std::string TextReader::Read(std::int64_t id) {

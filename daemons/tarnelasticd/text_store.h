@@ -42,7 +42,7 @@ class TextReader {
   // beside it, until Clear(). Throws Error kDamagedIndex when it is broken.
   std::string Read(std::int64_t id);
   // To be called when the table has changed.
-  void Clear() { rows_.clear(); }
+  void Clear();
 
  private:
   const std::string& Row(std::int64_t key);
@@ -51,6 +51,7 @@ class TextReader {
   const std::string find_sql_;
   const std::string load_sql_;
   std::map<std::int64_t, std::string> rows_;  // by their ids
+  std::size_t kept_bytes_ = 0;
 };
 
 // The same for one text.

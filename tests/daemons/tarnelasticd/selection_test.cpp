@@ -119,6 +119,30 @@ TEST_P(SelectionTest, IsThatOfTheModel) {
   }
 }
 
+// More than are deleted at a time, with what stays in between and at the end.
+TEST_P(SelectionTest, ALargeFolderIsDeletedWithoutWhatIsBelowItsFolders) {
+  const std::size_t kChildren = 1000 + GetParam();
+  for (std::size_t i = 0; i < kChildren; ++i) {
+    const std::string child = "/s/" + std::to_string(i);
+    Upsert(FileDocument(child));
+    if (i % 2 == 0) Upsert(FileDocument(child + "/below"));
+    if (i % 9 != 0) continue;
+    Json::Value odd = FileDocument("/t/" + std::to_string(i));
+    odd["TARNMDParent"] = "/s";
+    Upsert(odd);
+  }
+  const std::size_t odd = (kChildren + 8) / 9;
+  Json::Value data;
+  data["id"] = "a";
+  data["query"]["qsl"]["term"]["TARNMDParent"] = "/s";
+  data["query"]["limit"] = 700;
+  EXPECT_EQ(Ask("document_del_by_query", data)["deleted"].asUInt64(), 700U);
+  data["query"].removeMember("limit");
+  EXPECT_EQ(Ask("document_del_by_query", data)["deleted"].asUInt64(), kChildren + odd - 700);
+  EXPECT_EQ(Ask("document_get_by_query", data).size(), 0U);
+  EXPECT_EQ(Below("/").size(), (kChildren + 1) / 2);
+}
+
 INSTANTIATE_TEST_SUITE_P(Seeds, SelectionTest, testing::Range(1U, 9U));
 
 }  // namespace

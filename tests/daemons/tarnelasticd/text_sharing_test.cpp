@@ -143,6 +143,28 @@ TEST_F(TextSharingTest, WithoutItsKeyAnIndexIsDamaged) {
   EXPECT_EQ(AskError("document_upsert_by_id", UpsertRequest("a", document)["data"]), kDamagedIndex);
 }
 
+// What is kept by number would take any amount of memory.
+TEST_F(TextSharingTest, ANumberThatCannotBeIsDamageAlsoToWhoWorksAlready) {
+  for (const char* change :
+       {"UPDATE docs SET id=1<<40 WHERE path='/s/3'", "UPDATE text_copies SET doc=1<<40"}) {
+    Create();
+    Store("/s/1", "harbour");
+    Store("/s/2", "harbour");
+    Store("/s/3", "storm");
+    Commit();
+    Database(DatabasePath(DirectoryOf("a"))).Execute(change);
+    EXPECT_EQ(SearchError("harbour"), kDamagedIndex) << change;
+    Json::Value terms;
+    terms["db_name"] = "a";
+    terms["doc_id_field"] = "TARNMDPath";
+    Ask("update_term_suggestion", terms);
+    Json::Value data;
+    data["id"] = "a";
+    EXPECT_EQ(AskError("commit", data), kDamagedIndex) << change;
+    EXPECT_EQ(AskError("index_check", data), kDamagedIndex) << change;
+  }
+}
+
 class TextSharingModelTest : public TextSharingTest, public testing::WithParamInterface<unsigned> {
  protected:
   std::string Path() { return "/s/" + std::to_string(random_() % 12); }
