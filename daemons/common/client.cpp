@@ -146,10 +146,16 @@ std::string Client::RequestText(std::string request) {
   if (fd_.valid() && IsStale()) fd_.Reset();
   if (!fd_.valid()) Connect();
   const Deadline deadline(options_.timeout);
-  SendFrame(std::move(request), deadline);
-  std::string reply = RecvFrame(deadline);
-  if (!reply.empty() && reply.back() == '\0') reply.pop_back();
-  return reply;
+  try {
+    SendFrame(std::move(request), deadline);
+    std::string reply = RecvFrame(deadline);
+    if (!reply.empty() && reply.back() == '\0') reply.pop_back();
+    return reply;
+  } catch (...) {
+    // Nothing that is left of this answer may be taken for the next one.
+    fd_.Reset();
+    throw;
+  }
 }
 
 Json::Value Client::Request(const Json::Value& request) {

@@ -3,6 +3,7 @@
 #include <json/json.h>
 
 #include <chrono>
+#include <exception>
 #include <map>
 #include <optional>
 #include <utility>
@@ -55,19 +56,25 @@ std::vector<std::string_view> DocumentsOf(std::string_view reply) {
   throw Error(kErrorParseDocument, "The reader's answer is malformed");
 }
 
-bool IsDocument(std::string_view text) {
-  return text.front() == '{';
+// Whether it is the document of that place: should answers ever get out of step with what is asked,
+// none is to be stored in another's place.
+bool IsDocumentOf(std::string_view text, const std::string& path) {
+  const auto members = daemon::MembersOf(text);
+  if (!members) return false;
+  const auto told = members->find(elastic::kFieldPath);
+  return told != members->end() && told->second == Quoted(path);
 }
 
-// Has also the field that the engine wants besides what the reader knows.
+// Has also the field that the engine wants besides what the reader knows. Of two of one name the
+// last counts.
 void AppendUpsert(const std::string& id, const std::string& path, std::string_view document,
                   std::string* out) {
   if (out->back() != '[') *out += ',';
   *out += R"({"command":"document_upsert_by_id","data":{"id":)" + Quoted(id) + R"(,"doc_id":)" +
-          Quoted(path) + R"(,"data":{")" + elastic::kFieldSearchFileName +
-          "\":" + Quoted(Basename(path)) + ',';
-  out->append(document.substr(document.find('{') + 1));
-  *out += "}}";
+          Quoted(path) + R"(,"data":)";
+  out->append(document.substr(0, document.size() - 1));
+  *out +=
+      std::string(",\"") + elastic::kFieldSearchFileName + "\":" + Quoted(Basename(path)) + "}}}";
 }
 
 }  // namespace
@@ -88,7 +95,7 @@ void DocumentCarrier::CarrySome(const std::string& id, const std::vector<Wish>& 
   batch.reserve(read.size() + 1024 * documents.size());
   std::vector<std::size_t> sent;
   for (const std::string_view document : documents) {
-    if (IsDocument(document)) {
+    if (IsDocumentOf(document, wishes[*at].path)) {
       AppendUpsert(id, wishes[*at].path, document, &batch);
       sent.push_back(*at);
     }
@@ -106,11 +113,12 @@ void DocumentCarrier::CarrySome(const std::string& id, const std::vector<Wish>& 
   }
 }
 
-std::vector<bool> DocumentCarrier::Carry(const std::string& id, const std::vector<Wish>& wishes) {
+std::vector<bool> DocumentCarrier::Carry(const std::string& id, const std::vector<Wish>& wishes,
+                                         const std::function<bool()>& go_on) {
   std::vector<bool> done(wishes.size(), false);
   try {
-    for (std::size_t at = 0; at < wishes.size();) CarrySome(id, wishes, &done, &at);
-  } catch (const Error&) {
+    for (std::size_t at = 0; at < wishes.size() && go_on();) CarrySome(id, wishes, &done, &at);
+  } catch (const std::exception&) {
     // What is not done is asked for again, and then it shows what is wrong.
   }
   return done;

@@ -4,6 +4,7 @@
 #define QUARRY_DAEMONS_FILEINDEXD_DOCUMENT_CARRIER_H_
 
 #include <cstddef>
+#include <functional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -27,8 +28,10 @@ class DocumentCarrier {
 
   // Replaces the documents of these places in the index `id`. Returns for each whether that is
   // done. Nothing is tried again: whatever is in the way, the caller asks for the document by
-  // itself. Throws nothing but std::bad_alloc.
-  std::vector<bool> Carry(const std::string& id, const std::vector<Wish>& wishes);
+  // itself. Asks `go_on`, which throws nothing, before each exchange, and leaves the rest undone
+  // when that says no. Throws nothing.
+  std::vector<bool> Carry(const std::string& id, const std::vector<Wish>& wishes,
+                          const std::function<bool()>& go_on);
 
  private:
   void CarrySome(const std::string& id, const std::vector<Wish>& wishes, std::vector<bool>* done,

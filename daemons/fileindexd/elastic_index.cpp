@@ -69,7 +69,10 @@ const std::string& ExtractorSocketPath() {
 }
 
 ElasticIndex::ElasticIndex(const std::string& share, Gate& gate)
-    : share_(share), id_(elastic::GetFileIndexID(share)), rest_([&gate](unsigned int attempt) {
+    : share_(share),
+      id_(elastic::GetFileIndexID(share)),
+      gate_(gate),
+      rest_([&gate](unsigned int attempt) {
         gate.Rest(std::min(kFirstRest * (1 << std::min(attempt, kMostDoublings)), kLongestRest));
       }) {}
 
@@ -123,7 +126,8 @@ void ElasticIndex::Upsert(const std::string& path, bool need_meta) {
 std::vector<bool> ElasticIndex::UpsertMany(const std::vector<Wish>& wishes) {
   static const DocumentCarrier::Sockets sockets{ExtractorSocketPath(), EngineSocketPath()};
   thread_local DocumentCarrier carrier(sockets);
-  return carrier.Carry(id_, wishes);
+  // Slow files one after the other are not to hold up a stop or a pause.
+  return carrier.Carry(id_, wishes, [this] { return !gate_.Stopping() && !gate_.Paused(); });
 }
 
 void ElasticIndex::SetAttributes(const std::string& path) {

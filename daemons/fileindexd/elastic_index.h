@@ -50,6 +50,7 @@ class ElasticIndex : public Index {
 
   const std::string share_;
   const std::string id_;
+  const Gate& gate_;
   const fileindex::elastic::BusyWait::Function rest_;
   std::mutex mutex_;
   std::optional<daemon::Client> engine_;  // for questions, one at a time

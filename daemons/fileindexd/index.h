@@ -44,7 +44,8 @@ class Index {
   // Reads the place and replaces its whole document. Throws Error 914 when it cannot be read.
   virtual void Upsert(const std::string& path, bool need_meta) = 0;
   // The same for many at once, as one piece of work. Returns for each whether it is done: where
-  // anything at all is in the way it is not, and Upsert() will tell what. Throws nothing.
+  // anything at all is in the way, a stop or a pause of the worker included, it is not, and
+  // Upsert() will tell what. Throws nothing.
   virtual std::vector<bool> UpsertMany(const std::vector<Wish>& wishes) = 0;
   // Reads the place's attributes and merges them into its document.
   virtual void SetAttributes(const std::string& path) = 0;

@@ -3,7 +3,9 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <iterator>
 #include <mutex>
+#include <random>
 #include <utility>
 
 #include "common/json.h"
@@ -82,6 +84,10 @@ std::string Store(const std::string& request) {
   return toString(answer);
 }
 
+bool Always() {
+  return true;
+}
+
 class DocumentCarrierTest : public ::testing::Test {
  protected:
   void SetUp() override {
@@ -91,13 +97,14 @@ class DocumentCarrierTest : public ::testing::Test {
   std::vector<bool> Carry(const std::vector<std::string>& paths) {
     std::vector<Wish> wishes;
     for (const std::string& path : paths) wishes.push_back({path, true});
-    return carrier_.Carry("fileindex_photo", wishes);
+    return carrier_.Carry("fileindex_photo", wishes, [this] { return exchanges_-- > 0; });
   }
 
   test::TempDir dir_;
   Peer extractor_{dir_ / "x"};
   Peer engine_{dir_ / "e"};
   DocumentCarrier carrier_{{dir_ / "x", dir_ / "e"}};
+  int exchanges_ = 1'000'000;  // until it is not to go on
 };
 
 TEST_F(DocumentCarrierTest, HandsDocumentsOnAsTheyAre) {
@@ -109,16 +116,17 @@ TEST_F(DocumentCarrierTest, HandsDocumentsOnAsTheyAre) {
   EXPECT_THAT(
       engine_.Asked(),
       ElementsAre("{\"compound\":[{\"command\":\"document_upsert_by_id\",\"data\":{\"id\":"
-                  "\"fileindex_photo\",\"doc_id\":\"/v/a\",\"data\":{\"TARNMDSearchFileName\":"
-                  "\"a\",\"TARNMDPath\":\"/v/a\", \"n\":1.50,\"t\":\"\\u0041\\/\"}}},"
+                  "\"fileindex_photo\",\"doc_id\":\"/v/a\",\"data\":{\"TARNMDPath\":"
+                  "\"/v/a\", \"n\":1.50,\"t\":\"\\u0041\\/\",\"TARNMDSearchFileName\":\"a\"}}},"
                   "{\"command\":\"document_upsert_by_id\",\"data\":{\"id\":\"fileindex_photo\","
-                  "\"doc_id\":\"/v/\\\"b\\\".\xFF\",\"data\":{\"TARNMDSearchFileName\":"
-                  "\"\\\"b\\\".\xFF\",\"TARNMDPath\":\"/v/\\\"b\\\".\xFF\", \"n\":1.50,"
-                  "\"t\":\"\\u0041\\/\"}}}]}"));
+                  "\"doc_id\":\"/v/\\\"b\\\".\xFF\",\"data\":{\"TARNMDPath\":"
+                  "\"/v/\\\"b\\\".\xFF\", \"n\":1.50,\"t\":\"\\u0041\\/\","
+                  "\"TARNMDSearchFileName\":\"\\\"b\\\".\xFF\"}}}]}"));
 }
 
 TEST_F(DocumentCarrierTest, ContentIsOptional) {
-  EXPECT_THAT(carrier_.Carry("i", {{"/v/a", false}, {"/v/b", true}}), ElementsAre(true, true));
+  EXPECT_THAT(carrier_.Carry("i", {{"/v/a", false}, {"/v/b", true}}, Always),
+              ElementsAre(true, true));
   const Json::Value asked = Parsed(extractor_.Asked().at(0));
   EXPECT_FALSE(asked["data"]["files"][0]["options"]["need_meta"].asBool());
   EXPECT_TRUE(asked["data"]["files"][1]["options"]["need_meta"].asBool());
@@ -181,6 +189,92 @@ TEST_F(DocumentCarrierTest, WhatWasTakenBeforeABreakStaysDone) {
   EXPECT_THAT(Carry({"/v/a", "/v/b", "/v/c"}), ElementsAre(true, false, false));
 }
 
+TEST_F(DocumentCarrierTest, LeavesTheRestWhenItIsNotToGoOn) {
+  extractor_.Set([](const std::string& request) { return Read(request, 1); });
+  exchanges_ = 2;
+  EXPECT_THAT(Carry({"/v/a", "/v/b", "/v/c", "/v/d"}), ElementsAre(true, true, false, false));
+  EXPECT_THAT(extractor_.Asked(), SizeIs(2));
+  EXPECT_THAT(Carry({"/v/a"}), ElementsAre(false));
+  EXPECT_THAT(extractor_.Asked(), IsEmpty());
+}
+
+TEST_F(DocumentCarrierTest, StoresNoDocumentInThePlaceOfAnother) {
+  extractor_.Set([](const std::string&) {
+    return std::string(R"({"data":[{"TARNMDPath":"/v/b"},{"TARNMDPath":"/v/a"},{"t":1},{},)"
+                       R"({"t":{"TARNMDPath":"/v/e"}},{"TARNMDPath":"/v/f"}],"success":true})");
+  });
+  EXPECT_THAT(Carry({"/v/a", "/v/b", "/v/c", "/v/d", "/v/e", "/v/f"}),
+              ElementsAre(false, false, false, false, false, true));
+  EXPECT_THAT(Parsed(engine_.Asked().at(0))["compound"], SizeIs(1));
+}
+
+TEST_F(DocumentCarrierTest, TheReaderDoesNotSayByWhatNameAPlaceIsFound) {
+  extractor_.Set([](const std::string&) {
+    return std::string(R"({"data":[{"TARNMDPath":"/v/a","TARNMDSearchFileName":"b"}]})");
+  });
+  EXPECT_THAT(Carry({"/v/a"}), ElementsAre(true));
+  EXPECT_EQ(Parsed(engine_.Asked().at(0))["compound"][0]["data"]["data"]["TARNMDSearchFileName"],
+            "a");
+}
+
+// Whatever the reader answers, the engine is asked for nothing but to store documents of these
+// places in this index, or refuses the whole.
+TEST_F(DocumentCarrierTest, NoAnswerCanMakeOtherCommands) {
+  std::mt19937 random(3);
+  const char* const pieces[] = {"{",
+                                "}",
+                                "[",
+                                "]",
+                                "\"",
+                                "\\",
+                                ",",
+                                ":",
+                                "}}}",
+                                "]}",
+                                "\\\"",
+                                "/*x",
+                                "*/",
+                                "//\n",
+                                "\n",
+                                "'",
+                                R"("}},{"command":"commit","data":{"id":")",
+                                R"(}},{"command":"commit","data":{"id":"i"}},{"a":{)",
+                                R"(,"doc_id":"/v/x")",
+                                R"("TARNMDPath":"/v/a",)",
+                                "\xEF\xBB\xBF",
+                                "null"};
+  const std::string nul(1, '\0');
+  extractor_.Set([&](const std::string& request) {
+    std::string reply = Read(request);
+    for (auto i = random() % 4; i > 0; --i) {
+      const std::string piece = random() % 30 == 0 ? nul : pieces[random() % std::size(pieces)];
+      reply.replace(random() % reply.size(), random() % 2 * piece.size(), piece);
+    }
+    return reply;
+  });
+  engine_.Set([](const std::string&) { return std::string("{}"); });
+  int stored = 0;
+  for (int round = 0; round < 5000; ++round) {
+    Carry({"/v/a", "/v/b\"c", "/v/d"});
+    for (const std::string& text : engine_.Asked()) {
+      Json::Value request;
+      if (!fromString(request, text)) continue;
+      ASSERT_THAT(request.getMemberNames(), ElementsAre("compound")) << text;
+      for (const Json::Value& element : request["compound"]) {
+        ASSERT_THAT(element.getMemberNames(), ElementsAre("command", "data")) << text;
+        ASSERT_EQ(element["command"], "document_upsert_by_id") << text;
+        ASSERT_THAT(element["data"].getMemberNames(), ElementsAre("data", "doc_id", "id")) << text;
+        ASSERT_EQ(element["data"]["id"], "fileindex_photo") << text;
+        ASSERT_EQ(element["data"]["doc_id"].asString().substr(0, 3), "/v/") << text;
+        ASSERT_NE(element["data"]["doc_id"], "/v/x") << text;
+        ASSERT_TRUE(element["data"]["data"].isObject()) << text;
+        ++stored;
+      }
+    }
+  }
+  EXPECT_GT(stored, 1000);
+}
+
 TEST_F(DocumentCarrierTest, KeepsItsConnections) {
   for (int i = 0; i < 5; ++i) EXPECT_THAT(Carry({"/v/a"}), ElementsAre(true));
   EXPECT_EQ(extractor_.ConnectionCount(), 1U);
@@ -190,9 +284,9 @@ TEST_F(DocumentCarrierTest, KeepsItsConnections) {
 TEST(DocumentCarrierAloneTest, NothingIsDoneWhereNobodyListens) {
   const test::TempDir dir;
   DocumentCarrier carrier({dir / "x", dir / "e"});
-  EXPECT_THAT(carrier.Carry("i", {{"/v/a", true}}), ElementsAre(false));
+  EXPECT_THAT(carrier.Carry("i", {{"/v/a", true}}, Always), ElementsAre(false));
   const Peer extractor(dir / "x");
-  EXPECT_THAT(carrier.Carry("i", {{"/v/a", true}}), ElementsAre(false));
+  EXPECT_THAT(carrier.Carry("i", {{"/v/a", true}}, Always), ElementsAre(false));
 }
 
 }  // namespace

@@ -3,6 +3,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <atomic>
 #include <deque>
 #include <memory>
 #include <mutex>
@@ -241,6 +242,26 @@ TEST_F(ElasticIndexTest, ABusyEngineIsAskedUntilTheWorkerStops) {
   });
   EXPECT_THROW(index_.Delete("/v/a"), Interrupted);
   stopper.join();
+}
+
+TEST_F(ElasticIndexTest, CarriesNothingWhileItIsHeldUp) {
+  std::atomic<int> asked{0};
+  const test::ServerThread reader(ExtractorSocketPath(),
+                                  [&](const std::string&, const daemon::Peer&) {
+                                    // What comes behind this answer is left.
+                                    if (++asked == 1) gate_.SetPaused(true);
+                                    return R"({"data":[{"TARNMDPath":"/v/a"}]})";
+                                  });
+  engine_->Answer(R"({"success":true,"data":[{"success":true}]})");
+  // A thread keeps its connections.
+  std::thread([&] {
+    EXPECT_THAT(index_.UpsertMany({{"/v/a"}, {"/v/b"}, {"/v/c"}}), ElementsAre(true, false, false));
+    EXPECT_EQ(asked, 1);
+    gate_.SetPaused(false);
+    gate_.Stop();
+    EXPECT_THAT(index_.UpsertMany({{"/v/a"}}), ElementsAre(false));
+    EXPECT_EQ(asked, 1);
+  }).join();
 }
 
 TEST_F(ElasticIndexTest, CannotReadWithoutTheReader) {

@@ -135,12 +135,24 @@ void FakeIndex::Upsert(const std::string& path, bool need_meta) {
   documents_[path] = {path, is_dir, place.attribute_stamp, need_meta ? place.content_stamp : ""};
 }
 
+void FakeIndex::MakeDoubtful(unsigned seed) {
+  const std::lock_guard<std::mutex> lock(mutex_);
+  doubt_.emplace(seed);
+}
+
+// 0 to 7; 7 where nothing is in doubt.
+unsigned FakeIndex::Doubt() {
+  const std::lock_guard<std::mutex> lock(mutex_);
+  return doubt_ ? static_cast<unsigned>((*doubt_)() % 8) : 7;
+}
+
 std::vector<bool> FakeIndex::UpsertMany(const std::vector<Wish>& wishes) {
   std::vector<bool> done;
   for (const auto& [path, need_meta] : wishes) {
+    const unsigned doubt = Doubt();
     try {
-      Upsert(path, need_meta);
-      done.push_back(true);
+      if (doubt > 0) Upsert(path, need_meta);
+      done.push_back(doubt > 1);
     } catch (const std::exception&) {
       Unrecord("upsert " + path + (need_meta ? " content" : ""));
       done.push_back(false);

@@ -7,6 +7,7 @@
 #include <map>
 #include <mutex>
 #include <optional>
+#include <random>
 #include <string>
 #include <vector>
 
@@ -38,6 +39,7 @@ class FakeIndex : public Index {
   void Restart();
   void DeleteIndex();
   void SetReaderRunning(bool runs);
+  void MakeDoubtful(unsigned seed);
   // Files of this path cannot be read, their attributes either.
   void MakeUnparsable(const std::string& path);
   // Only their content cannot.
@@ -49,6 +51,7 @@ class FakeIndex : public Index {
   std::uint64_t Count() override;
   void Upsert(const std::string& path, bool need_meta) override;
   // One after the other, each recorded as an Upsert() is if it succeeds.
+  // With MakeDoubtful() some are left out, and others done without a word of it.
   std::vector<bool> UpsertMany(const std::vector<Wish>& wishes) override;
   void SetAttributes(const std::string& path) override;
   void Delete(const std::string& path) override;
@@ -64,6 +67,7 @@ class FakeIndex : public Index {
  private:
   void Enter(const std::string& command, bool changes);
   void Unrecord(const std::string& command);
+  unsigned Doubt();
   Place Parse(const std::string& path, bool need_meta);
 
   FakeDisk& disk_;
@@ -76,6 +80,7 @@ class FakeIndex : public Index {
   int epoch_ = 1;
   bool exists_ = true;
   bool reader_runs_ = true;
+  std::optional<std::mt19937> doubt_;
   std::map<std::string, bool> unparsable_;  // whether attributes can be had
 };
 

@@ -360,6 +360,7 @@ class RandomShare : public PassTest, public ::testing::WithParamInterface<unsign
 // line about the entry.
 TEST_P(RandomShare, IsInLineAfterEachFullPass) {
   threads_ = 4;
+  if (GetParam() % 2 == 0) index_.MakeDoubtful(GetParam());
   for (int round = 0; round < 30; ++round) {
     if (round % 5 == 0) RandomFolders();
     for (std::size_t i = random_() % 40; i > 0; --i) Change();
@@ -375,6 +376,7 @@ TEST_P(RandomShare, IsInLineAfterEachFullPass) {
 
 TEST_P(RandomShare, HoldsTheRightPlacesAfterPassesOverTheQueue) {
   threads_ = 4;
+  if (GetParam() % 2 == 0) index_.MakeDoubtful(GetParam());
   RandomFolders();
   Queue(EVENT_REINDEX, kRoot);
   for (int round = 0; round < 30; ++round) {
