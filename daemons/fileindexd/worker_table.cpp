@@ -7,6 +7,8 @@
 #include <cerrno>
 #include <utility>
 
+#include "daemons/common/system_error.h"
+
 namespace quarry::fileindexd {
 namespace {
 
@@ -28,6 +30,10 @@ Json::Value WithoutWorker(const std::string& share, const char* state) {
 // A descriptor that becomes readable at the process's end; invalid where the kernel has none.
 UniqueFd Watch(pid_t process) {
   return UniqueFd(static_cast<int>(syscall(SYS_pidfd_open, process, 0)));
+}
+
+bool IsShortage(int error) {
+  return error == EMFILE || error == ENFILE || error == ENOMEM;
 }
 
 bool HasEnded(const UniqueFd& process) {
@@ -61,6 +67,9 @@ void WorkerTable::Delete(const std::string& share, pid_t while_running) {
   if (while_running > 0) {
     process = Watch(while_running);
     if (!process.valid() && errno == ESRCH) return;
+    if (!process.valid() && IsShortage(errno)) {
+      daemon::ThrowSystemError("A process cannot be watched");
+    }
   }
   deleted_[share] = std::move(process);
   Retire(share);

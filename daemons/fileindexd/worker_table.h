@@ -38,7 +38,8 @@ class WorkerTable {
 
   // The worker of a share with indexed folders stops, and none is started until the share is
   // allowed one again, or has had no indexed folder in between. With a process given it is allowed
-  // one, too, as soon as that process has ended; 0 is none.
+  // one, too, as soon as that process has ended; 0 is none. Throws Error 502, and leaves the
+  // worker, when the process cannot be watched for a shortage that may pass.
   void Delete(const std::string& share, pid_t while_running = 0);
   void Allow(const std::string& share);
 

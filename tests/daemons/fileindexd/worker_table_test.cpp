@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 #include <sys/prctl.h>
+#include <sys/resource.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -10,6 +11,7 @@
 #include <future>
 #include <map>
 
+#include "common/error.h"
 #include "tests/daemons/fileindexd/share_fixture.h"
 #include "tests/daemons/fileindexd/shared_parts.h"
 #include "tests/support/files.h"
@@ -102,6 +104,19 @@ TEST_F(WorkerTableTest, ADeletedWorkerComesBackAfterTheProcessThatWantedItAway) 
   table_.Delete("s", process);
   EXPECT_EQ("idle", State("s"));
   EXPECT_EQ(2, made_["s"]);
+}
+
+TEST_F(WorkerTableTest, AWorkerStaysWhereItsReturnCannotBeSeenTo) {
+  table_.SetShares({"s"});
+  ASSERT_TRUE(Becomes("s", "idle"));
+  rlimit usual{};
+  ASSERT_EQ(getrlimit(RLIMIT_NOFILE, &usual), 0);
+  const rlimit none{0, usual.rlim_max};
+  ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &none), 0);
+  EXPECT_THROW(table_.Delete("s", getpid()), Error);
+  ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &usual), 0);
+  EXPECT_EQ("idle", State("s"));
+  EXPECT_EQ(1, made_["s"]);
 }
 
 TEST_F(WorkerTableTest, TheLastWhoDeletesAWorkerSaysForHowLong) {
