@@ -13,6 +13,7 @@ constexpr std::size_t kSlabBytes = std::size_t{256} << 10;
 constexpr std::uint32_t kFirstBlock = 12;
 constexpr std::uint32_t kLargestBlock = 1536;
 constexpr std::size_t kFirstSlots = 4096;
+constexpr std::size_t kManyWords = std::size_t{64} << 10;  // of one text
 
 // Whoever knows the seed could write texts whose words all meet in one place of the table.
 std::uint64_t RandomSeed() {
@@ -133,8 +134,10 @@ void WordLists::GrowLocal() {
 
 // One large text must not cost every small one behind it, in time or in memory.
 void WordLists::ClearLocal() {
-  if (local_slots_.size() > kFirstSlots) {
+  if (local_slots_.size() > kFirstSlots || stream_.size() > kManyWords) {
     std::vector<std::uint32_t>(kFirstSlots).swap(local_slots_);
+    std::vector<std::uint32_t>().swap(place_ends_);
+    std::string().swap(encoded_);
     std::vector<std::uint32_t>().swap(stream_);
     std::vector<std::uint32_t>().swap(places_);
     std::vector<Local>().swap(locals_);
