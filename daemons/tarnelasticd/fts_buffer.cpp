@@ -21,17 +21,6 @@ constexpr std::size_t kManySegments = 8;
 // Leaves that are merged at least, so that small segments do not come to be many.
 constexpr std::int64_t kLeastMerge = 16;
 
-// Has FTS5 write out what it has in memory, as its own bookkeeping is about to be changed. Asked
-// for nothing, it takes part in the transaction from now on, and so is told of savepoints.
-void WriteOutFts(Database* db) {
-  db->Execute("INSERT INTO body(body,rank) VALUES('merge',0);SAVEPOINT own;RELEASE own");
-}
-
-// Has FTS5 read its bookkeeping anew.
-void ForgetFts(Database* db) {
-  db->Execute("SAVEPOINT own;ROLLBACK TO own;RELEASE own");
-}
-
 std::size_t SizeOf(const std::string& text) {
   return text.size();
 }
@@ -126,7 +115,7 @@ bool FtsBuffer::AddToLists(std::int64_t id, std::string_view body) {
 // Before anything else is done to these rows: a segment holds against those written before.
 void FtsBuffer::FlushLists() {
   if (listed_ == 0) return;
-  WriteOutFts(db_);
+  WriteOutFts(db_, kBody);
   AddToTotals(db_, kBody, listed_, listed_words_);
   std::optional<FtsStructure> structure = ReadStructure(db_, kBody);
   if (!structure) throw Error(kDamagedIndex, "The full text is not as it should be");

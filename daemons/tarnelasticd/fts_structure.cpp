@@ -1,5 +1,6 @@
 #include "daemons/tarnelasticd/fts_structure.h"
 
+#include <algorithm>
 #include <set>
 #include <string_view>
 
@@ -17,6 +18,8 @@ constexpr std::int64_t kMaxSegmentId = (std::int64_t{1} << 16) - 1;
 constexpr std::int64_t kMaxLeaf = (std::int64_t{1} << 31) - 1;
 // FTS5 takes no more.
 constexpr std::int64_t kMostSegments = 2000;
+// More than a table of any size comes to by itself.
+constexpr std::size_t kManyLevels = 8;
 
 bool IsWithin(std::int64_t value, std::int64_t most) {
   return value >= 0 && value <= most;
@@ -41,6 +44,17 @@ void WriteRecord(Database* db, const std::string& table, std::int64_t id,
       .Bind(1, id)
       .BindBlob(2, record)
       .Run();
+}
+
+void DropEmptyLevels(FtsStructure* structure) {
+  std::vector<FtsStructure::Level>& levels = structure->levels;
+  while (levels.size() > kManyLevels) {
+    const auto empty =
+        std::find_if(levels.begin(), levels.end(),
+                     [](const FtsStructure::Level& level) { return level.segments.empty(); });
+    if (empty == levels.end()) return;
+    levels.erase(empty);
+  }
 }
 
 }  // namespace
@@ -87,6 +101,16 @@ std::optional<FtsStructure> ReadStructure(Database* db, const std::string& table
   return structure;
 }
 
+// Asked for no work, FTS5 takes part in the transaction from now on, and so is told of savepoints.
+void WriteOutFts(Database* db, const std::string& table) {
+  db->Execute("INSERT INTO " + table + "(" + table +
+              ",rank) VALUES('merge',0);SAVEPOINT own;RELEASE own");
+}
+
+void ForgetFts(Database* db) {
+  db->Execute("SAVEPOINT own;ROLLBACK TO own;RELEASE own");
+}
+
 void WriteStructure(Database* db, const std::string& table, const FtsStructure& structure) {
   std::size_t segments = 0;
   for (const FtsStructure::Level& level : structure.levels) segments += level.segments.size();
@@ -119,6 +143,18 @@ void AddToTotals(Database* db, const std::string& table, std::uint64_t rows,
   AppendVarint(&record, take() + rows);
   for (const std::uint64_t count : words) AppendVarint(&record, take() + count);
   WriteRecord(db, table, kTotalsRow, record);
+}
+
+// FTS5 puts the one segment on a new level each time and never gives one up. The more there are the
+// more it merges with each write, and with 2000 it takes the table for damaged.
+void MergeAllSegments(Database* db, const std::string& table) {
+  db->Execute("INSERT INTO " + table + "(" + table + ") VALUES('optimize')");
+  WriteOutFts(db, table);
+  std::optional<FtsStructure> structure = ReadStructure(db, table);
+  if (!structure || structure->levels.size() <= kManyLevels) return;
+  DropEmptyLevels(&*structure);
+  WriteStructure(db, table, *structure);
+  ForgetFts(db);
 }
 
 }  // namespace quarry::engine

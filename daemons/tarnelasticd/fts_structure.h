@@ -31,13 +31,23 @@ struct FtsStructure {
 // may be. Throws Error as Database does, kDamagedIndex for what cannot be.
 std::optional<FtsStructure> ReadStructure(Database* db, const std::string& table);
 
-// Within the transaction that is open. FTS5 must not know the structure meanwhile.
+// Has FTS5 write out what it has of the table in memory, as its own bookkeeping is about to be
+// changed. Within the transaction that is open, like all below.
+void WriteOutFts(Database* db, const std::string& table);
+
+// Has FTS5 read its bookkeeping anew.
+void ForgetFts(Database* db);
+
+// To be called between WriteOutFts() and ForgetFts().
 void WriteStructure(Database* db, const std::string& table, const FtsStructure& structure);
 
 // Adds rows, with so many words in each column, to what FTS5 knows of the table. Like
 // WriteStructure().
 void AddToTotals(Database* db, const std::string& table, std::uint64_t rows,
                  const std::vector<std::uint64_t>& words);
+
+// Has FTS5 make one segment of all, which writes the whole table anew.
+void MergeAllSegments(Database* db, const std::string& table);
 
 }  // namespace quarry::engine
 

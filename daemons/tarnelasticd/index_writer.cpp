@@ -136,7 +136,7 @@ void IndexWriter::CommitNow() {
   buffer_.Flush();
   texts_.Flush();
   attributes_.Flush();
-  if (terms_requested_) CollectTerms(&db_);
+  if (terms_requested_) transaction_bytes_ += CollectTerms(&db_);
   db_.Prepare("INSERT OR REPLACE INTO meta(key,value) VALUES('documents',?1)")
       .Bind(1, documents_.load())
       .Run();

@@ -4,6 +4,7 @@
 #include <cstring>
 #include <iterator>
 #include <memory>
+#include <numeric>
 #include <optional>
 #include <utility>
 
@@ -62,6 +63,10 @@ double WeighOneByOne(std::string_view positions, const std::vector<double>& weig
     }
   }
   return sum;
+}
+
+std::int64_t AddLeaves(std::int64_t sum, const Segment& segment) {
+  return sum + segment.last_leaf - segment.first_leaf + 1;
 }
 
 }  // namespace
@@ -137,16 +142,16 @@ PostingLists::PostingLists(Database* db, std::string table, std::int64_t last_id
   }
 }
 
+std::int64_t PostingLists::leaves() const {
+  return std::accumulate(segments_.begin(), segments_.end(), std::int64_t{0}, AddLeaves);
+}
+
 // A large one would be written anew for minutes, and is merged step by step as it grows anyway.
 bool PostingLists::IsWorthMerging() const {
   constexpr std::int64_t kMaxLeaves = 20000;
-  std::int64_t all = 0;
   std::int64_t largest = 0;
-  for (const Segment& segment : segments_) {
-    const std::int64_t leaves = segment.last_leaf - segment.first_leaf + 1;
-    all += leaves;
-    largest = std::max(largest, leaves);
-  }
+  for (const Segment& segment : segments_) largest = std::max(largest, AddLeaves(0, segment));
+  const std::int64_t all = leaves();
   return all <= kMaxLeaves && (all - largest) * 8 > all;
 }
 

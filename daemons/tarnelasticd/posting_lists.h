@@ -38,6 +38,8 @@ class PostingLists {
   // Whether the table is small, and so much of it lies outside of its largest segment that making
   // one of all saves noticeable room.
   bool IsWorthMerging() const;
+  // How many leaves the segments have.
+  std::int64_t leaves() const;
 
   // Calls `visit` with the documents that have `word`, or a word that begins with it; no document
   // twice with one word, in no certain order. `word` is one that the table's tokenizer makes.

@@ -6,7 +6,9 @@
 #include "daemons/tarnelasticd/compression.h"
 #include "daemons/tarnelasticd/edit_distance.h"
 #include "daemons/tarnelasticd/engine_error.h"
+#include "daemons/tarnelasticd/fts_structure.h"
 #include "daemons/tarnelasticd/posting_lists.h"
+#include "daemons/tarnelasticd/segment_writer.h"
 #include "daemons/tarnelasticd/text_sharing.h"
 #include "daemons/tarnelasticd/text_tokenizer.h"
 #include "daemons/tarnelasticd/varint.h"
@@ -16,6 +18,9 @@ namespace {
 
 // Larger ones compress better, but looking one word up reads a whole one.
 constexpr std::size_t kBlockBytes = std::size_t{32} << 10;
+
+// So many rows of an index are made anew in the time that it takes to merge a leaf of full text.
+constexpr std::int64_t kDocumentsPerLeaf = 32;
 
 [[noreturn]] void FailDamaged() {
   throw Error(kDamagedIndex, "The words to suggest are damaged");
@@ -205,9 +210,15 @@ class TermMerger {
 
 // What is in several pieces repeats their words, and is searched several times. Indexes into which
 // came what is in no order have half-filled pages.
-void PutTogether(Database* db) {
-  if (!PostingLists(db, "body", LastId(db), {}, [] {}).IsWorthMerging()) return;
-  db->Execute("INSERT INTO body(body) VALUES('optimize');REINDEX docs;REINDEX text_hashes");
+std::size_t PutTogether(Database* db) {
+  const PostingLists lists(db, "body", LastId(db), {}, [] {});
+  if (!lists.IsWorthMerging()) return 0;
+  MergeAllSegments(db, "body");
+  // Not for the few texts of a million documents, each time that there is one more of them.
+  if (LastId(db) <= lists.leaves() * kDocumentsPerLeaf) {
+    db->Execute("REINDEX docs;REINDEX text_hashes");
+  }
+  return static_cast<std::size_t>(lists.leaves()) * SegmentWriter::kLeafBytes;
 }
 
 }  // namespace
@@ -219,11 +230,11 @@ std::string CreateTermTables() {
          "CREATE VIRTUAL TABLE label_terms USING fts5vocab('labels','row');";
 }
 
-void CollectTerms(Database* db) {
+std::size_t CollectTerms(Database* db) {
   db->Execute("DELETE FROM terms");
   // Makes FTS5 write out what it holds back.
   db->Prepare("SELECT 1 FROM body_terms LIMIT 1").Step();
-  PutTogether(db);
+  const std::size_t merged = PutTogether(db);
   TermMerger terms(db);
   PostingLists lists(db, "body", LastId(db), {}, [] {});
   if (lists.IsReadable()) {
@@ -237,6 +248,7 @@ void CollectTerms(Database* db) {
     while (words.Step()) terms.AddOfTexts(words.Text(0), words.Int(1));
   }
   terms.Finish();
+  return merged;
 }
 
 bool HasTerms(Database* db) {

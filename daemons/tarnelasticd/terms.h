@@ -32,9 +32,9 @@ constexpr std::int64_t kMaxTermLetters = 40;
 std::string CreateTermTables();
 
 // Collects the words of all documents anew, inside the transaction that is open. Where the full
-// text of a small index has come in many pieces it is put together first. Throws Error as Database
-// does, as all below do.
-void CollectTerms(Database* db);
+// text of a small index has come in many pieces it is put together first. Returns how many bytes of
+// it were, roughly. Throws Error as Database does, as all below do.
+std::size_t CollectTerms(Database* db);
 
 // Whether words have been collected, and there were any.
 bool HasTerms(Database* db);

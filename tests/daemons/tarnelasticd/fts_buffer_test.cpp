@@ -271,6 +271,41 @@ TEST_F(FtsBufferTest, KeepsSegmentsFew) {
   ExpectSame();
 }
 
+// FTS5 would add a level each time, and fail with the two thousandth.
+TEST_F(FtsBufferTest, KeepsLevelsFewWhereAllIsMerged) {
+  for (int id = 1; id <= 60; ++id) {
+    Begin();
+    Insert(id, {Text(20, 1000), "", ""});
+    if (id % 5 == 0) Remove(id - 3);
+    Commit();
+    Begin();
+    MergeAllSegments(db_.get(), "body");
+    Commit();
+    EXPECT_EQ(Segments(), 1);
+    const std::optional<FtsStructure> structure = ReadStructure(db_.get(), "body");
+    ASSERT_TRUE(structure);
+    EXPECT_LE(structure->levels.size(), 8U);
+  }
+  ExpectSame();
+}
+
+// A library to come may say more of its levels than is understood here.
+TEST_F(FtsBufferTest, MergesWhatIsNotUnderstood) {
+  Begin();
+  Insert(1, {"one", "", ""});
+  Commit();
+  Begin();
+  Insert(2, {"two", "", ""});
+  Commit();
+  db_->Execute("UPDATE body_config SET v=5 WHERE k='version'");
+  Begin();
+  MergeAllSegments(db_.get(), "body");
+  db_->Execute("UPDATE body_config SET v=4 WHERE k='version'");
+  Commit();
+  EXPECT_EQ(Segments(), 1);
+  ExpectSame();
+}
+
 TEST_F(FtsBufferTest, TellsMemory) {
   Begin();
   EXPECT_EQ(buffer_->list_bytes(), 0U);

@@ -3,6 +3,7 @@
 #include "daemons/tarnelasticd/terms.h"
 
 #include <algorithm>
+#include <filesystem>
 #include <map>
 #include <random>
 #include <set>
@@ -95,6 +96,22 @@ TEST_F(TermsTest, AreThoseOfTheLastCollection) {
   EXPECT_THAT(Near("lighthuose"), ElementsAre("lighthouse"));
   EXPECT_EQ(DocumentsWith(db_.get(), "lighthouse"), 1);
   EXPECT_EQ(DocumentsWith(db_.get(), "harbour"), 0);
+}
+
+// What has been written anew must not stay in the log as long as nobody writes.
+TEST_F(TermsTest, LeaveNoLogOfMergedTexts) {
+  for (const std::uint64_t first : {1000000U, 2000000U}) {
+    std::string text;
+    for (std::uint64_t i = 0; i < 180000; ++i) {
+      text += std::to_string((first + i) * 0x9e3779b97f4a7c15U) + ' ';
+    }
+    Add("/s/" + std::to_string(first), text);
+  }
+  const std::string log = DatabasePath(DirectoryOf("a")) + "-wal";
+  EXPECT_GT(std::filesystem::file_size(log), 0U);
+  Collect();
+  EXPECT_EQ(std::filesystem::file_size(log), 0U);
+  EXPECT_EQ(Paths(std::to_string(1000007 * 0x9e3779b97f4a7c15U)).size(), 1U);
 }
 
 TEST_F(TermsTest, SurviveOtherMappings) {
