@@ -35,6 +35,8 @@ int CodeOf(sqlite3* db, int result) {
       return kErrorEngineBusyMemory;
     case SQLITE_CORRUPT:
     case SQLITE_NOTADB:
+    // Rows that are there twice, or are not as they must be: in a sound database nobody makes such.
+    case SQLITE_CONSTRAINT:
       return kDamagedIndex;
     case SQLITE_INTERRUPT:
       return kSearchTooLong;
