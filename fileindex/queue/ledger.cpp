@@ -126,6 +126,21 @@ std::uint32_t Ledger::Find(const OPNode& node, std::string_view name, std::uint3
   return OPNode::kNone;
 }
 
+// Whether looking the name up would find it at that place. The hash has led there, so of several
+// children of that name it is the one that is entered.
+bool Ledger::IsAt(const OPNode& node, std::string_view name, std::uint32_t place) {
+  const auto& children = node.children;
+  return node.books_ && node.books_->adopted == children.size() && place < children.size() &&
+         children[place]->name == name;
+}
+
+const std::shared_ptr<OPNode>& Ledger::Child(OPNode& node, std::string_view name,
+                                             std::uint32_t hash, std::uint32_t place, Pool* pool) {
+  if (!IsAt(node, name, place)) return Child(node, name, hash, pool);
+  Touch(*node.children[place]);
+  return node.children[place];
+}
+
 const std::shared_ptr<OPNode>& Ledger::Child(OPNode& node, std::string_view name,
                                              std::uint32_t hash, Pool* pool) {
   Adopt(node);

@@ -76,6 +76,9 @@ class Ledger {
   }
   static const std::shared_ptr<OPNode>& Child(OPNode& node, std::string_view name,
                                               std::uint32_t hash, Pool* pool);
+  // The same where PrefetchPlace has said at what place the child is expected.
+  static const std::shared_ptr<OPNode>& Child(OPNode& node, std::string_view name,
+                                              std::uint32_t hash, std::uint32_t place, Pool* pool);
 
   // Ask for the memory that Child and ForEachOwn will look at, each for what the one before has
   // asked for. What is expected as a child may be null, or another.
@@ -162,6 +165,7 @@ class Ledger {
   static void AdoptNext(OPNode& node, OPNode::Books& books);
   static void Place(OPNode& node, OPNode::Books& books);
   static void EnterName(OPNode& node, OPNode::Books& books, std::uint32_t place);
+  static bool IsAt(const OPNode& node, std::string_view name, std::uint32_t place);
   static bool IsInPlace(const OPNode& node);
   // Places among the node's children.
   static std::uint32_t Find(const OPNode& node, std::string_view name, std::uint32_t hash);

@@ -185,7 +185,7 @@ void OPTree::InsertLine(const QueueLine& line, LookAhead& ahead, std::shared_ptr
     if (line.is_repeated && last) {
       Ledger::Touch(*last);
     } else if (line.directory != nullptr) {
-      last = Ledger::Child(*line.directory, line.path.name, line.hash, pool_.get());
+      last = Ledger::Child(*line.directory, line.path.name, line.hash, line.place, pool_.get());
     } else {
       last = NodeAt(line.event.path);
       ahead.Learn(line, *last);

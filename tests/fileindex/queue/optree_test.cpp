@@ -268,6 +268,40 @@ TEST_F(OPTreeTest, PathsAreTakenApartAtSlashes) {
   EXPECT_EQ(tree.root->children.size(), 1u);
 }
 
+// New names and known ones in turn, so that what is expected at a place is often another.
+TEST_F(OPTreeTest, ManyNamesOfADirectoryAreToldApart) {
+  std::string lines;
+  Strings expected;
+  for (int i = 0; i < 100; ++i) {
+    const std::string path = "/s/file-" + std::to_string(i);
+    lines += Line(EVENT_ATTR, path);
+    for (int back = 0; back <= 20; back += 4) {
+      lines += Line(EVENT_MODIFY, "/s/file-" + std::to_string(std::max(i - back, 0)));
+    }
+    expected.push_back("index " + path);
+  }
+  const QueueFile queue(lines);
+  OPTree tree(queue.path());
+  EXPECT_EQ(tree.GetNodeByPath("/s")->children.size(), 100u);
+  EXPECT_EQ(HandedOut(tree), expected);
+}
+
+TEST_F(OPTreeTest, OfSeveralChildrenOfOneNameTheFirstIsFound) {
+  std::string lines;
+  for (int i = 0; i < 10; ++i) lines += Line(EVENT_DELETE, "/s/" + std::to_string(i));
+  const QueueFile queue(lines);
+  OPTree tree(queue.path());
+  const std::shared_ptr<OPNode> directory = tree.GetNodeByPath("/s");
+  for (int i = 0; i < 10; ++i) {
+    directory->children.push_back(std::make_shared<OPNode>(directory, std::to_string(i)));
+  }
+  tree.BuildTree();
+  ASSERT_EQ(directory->children.size(), 20u);
+  for (std::size_t i = 0; i < 20; ++i) {
+    EXPECT_EQ(directory->children[i]->ops.size(), i < 10 ? 1u : 0u) << i;
+  }
+}
+
 TEST_F(OPTreeTest, TreeWithoutARootHasNoNodes) {
   const QueueFile queue;
   OPTree tree(queue.path());
