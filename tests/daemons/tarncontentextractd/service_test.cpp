@@ -86,7 +86,7 @@ TEST_F(ServiceTest, ManyDocumentsAreThoseOfEachPath) {
     EXPECT_TRUE(answer["success"].asBool());
     const Json::Value& data = answer["data"];
     ASSERT_EQ(data.size(), paths.size());
-    for (const Json::ArrayIndex i : {0, 2, 3}) {
+    for (const Json::ArrayIndex i : {0U, 2U, 3U}) {
       EXPECT_EQ(data[i], service_.ParseFile(paths[i], need_meta)) << paths[i];
     }
     EXPECT_TRUE(data[1].isNull());
