@@ -12,6 +12,7 @@
 #include <map>
 
 #include "common/error.h"
+#include "daemons/common/system_error.h"
 #include "tests/daemons/fileindexd/share_fixture.h"
 #include "tests/daemons/fileindexd/shared_parts.h"
 #include "tests/support/files.h"
@@ -111,6 +112,8 @@ TEST_F(WorkerTableTest, AWorkerStaysWhereItsReturnCannotBeSeenTo) {
   ASSERT_TRUE(Becomes("s", "idle"));
   rlimit usual{};
   ASSERT_EQ(getrlimit(RLIMIT_NOFILE, &usual), 0);
+  // A sanitizer needs descriptors the first time that it looks at what a failure is told with.
+  EXPECT_THROW(daemon::ThrowSystemError("A failure"), Error);
   const rlimit none{0, usual.rlim_max};
   ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &none), 0);
   EXPECT_THROW(table_.Delete("s", getpid()), Error);

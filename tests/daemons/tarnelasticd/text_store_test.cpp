@@ -144,6 +144,16 @@ TEST_F(TextStoreTest, DamageIsTold) {
   EXPECT_THROW(store_.Write(1, "x"), Error);
 }
 
+TEST_F(TextStoreTest, ARowBeforeTheFirstNumberIsDamage) {
+  const std::string row = Compress(std::string("\0\1a", 3));
+  db_.Prepare("INSERT INTO texts(id,packed) VALUES(?1,?2)")
+      .Bind(1, std::numeric_limits<std::int64_t>::min())
+      .BindBlob(2, row)
+      .Run();
+  EXPECT_THROW(ReadText(&db_, kTexts, 1), Error);
+  EXPECT_THROW(store_.Write(1, "x"), Error);
+}
+
 TEST_F(TextStoreTest, ATextThatFillsARowHasOneOfItsOwn) {
   const std::string large(kTexts.row_bytes, 'x');
   store_.Write(1, "before");
