@@ -1,6 +1,7 @@
 #include "fileindex/queue/large_pages.h"
 
 #include <gtest/gtest.h>
+#include <sys/mman.h>
 
 #include <cerrno>
 #include <cstddef>
@@ -22,11 +23,12 @@ TEST(LargePagesTest, AskingForThemChangesNothing) {
 }
 
 TEST(LargePagesTest, NoErrorIsLeftWhereNoMemoryIs) {
-  std::vector<char> memory(3 * kLargePage);
-  const char* const place = memory.data();
-  memory = std::vector<char>();
+  constexpr std::size_t kSize = 3 * kLargePage;
+  void* const place = mmap(nullptr, kSize, PROT_NONE, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0);
+  ASSERT_NE(place, MAP_FAILED);
+  ASSERT_EQ(munmap(place, kSize), 0);
   errno = 0;
-  PreferLargePages(place, 3 * kLargePage);
+  PreferLargePages(place, kSize);
   EXPECT_EQ(errno, 0);
 }
 
