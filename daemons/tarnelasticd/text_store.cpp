@@ -40,7 +40,7 @@ constexpr char kRowOf[] = "id<=?1 ORDER BY id DESC LIMIT 1";
 // Calls visit(id, text) for each text of a row until it returns false. The ids ascend.
 template <typename Visit>
 void ForEachText(std::int64_t row, std::string_view bytes, Visit visit) {
-  if (row <= 0) FailDamaged();
+  if (row < 0) FailDamaged();
   std::int64_t id = row;
   for (bool first = true; !bytes.empty(); first = false) {
     const std::uint64_t step = TakeNumber(&bytes);
