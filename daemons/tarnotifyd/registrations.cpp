@@ -78,9 +78,11 @@ std::optional<MonitorRegistration> Parse(const std::string& file, const Json::Va
 
 }  // namespace
 
-// The directory is made by the first registration, and may be another one after a restore.
+// The directory may be another one after a restore. It is made here as the first registration would
+// make it: that one is then followed as soon as it is there, and not when somebody looks next.
 void Registrations::Watch() {
   const std::string& directory = platform::MonitorDirectory();
+  mkdir(directory.c_str(), 0750);
   const std::string now = IdentityOf(directory);
   if (watch_.valid() && now == watched_) return;
   watch_.Reset();

@@ -34,6 +34,7 @@ class RegistrationsTest : public ::testing::Test {
 };
 
 TEST_F(RegistrationsTest, TheDirectoryMayComeLater) {
+  std::filesystem::remove_all(std::filesystem::path(directory_).parent_path());
   EXPECT_FALSE(registrations_.Refresh());
   EXPECT_EQ(registrations_.Descriptor(), -1);
   Put("a.json", Text("/q", "/v/a"));
@@ -41,6 +42,14 @@ TEST_F(RegistrationsTest, TheDirectoryMayComeLater) {
   EXPECT_FALSE(registrations_.Refresh());
   const platform::WatchedPlace place{"/v/a", 0xFFC6, {"@eaDir"}};
   EXPECT_EQ(registrations_.Queues(), (QueuePlaces{{"/q", {place}}}));
+}
+
+TEST_F(RegistrationsTest, TheFirstRegistrationWakes) {
+  EXPECT_FALSE(registrations_.Refresh());
+  EXPECT_FALSE(IsReady());
+  Put("a.json", Text("/q", "/v/a"));
+  EXPECT_TRUE(IsReady());
+  EXPECT_TRUE(registrations_.Refresh());
 }
 
 TEST_F(RegistrationsTest, EveryChangeWakes) {
