@@ -15,7 +15,10 @@ constexpr std::size_t kPage = 5000;
 // The documents directly in a directory, in ascending order of paths, a page at a time.
 class ChildCursor {
  public:
-  ChildCursor(Index& index, const std::string& dir) : index_(index), dir_(dir) { Load(""); }
+  // Of a `fresh` one there are none, and nobody is asked.
+  ChildCursor(Index& index, const std::string& dir, bool fresh) : index_(index), dir_(dir) {
+    if (!fresh) Load("");
+  }
 
   // The next document, or null at the end.
   const Document* Get() const { return next_ < page_.size() ? &page_[next_] : nullptr; }
@@ -41,9 +44,9 @@ class ChildCursor {
 
 }  // namespace
 
-void Reconciler::Push(const std::string& path, bool compared) {
-  stops_.push_back({path, compared});
-  tools_.progress.AddWaiting(path);
+void Reconciler::Push(const Stop& stop) {
+  stops_.push_back(stop);
+  tools_.progress.AddWaiting(stop.path);
 }
 
 void Reconciler::Reconcile(const std::string& path) {
@@ -52,7 +55,7 @@ void Reconciler::Reconcile(const std::string& path) {
 }
 
 void Reconciler::Walk(const std::string& path) {
-  Push(path, false);
+  Push({path, false, false});
   Run();
 }
 
@@ -79,7 +82,7 @@ void Reconciler::Run() {
 
 void Reconciler::Visit(const Stop& stop) {
   if (stop.compared) {
-    VisitDirectory(stop.path);
+    VisitDirectory(stop);
   } else {
     VisitPlace(stop.path);
   }
@@ -98,7 +101,7 @@ void Reconciler::VisitPlace(const std::string& path) {
       tools_.lane.Settle(path);
       ++wanted_;
       Bring(path, finding.place, tools_.index.Find(path));
-      if (finding.place.kind == PlaceKind::kDirectory) Push(path, true);
+      if (finding.place.kind == PlaceKind::kDirectory) Push({path, true, IsFresh(path)});
       return;
     case Verdict::kUnwanted:
       return Drop(path);
@@ -109,7 +112,13 @@ void Reconciler::VisitPlace(const std::string& path) {
   }
 }
 
-void Reconciler::VisitDirectory(const std::string& dir) {
+// Where a whole tree is new, as at a first index, its directories need not be asked for one by one.
+bool Reconciler::IsFresh(const std::string& dir) {
+  return tools_.index.PathsBelow(dir, "", 1).empty();
+}
+
+void Reconciler::VisitDirectory(const Stop& stop) {
+  const std::string& dir = stop.path;
   std::vector<std::string> names;
   if (tools_.survey.files().List(dir, names) != PlaceKind::kDirectory) {
     // It has changed since it was seen. If it is a directory again, another event tells of it.
@@ -119,16 +128,16 @@ void Reconciler::VisitDirectory(const std::string& dir) {
   }
   std::sort(names.begin(), names.end());
   // What is still being done below the directory would make the answers out of date.
-  tools_.lane.SettleBelow(dir);
-  ChildCursor documents(tools_.index, dir);
+  if (!stop.fresh) tools_.lane.SettleBelow(dir);
+  ChildCursor documents(tools_.index, dir, stop.fresh);
   for (const std::string& name : names) {
     tools_.gate.Pass();
     const std::string path = dir + "/" + name;
     while (documents.Get() && documents.Get()->path < path) DropVanished(documents.Take().path);
     if (documents.Get() && documents.Get()->path == path) {
-      VisitEntry(path, documents.Take());
+      VisitEntry(path, documents.Take(), stop.fresh);
     } else {
-      VisitEntry(path, std::nullopt);
+      VisitEntry(path, std::nullopt, stop.fresh);
     }
   }
   while (documents.Get()) DropVanished(documents.Take().path);
@@ -139,14 +148,15 @@ void Reconciler::DropVanished(const std::string& path) {
   if (!tools_.survey.IsAside(path)) Drop(path);
 }
 
-void Reconciler::VisitEntry(const std::string& path, const std::optional<Document>& document) {
+void Reconciler::VisitEntry(const std::string& path, const std::optional<Document>& document,
+                            bool fresh) {
   if (WasVisited(path)) return;
   const Finding finding = tools_.survey.ExamineEntry(path);
   switch (finding.verdict) {
     case Verdict::kWanted:
       ++wanted_;
       Bring(path, finding.place, document);
-      if (finding.place.kind == PlaceKind::kDirectory) Push(path, true);
+      if (finding.place.kind == PlaceKind::kDirectory) Push({path, true, fresh});
       return;
     case Verdict::kUnwanted:
       // A folder below it has to be found though there is no way through.
@@ -192,10 +202,10 @@ void Reconciler::DropAroundFolders(const std::string& path) {
   for (const FolderRule* folder : tools_.survey.rules()->FoldersBelow(path)) {
     const std::string child =
         folder->full_path.substr(0, folder->full_path.find('/', path.size() + 1));
-    if (stops_.empty() || stops_.back().path != child) Push(child, false);
+    if (stops_.empty() || stops_.back().path != child) Push({child, false, false});
   }
   tools_.lane.Settle(path);
-  for (ChildCursor documents(tools_.index, path); documents.Get();) {
+  for (ChildCursor documents(tools_.index, path, false); documents.Get();) {
     const std::string child = documents.Take().path;
     if (!tools_.survey.rules()->HasFolderBelow(child) && !tools_.survey.rules()->At(child)) {
       DropVanished(child);

@@ -56,16 +56,18 @@ class Reconciler {
   struct Stop {
     std::string path;
     bool compared;  // its own document has been brought in line
+    bool fresh;     // the index had nothing below it
   };
 
   void Walk(const std::string& path);
-  void Push(const std::string& path, bool compared);
+  void Push(const Stop& stop);
   void Run();
   void Visit(const Stop& stop);
   bool WasVisited(const std::string& path);
   void VisitPlace(const std::string& path);
-  void VisitDirectory(const std::string& dir);
-  void VisitEntry(const std::string& path, const std::optional<Document>& document);
+  bool IsFresh(const std::string& dir);
+  void VisitDirectory(const Stop& stop);
+  void VisitEntry(const std::string& path, const std::optional<Document>& document, bool fresh);
   void CountDoubt(const std::string& path);
   void DropVanished(const std::string& path);
   void Drop(const std::string& path);

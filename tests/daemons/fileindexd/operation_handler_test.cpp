@@ -405,6 +405,27 @@ TEST_F(OperationHandlerTest, ReindexComparesThePlaceAndAllBelow) {
   EXPECT_THAT(CommandsOf(), IsEmpty());
 }
 
+TEST_F(OperationHandlerTest, ATreeThatIsNewIsNotAskedForDirectoryByDirectory) {
+  disk_.WriteFile("/v/s/d/a.txt");
+  disk_.WriteFile("/v/s/d/e/f/b.txt");
+  std::vector<std::string> questions;
+  index_.SetHook([&](const std::string& command) {
+    if (command.rfind("children ", 0) == 0) questions.push_back(command);
+  });
+  Queue(EVENT_REINDEX, "/v/s");
+  EXPECT_EQ(6U, CommandsOf().size());
+  EXPECT_THAT(questions, IsEmpty());
+  ExpectInLine();
+}
+
+TEST_F(OperationHandlerTest, WhatIsLeftOfANewTreeIsFoundWithoutTheDirectoriesAboveIt) {
+  disk_.WriteFile("/v/s/d/e/f/b.txt");
+  index_.Put({"/v/s/d/e/f/gone.txt", false, "", ""});
+  Queue(EVENT_REINDEX, "/v/s");
+  EXPECT_THAT(CommandsOf(), ::testing::Contains("delete /v/s/d/e/f/gone.txt"));
+  ExpectInLine();
+}
+
 TEST_F(OperationHandlerTest, ConfigurationUpdateReadsOnlyWhatTheNewKindsAskFor) {
   disk_.WriteFile("/v/s/a.txt");
   disk_.WriteFile("/v/s/b.mp3");

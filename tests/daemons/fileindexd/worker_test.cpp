@@ -321,6 +321,7 @@ TEST_F(WorkerTest, AFolderThatIsNoLongerPausedBehindTheWalkIsCompared) {
   host_.SetFolders({Folder("/s"), PausedFolder("/s/a")});
   disk_.WriteFile("/v/s/a/1.txt");
   disk_.WriteFile("/v/s/b/2.txt");
+  index_.Put({"/v/s/b", true, "", ""});
   index_.SetHook([this](const std::string& command) {
     if (command != "children /v/s/b") return;
     host_.SetFolders({Folder("/s"), Folder("/s/a")});
