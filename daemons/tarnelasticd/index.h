@@ -136,6 +136,11 @@ class Index {
 
 template <typename Action>
 auto Index::UseWriter(bool paused_too, Action action) {
+  // The next one gets the writer before this one does what has been left beside it.
+  struct Afterwards {
+    IndexWriter* writer;
+    ~Afterwards() { writer->RunSideWork(); }
+  } afterwards{store_->writer.get()};
   const std::lock_guard<std::mutex> lock(writer_mutex_);
   if (paused_ && !paused_too) throw Error(kPausedIndex, "The index is paused");
   struct AtEnd {

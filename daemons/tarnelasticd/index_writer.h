@@ -19,6 +19,7 @@
 #include "daemons/tarnelasticd/fts_buffer.h"
 #include "daemons/tarnelasticd/schema.h"
 #include "daemons/tarnelasticd/selection.h"
+#include "daemons/tarnelasticd/side_work.h"
 #include "daemons/tarnelasticd/text_sharing.h"
 #include "daemons/tarnelasticd/text_store.h"
 #include "daemons/tarnelasticd/text_tokenizer.h"
@@ -40,7 +41,7 @@ struct WriterLimits {
 // The one connection that changes an index. Changes collect in a transaction: this object's own
 // questions see them at once, searches after Commit(). A change that fails, whatever for, takes all
 // that was not committed with it; Lost() tells. Throws Error as Database does. One thread at a
-// time, but for documents() and HasUncommitted().
+// time, but for documents(), HasUncommitted() and RunSideWork().
 class IndexWriter {
  public:
   // Opens the database of an index that exists. `schema` is the one that it was made with.
@@ -68,6 +69,9 @@ class IndexWriter {
   void Commit();
   // Commits when the transaction has been open too long.
   void CommitIfOld();
+  // Does what changes have left to be done beside the writer. Any thread, while others change the
+  // index; to be called after each change by whoever made it, or commits have all of it to do.
+  void RunSideWork() noexcept { side_work_.RunAll(); }
 
   // Documents, uncommitted ones included, and whether there is anything to commit. Any thread.
   std::int64_t documents() const { return documents_; }
@@ -115,6 +119,7 @@ class IndexWriter {
   Database db_;
   TextTokenizer tokenizer_;
   FtsBuffer buffer_;
+  SideWork side_work_;
   TextStore texts_;
   TextStore attributes_;
   TextSharing sharing_;

@@ -94,14 +94,23 @@ std::string ReadText(Database* db, const TextTable& table, std::int64_t id) {
   return TextReader(db, table).Read(id);
 }
 
-TextStore::TextStore(Database* db, const TextTable& table)
+TextStore::TextStore(Database* db, const TextTable& table, SideWork* work)
     : db_(db),
+      work_(work),
       table_(table),
       select_sql_(Select("id,packed", table, kRowOf)),
       next_sql_(Select("min(id)", table, "id>?1")),
       delete_sql_(std::string("DELETE FROM ") + table.name + " WHERE id=?1"),
       insert_sql_(std::string("INSERT INTO ") + table.name + "(id,packed) VALUES(?1,?2)"),
       reader_(db, table) {}
+
+TextStore::~TextStore() {
+  Clear();
+}
+
+const TextStore::Texts& TextStore::TextsOf(const Row& row) {
+  return row.sealed ? row.sealed->texts : row.texts;
+}
 
 TextStore::Rows::iterator TextStore::FindOpen(std::int64_t id) {
   auto row = rows_.upper_bound(id);
@@ -147,22 +156,64 @@ TextStore::Rows::iterator TextStore::Open(std::int64_t id) {
   auto found = FindOpen(id);
   if (found == rows_.end()) found = Load(id);
   Row& row = found->second;
-  if (row.bytes < table_.row_bytes || id <= row.texts.rbegin()->first) return found;
+  if (row.bytes < table_.row_bytes || id <= TextsOf(row).rbegin()->first) return found;
+  if (!row.sealed) Seal(found->first, &row);
   Row behind;
   behind.end = std::exchange(row.end, id);
   return rows_.emplace(id, std::move(behind)).first;
 }
 
+// The task has all that it uses to itself: the store may go on, or end, before it is done.
+void TextStore::Seal(std::int64_t key, Row* row) {
+  sealed_.push_back(key);
+  const auto sealed = std::make_shared<Sealed>();
+  sealed->texts = std::move(row->texts);
+  row->texts.clear();
+  row->sealed = sealed;
+  row->task = work_->Add([sealed, bytes = row->bytes, row_bytes = table_.row_bytes] {
+    sealed->packed = Pack(sealed->texts, bytes, row_bytes);
+  });
+}
+
+// Others may be reading the texts that are sealed.
+void TextStore::Unseal(Row* row) {
+  row->texts = row->sealed->texts;
+  work_->Drop(row->task);
+  row->task.reset();
+  row->sealed.reset();
+}
+
+// Puts into the table what has been compressed.
+void TextStore::PlaceSealed() {
+  std::vector<std::int64_t> left;
+  for (const std::int64_t key : sealed_) {
+    const auto row = rows_.find(key);
+    if (row == rows_.end() || !row->second.sealed) continue;
+    if (!work_->IsDone(*row->second.task)) {
+      left.push_back(key);
+      continue;
+    }
+    WriteOut(key, row->second);
+    open_bytes_ -= row->second.bytes;
+    rows_.erase(row);
+    reader_.Clear();
+  }
+  sealed_.swap(left);
+}
+
 std::string TextStore::Read(std::int64_t id) {
   const auto row = FindOpen(id);
   if (row == rows_.end()) return reader_.Read(id);
-  const auto text = row->second.texts.find(id);
-  return text == row->second.texts.end() ? std::string() : text->second;
+  const Texts& texts = TextsOf(row->second);
+  const auto text = texts.find(id);
+  return text == texts.end() ? std::string() : text->second;
 }
 
 void TextStore::Write(std::int64_t id, std::string text) {
   if (open_bytes_ >= kOpenBytes) Flush();
+  if (!sealed_.empty()) PlaceSealed();
   Row& row = Open(id)->second;
+  if (row.sealed) Unseal(&row);
   std::string& kept = row.texts[id];
   row.bytes += CostOf(text) - CostOf(kept);
   open_bytes_ += CostOf(text) - CostOf(kept);
@@ -172,23 +223,37 @@ void TextStore::Write(std::int64_t id, std::string text) {
 
 // A row that has grown becomes several. A text that fills one has one of its own, so that its
 // neighbours are read without it.
-void TextStore::WriteOut(std::int64_t key, const Row& row) {
-  if (row.stored) db_->Prepare(delete_sql_).Bind(1, key).Run();
-  Statement insert = db_->Prepare(insert_sql_);
-  for (auto text = row.texts.begin(); text != row.texts.end();) {
+std::vector<TextStore::Packed> TextStore::Pack(const Texts& texts, std::size_t most_bytes,
+                                               std::size_t row_bytes) {
+  std::vector<Packed> packed;
+  std::string bytes;
+  bytes.reserve(most_bytes);
+  for (auto text = texts.begin(); text != texts.end();) {
     const std::int64_t first = text->first;
-    std::string bytes;
-    for (std::int64_t last = first; text != row.texts.end() && bytes.size() < table_.row_bytes;
-         ++text) {
-      if (!bytes.empty() && text->second.size() >= table_.row_bytes) break;
+    bytes.clear();
+    for (std::int64_t last = first; text != texts.end() && bytes.size() < row_bytes; ++text) {
+      if (!bytes.empty() && text->second.size() >= row_bytes) break;
       AppendNumber(&bytes, static_cast<std::uint64_t>(text->first - last));
       AppendNumber(&bytes, text->second.size());
       bytes += text->second;
       last = text->first;
     }
-    const std::string packed = Compress(bytes);
-    insert.Bind(1, first).BindBlob(2, packed).Run();
+    packed.push_back({first, Compress(bytes)});
   }
+  return packed;
+}
+
+void TextStore::WriteOut(std::int64_t key, const Row& row) {
+  if (row.stored) db_->Prepare(delete_sql_).Bind(1, key).Run();
+  std::vector<Packed> packed;
+  if (row.sealed) {
+    work_->Finish(row.task);
+    packed.swap(row.sealed->packed);
+  } else {
+    packed = Pack(row.texts, row.bytes, table_.row_bytes);
+  }
+  Statement insert = db_->Prepare(insert_sql_);
+  for (const auto& [first, bytes] : packed) insert.Bind(1, first).BindBlob(2, bytes).Run();
 }
 
 void TextStore::Flush() {
@@ -197,8 +262,12 @@ void TextStore::Flush() {
 }
 
 void TextStore::Clear() {
+  for (const auto& [key, row] : rows_) {
+    if (row.task) work_->Drop(row.task);
+  }
   reader_.Clear();
   rows_.clear();
+  sealed_.clear();
   open_bytes_ = 0;
 }
 

@@ -2,10 +2,13 @@
 
 #include <gtest/gtest.h>
 
+#include <atomic>
 #include <limits>
 #include <map>
 #include <random>
 #include <string>
+#include <thread>
+#include <vector>
 
 #include "daemons/tarnelasticd/compression.h"
 #include "daemons/tarnelasticd/engine_error.h"
@@ -40,7 +43,8 @@ class TextStoreTest : public testing::Test {
   }
 
   Database db_{":memory:"};
-  TextStore store_{&db_, kTexts};
+  SideWork work_;
+  TextStore store_{&db_, kTexts, &work_};
 };
 
 TEST_F(TextStoreTest, HasNoTextOfUnknownDocuments) {
@@ -219,6 +223,135 @@ TEST_F(TextStoreTest, KeepsNothingOfWhatWasReplaced) {
   EXPECT_LT(bytes(), 50);
 }
 
+class TextStoreWorkTest : public TextStoreTest {
+ protected:
+  // Writes texts behind each other until so many rows are full.
+  void Fill(std::int64_t rows) {
+    for (std::int64_t id = 0; id <= 4 * rows; ++id) {
+      texts_[id] = RandomText(&random_, kTexts.row_bytes / 4);
+      store_.Write(id, texts_[id]);
+    }
+  }
+  std::vector<std::string> Contents() {
+    std::vector<std::string> contents;
+    Statement rows = db_.Prepare("SELECT id||':'||hex(packed) FROM texts ORDER BY id");
+    while (rows.Step()) contents.emplace_back(rows.Text(0));
+    return contents;
+  }
+
+  std::mt19937 random_{5};
+  std::map<std::int64_t, std::string> texts_;
+};
+
+TEST_F(TextStoreWorkTest, FullRowsAreReadWhileTheyAreCompressed) {
+  Fill(3);
+  EXPECT_EQ(Rows(), 0);
+  ExpectTexts(texts_, 20);
+  work_.RunAll();
+  ExpectTexts(texts_, 20);
+  EXPECT_EQ(Rows(), 0);
+  store_.Write(100, "next");
+  EXPECT_EQ(Rows(), 3);
+  ExpectTexts(texts_, 20);
+  store_.Flush();
+  ExpectTexts(texts_, 20);
+}
+
+TEST_F(TextStoreWorkTest, WhatNobodyHasDoneIsDoneByFlush) {
+  Fill(3);
+  store_.Flush();
+  EXPECT_EQ(Rows(), 4);
+  ExpectTexts(texts_, 20);
+}
+
+TEST_F(TextStoreWorkTest, ARowMayChangeWhileItIsCompressedAndAfterwards) {
+  Fill(3);
+  texts_[1] = "changed before";
+  store_.Write(1, texts_[1]);
+  work_.RunAll();
+  texts_[5] = "changed after";
+  store_.Write(5, texts_[5]);
+  texts_.erase(10);
+  store_.Write(10, "");
+  ExpectTexts(texts_, 20);
+  store_.Flush();
+  ExpectTexts(texts_, 20);
+  for (const auto& [id, text] : texts_) ASSERT_EQ(ReadText(&db_, kTexts, id), text) << id;
+}
+
+TEST_F(TextStoreWorkTest, ARollbackForgetsWhatIsBeingCompressed) {
+  store_.Write(0, "kept");
+  store_.Flush();
+  for (const bool is_done : {false, true}) {
+    db_.Execute("BEGIN");
+    Fill(3);
+    if (is_done) work_.RunAll();
+    store_.Clear();
+    db_.Execute("ROLLBACK");
+    work_.RunAll();
+    store_.Flush();
+    EXPECT_EQ(Rows(), 1);
+    EXPECT_EQ(store_.Read(0), "kept");
+    EXPECT_EQ(store_.Read(1), "");
+  }
+}
+
+TEST_F(TextStoreWorkTest, AFullDiskIsToldByALaterWriteAndByFlush) {
+  db_.Execute("PRAGMA max_page_count=100");
+  for (const bool is_done : {false, true}) {
+    db_.Execute("BEGIN");
+    Fill(3);
+    if (is_done) {
+      work_.RunAll();
+      EXPECT_THROW(store_.Write(100, "next"), Error);
+    } else {
+      EXPECT_THROW(store_.Flush(), Error);
+    }
+    store_.Clear();
+    if (db_.InTransaction()) db_.Execute("ROLLBACK");
+    EXPECT_EQ(Rows(), 0);
+    EXPECT_EQ(store_.Read(1), "");
+  }
+}
+
+// The rows are the same whoever compresses them, and whenever.
+TEST_F(TextStoreWorkTest, OthersMakeTheSameRows) {
+  std::vector<std::vector<std::string>> contents;
+  for (const bool has_helpers : {false, true}) {
+    db_.Execute("DELETE FROM texts");
+    std::atomic<bool> is_over{!has_helpers};
+    std::vector<std::thread> helpers;
+    for (int i = 0; i < 2; ++i) {
+      helpers.emplace_back([&] {
+        while (!is_over) work_.RunAll();
+      });
+    }
+    std::mt19937 random(6);
+    for (std::int64_t id = 0; id < 2000; ++id) {
+      store_.Write(id, RandomText(&random, random() % (id % 50 == 0 ? 500000 : 9000)));
+      if (id % 600 == 0) store_.Flush();
+    }
+    store_.Flush();
+    is_over = true;
+    for (std::thread& helper : helpers) helper.join();
+    contents.push_back(Contents());
+  }
+  EXPECT_GT(contents[0].size(), 40U);
+  EXPECT_EQ(contents[0], contents[1]);
+}
+
+TEST(TextStoreEndTest, MayEndBeforeItsWork) {
+  SideWork work;
+  {
+    Database db(":memory:");
+    db.Execute(kTable);
+    TextStore store(&db, kTexts, &work);
+    store.Write(1, std::string(kTexts.row_bytes, 'x'));
+    store.Write(2, "behind");
+  }
+  work.RunAll();
+}
+
 // What is open is bounded, so much of this goes through the table.
 TEST_F(TextStoreTest, BehavesLikeAMap) {
   constexpr std::int64_t kIds = 300;
@@ -239,6 +372,7 @@ TEST_F(TextStoreTest, BehavesLikeAMap) {
         store_.Write(id, expected[id]);
         break;
     }
+    if (random() % 4 == 0) work_.RunAll();
     const std::int64_t other = random() % kIds;
     const auto text = expected.find(other);
     ASSERT_EQ(store_.Read(other), text == expected.end() ? std::string() : text->second) << step;

@@ -1,0 +1,108 @@
+#include "daemons/tarnelasticd/side_work.h"
+
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <future>
+#include <new>
+#include <stdexcept>
+#include <thread>
+#include <vector>
+
+namespace quarry::engine {
+namespace {
+
+TEST(SideWorkTest, IsDoneOnceAndInOrder) {
+  SideWork work;
+  std::vector<int> done;
+  const auto first = work.Add([&done] { done.push_back(1); });
+  work.Add([&done] { done.push_back(2); });
+  EXPECT_FALSE(work.IsDone(*first));
+  work.RunAll();
+  EXPECT_TRUE(work.IsDone(*first));
+  work.RunAll();
+  work.Finish(first);
+  EXPECT_EQ(done, (std::vector<int>{1, 2}));
+}
+
+TEST(SideWorkTest, WhoNeedsItDoesWhatNobodyHasBegun) {
+  SideWork work;
+  int others = 0;
+  int done = 0;
+  work.Add([&others] { ++others; });
+  const auto task = work.Add([&done] { ++done; });
+  work.Finish(task);
+  EXPECT_EQ(done, 1);
+  EXPECT_EQ(others, 0);
+  work.RunAll();
+  EXPECT_EQ(done, 1);
+  EXPECT_EQ(others, 1);
+}
+
+TEST(SideWorkTest, WhoNeedsItWaitsForWhoHasBegun) {
+  SideWork work;
+  std::promise<void> begun;
+  std::promise<void> may_end;
+  int done = 0;
+  const auto task = work.Add([&] {
+    begun.set_value();
+    may_end.get_future().wait();
+    ++done;
+  });
+  std::thread helper([&work] { work.RunAll(); });
+  begun.get_future().wait();
+  EXPECT_FALSE(work.IsDone(*task));
+  std::thread opener([&may_end] { may_end.set_value(); });
+  work.Finish(task);
+  EXPECT_EQ(done, 1);
+  opener.join();
+  helper.join();
+}
+
+TEST(SideWorkTest, FailuresComeToWhoNeedsIt) {
+  SideWork work;
+  const auto thrown = work.Add([] { throw std::runtime_error("failed"); });
+  const auto memory = work.Add([] { throw std::bad_alloc(); });
+  const auto own = work.Add([] { throw std::bad_alloc(); });
+  int done = 0;
+  work.Finish(work.Add([&done] { ++done; }));
+  EXPECT_THROW(work.Finish(own), std::bad_alloc);
+  work.RunAll();
+  EXPECT_TRUE(work.IsDone(*thrown));
+  EXPECT_THROW(work.Finish(thrown), std::runtime_error);
+  EXPECT_THROW(work.Finish(memory), std::bad_alloc);
+  EXPECT_EQ(done, 1);
+}
+
+TEST(SideWorkTest, WhatIsDroppedIsNotBegun) {
+  SideWork work;
+  int done = 0;
+  const auto task = work.Add([&done] { ++done; });
+  const auto before = work.Add([&done] { ++done; });
+  work.Finish(before);
+  work.Drop(task);
+  work.Drop(before);
+  work.RunAll();
+  EXPECT_EQ(done, 1);
+}
+
+TEST(SideWorkTest, ManyShareIt) {
+  SideWork work;
+  std::atomic<int> done{0};
+  std::atomic<bool> is_over{false};
+  std::vector<std::thread> helpers;
+  for (int i = 0; i < 3; ++i) {
+    helpers.emplace_back([&] {
+      while (!is_over) work.RunAll();
+    });
+  }
+  std::vector<std::shared_ptr<SideWork::Task>> tasks;
+  for (int i = 0; i < 1000; ++i) tasks.push_back(work.Add([&done] { ++done; }));
+  for (const auto& task : tasks) work.Finish(task);
+  EXPECT_EQ(done, 1000);
+  is_over = true;
+  for (std::thread& helper : helpers) helper.join();
+}
+
+}  // namespace
+}  // namespace quarry::engine
