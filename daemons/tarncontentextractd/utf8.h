@@ -5,6 +5,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <cstring>
 #include <string_view>
 
 namespace quarry::extract {
@@ -50,6 +51,21 @@ inline std::int32_t NextCharacter(std::string_view text, std::size_t* at) {
 
 inline bool IsAsciiByte(char c) {
   return static_cast<unsigned char>(c) < 0x80;
+}
+
+// Whether all of it is UTF-8. (NUL is.)
+inline bool IsUtf8(std::string_view text) {
+  std::size_t at = 0;
+  while (at < text.size()) {
+    std::uint64_t eight = 0x80;
+    if (text.size() - at >= sizeof(eight)) std::memcpy(&eight, text.data() + at, sizeof(eight));
+    if ((eight & 0x8080808080808080u) == 0) {
+      at += sizeof(eight);
+    } else if (NextCharacter(text, &at) < 0) {
+      return false;
+    }
+  }
+  return true;
 }
 
 }  // namespace quarry::extract

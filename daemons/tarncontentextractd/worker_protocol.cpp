@@ -49,13 +49,8 @@ bool IsFieldName(const std::string& name) {
                      [](char c) { return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z'); });
 }
 
-bool IsUtf8(std::string_view text) {
-  std::size_t at = 0;
-  while (at < text.size()) {
-    const std::int32_t c = NextCharacter(text, &at);
-    if (c <= 0) return false;
-  }
-  return true;
+bool IsText(std::string_view text) {
+  return text.find('\0') == std::string_view::npos && IsUtf8(text);
 }
 
 void PutValue(std::string& out, const FieldValue& value) {
@@ -80,7 +75,7 @@ bool TakeValue(std::string_view* in, FieldValue* value) {
   if (index == 1) return TakeNumber<std::int64_t>(in, value);
   if (index == 2) return TakeNumber<double>(in, value);
   std::string text;
-  if (index != 0 || !TakeText(in, kMaxTextBytes, &text) || !IsUtf8(text)) return false;
+  if (index != 0 || !TakeText(in, kMaxTextBytes, &text) || !IsText(text)) return false;
   *value = std::move(text);
   return true;
 }
