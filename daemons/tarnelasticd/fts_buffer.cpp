@@ -14,6 +14,9 @@ namespace {
 
 constexpr std::size_t kEntryBytes = 160;
 
+// Texts that wait to be cut into words take no more memory than that.
+constexpr std::size_t kCuttingBytes = std::size_t{4} << 20;
+
 constexpr const char* kBody = "body";
 constexpr char kMainIndex = '0';
 // So many of a level become one. A search looks into each.
@@ -58,7 +61,8 @@ FtsBuffer::Table FtsBuffer::MakeTable(const std::string& name, const std::string
           "INSERT INTO " + name + "(rowid," + columns + ") VALUES(" + values + ")"};
 }
 
-FtsBuffer::FtsBuffer(const Schema& schema, Database* db, const TextTokenizer& tokenizer)
+FtsBuffer::FtsBuffer(const Schema& schema, Database* db, const TextTokenizer& tokenizer,
+                     SideWork* work)
     : schema_(schema),
       db_(db),
       tokenizer_(tokenizer),
@@ -67,8 +71,13 @@ FtsBuffer::FtsBuffer(const Schema& schema, Database* db, const TextTokenizer& to
       label_(MakeTable("labels", "name,extra", 2)),
       name_(MakeTable("names", "name", 1)),
       has_own_segments_(ReadStructure(db, kBody).has_value()),
-      lists_(tokenizer),
+      work_(work),
+      cutters_(std::make_shared<WordCutters>()),
       listed_words_(schema.text_columns()) {}
+
+FtsBuffer::~FtsBuffer() {
+  ClearLists();
+}
 
 void FtsBuffer::Run(const std::string& sql, std::int64_t id,
                     const std::vector<std::string_view>& texts) {
@@ -89,31 +98,60 @@ void FtsBuffer::InsertLabels(std::int64_t doc, const Labels& labels) {
   Run(name_.insert, doc, {MarkedName(tokenizer_, labels.name)});
 }
 
-void FtsBuffer::InsertBody(std::int64_t text, std::string_view body) {
-  if (!AddToLists(text, body)) RunBody(body_.insert, text, body);
+void FtsBuffer::InsertBody(std::int64_t text, const std::shared_ptr<const std::string>& body) {
+  if (!has_own_segments_ || body->empty() || text <= last_listed_) {
+    RunBody(body_.insert, text, *body);
+    return;
+  }
+  last_listed_ = text;
+  LeaveToCut(text, body);
+  TakeCut(/*all=*/cutting_bytes_ >= kCuttingBytes);
 }
 
-// Whether the lists have taken the text; what they do not take is for FTS5.
-bool FtsBuffer::AddToLists(std::int64_t id, std::string_view body) {
-  if (!has_own_segments_ || body.empty() || id <= last_listed_) return false;
-  const std::vector<std::size_t> words = lists_.Add(id, UnpackTexts(schema_, body));
-  if (words.empty()) return false;
-  last_listed_ = id;
+// The task has all that it uses to itself: the buffer may go on, or end, before it is done.
+void FtsBuffer::LeaveToCut(std::int64_t id, const std::shared_ptr<const std::string>& body) {
+  const auto text = std::make_shared<NewText>();
+  text->body = body;
+  text->columns = UnpackTexts(schema_, *body);
+  cutting_bytes_ += body->size();
+  cutting_.push_back({id, text, work_->Add([text, cutters = cutters_] {
+                        text->words = cutters->Cut(text->columns);
+                      })});
+}
+
+// Takes texts that have been cut into the lists, in order, and all that are left if `all`. What the
+// lists do not take is for FTS5.
+void FtsBuffer::TakeCut(bool all) {
+  while (!cutting_.empty() && (all || work_->IsDone(*cutting_.front().task))) {
+    const Cutting next = std::move(cutting_.front());
+    cutting_.pop_front();
+    cutting_bytes_ -= next.text->body->size();
+    work_->Finish(next.task);
+    if (next.text->words.sizes.empty()) {
+      RunBody(body_.insert, next.id, *next.text->body);
+    } else {
+      AddToLists(next.id, next.text->words);
+    }
+  }
+}
+
+void FtsBuffer::AddToLists(std::int64_t id, const CutText& words) {
+  lists_.Add(id, words);
   ++listed_;
   std::string sizes;
-  for (std::size_t i = 0; i < words.size(); ++i) {
-    listed_words_[i] += words[i];
-    AppendVarint(&sizes, words[i]);
+  for (std::size_t i = 0; i < words.sizes.size(); ++i) {
+    listed_words_[i] += words.sizes[i];
+    AppendVarint(&sizes, words.sizes[i]);
   }
   db_->Prepare("INSERT INTO body_docsize(id,sz) VALUES(?1,?2)")
       .Bind(1, id)
       .BindBlob(2, sizes)
       .Run();
-  return true;
 }
 
 // Before anything else is done to these rows: a segment holds against those written before.
 void FtsBuffer::FlushLists() {
+  TakeCut(/*all=*/true);
   if (listed_ == 0) return;
   WriteOutFts(db_, kBody);
   AddToTotals(db_, kBody, listed_, listed_words_);
@@ -161,6 +199,9 @@ std::int64_t FtsBuffer::WriteSegment(FtsStructure* structure) {
 }
 
 void FtsBuffer::ClearLists() {
+  for (const Cutting& cutting : cutting_) work_->Drop(cutting.task);
+  cutting_.clear();
+  cutting_bytes_ = 0;
   lists_.Clear();
   last_listed_ = 0;
   listed_ = 0;

@@ -3,15 +3,17 @@
 // FTS5 writes a whole segment each time row ids do not ascend, so changes in arbitrary order would
 // cost one segment each. They are collected here and applied in order of row ids; a row that
 // changes several times is written once. New rows, whose ids ascend by themselves, do not wait:
-// cutting them into words is most of the work of a first index, and others can go on meanwhile. The
-// words of their full texts make up segments of our own, see word_lists.h.
+// cutting them into words is most of the work of a first index, and is left as side work while
+// others go on. The words of their full texts make up segments of our own, see word_lists.h.
 
 #ifndef QUARRY_DAEMONS_TARNELASTICD_FTS_BUFFER_H_
 #define QUARRY_DAEMONS_TARNELASTICD_FTS_BUFFER_H_
 
 #include <cstddef>
 #include <cstdint>
+#include <deque>
 #include <map>
+#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -21,7 +23,9 @@
 #include "daemons/tarnelasticd/document.h"
 #include "daemons/tarnelasticd/fts_structure.h"
 #include "daemons/tarnelasticd/schema.h"
+#include "daemons/tarnelasticd/side_work.h"
 #include "daemons/tarnelasticd/text_tokenizer.h"
+#include "daemons/tarnelasticd/word_cutter.h"
 #include "daemons/tarnelasticd/word_lists.h"
 
 namespace quarry::engine {
@@ -31,11 +35,15 @@ namespace quarry::engine {
 class FtsBuffer {
  public:
   // What is given must outlive the buffer.
-  FtsBuffer(const Schema& schema, Database* db, const TextTokenizer& tokenizer);
+  FtsBuffer(const Schema& schema, Database* db, const TextTokenizer& tokenizer, SideWork* work);
+  ~FtsBuffer();
+  FtsBuffer(const FtsBuffer&) = delete;
+  FtsBuffer& operator=(const FtsBuffer&) = delete;
 
-  // Put in what has a number above all others'. A full text is packed, and not empty.
+  // Put in what has a number above all others'. A full text is packed, and not empty. Throws also
+  // what has made side work fail, as Flush() does.
   void InsertLabels(std::int64_t doc, const Labels& labels);
-  void InsertBody(std::int64_t text, std::string_view body);
+  void InsertBody(std::int64_t text, const std::shared_ptr<const std::string>& body);
   // A full text changes from `old` to `now` (both packed); empty stands for none.
   void ChangeBody(std::int64_t text, std::string old, std::string now);
   // To be called for each document that gets a full text, loses one or gets another.
@@ -66,7 +74,20 @@ class FtsBuffer {
 
   void Run(const std::string& sql, std::int64_t id, const std::vector<std::string_view>& texts);
   void RunBody(const std::string& sql, std::int64_t id, std::string_view body);
-  bool AddToLists(std::int64_t id, std::string_view body);
+  // A new text, and its words once the task is done.
+  struct NewText {
+    std::shared_ptr<const std::string> body;
+    std::vector<std::string_view> columns;  // in body
+    CutText words;
+  };
+  struct Cutting {
+    std::int64_t id;
+    std::shared_ptr<NewText> text;
+    std::shared_ptr<SideWork::Task> task;
+  };
+  void LeaveToCut(std::int64_t id, const std::shared_ptr<const std::string>& body);
+  void TakeCut(bool all);
+  void AddToLists(std::int64_t id, const CutText& words);
   void FlushLists();
   std::int64_t WriteSegment(FtsStructure* structure);
   void MergeSegments(const FtsStructure& structure, std::int64_t written);
@@ -86,8 +107,12 @@ class FtsBuffer {
   std::size_t bytes_ = 0;
 
   const bool has_own_segments_;  // whether the tables behind FTS5 are understood
+  SideWork* const work_;
+  const std::shared_ptr<WordCutters> cutters_;
+  std::deque<Cutting> cutting_;  // on their way to lists_
+  std::size_t cutting_bytes_ = 0;
   WordLists lists_;
-  std::int64_t last_listed_ = 0;
+  std::int64_t last_listed_ = 0;             // also of those on their way
   std::uint64_t listed_ = 0;                 // rows in lists_
   std::vector<std::uint64_t> listed_words_;  // by columns
 };

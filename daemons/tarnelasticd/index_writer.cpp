@@ -57,7 +57,7 @@ IndexWriter::IndexWriter(const std::string& database_path, std::shared_ptr<const
       limits_(limits),
       db_(database_path),
       tokenizer_(db_.handle()),
-      buffer_(*schema_, &db_, tokenizer_),
+      buffer_(*schema_, &db_, tokenizer_, &side_work_),
       texts_(&db_, kTexts, &side_work_),
       attributes_(&db_, kAttributes, &side_work_),
       sharing_(&db_),
@@ -235,8 +235,9 @@ void IndexWriter::Insert(StoredDocument document) {
   buffer_.NoteText(id);
   const TextSharing::Use use = sharing_.Join(id, document.body, [this] { return NewId(); });
   if (!use.is_first) return;
-  buffer_.InsertBody(use.text, document.body);
-  texts_.Write(use.text, std::move(document.body));
+  const auto body = std::make_shared<const std::string>(std::move(document.body));
+  buffer_.InsertBody(use.text, body);
+  texts_.Write(use.text, body);
 }
 
 void IndexWriter::Replace(const Found& old, StoredDocument document) {

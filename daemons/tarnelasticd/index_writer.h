@@ -118,8 +118,8 @@ class IndexWriter {
   WriterLimits limits_;
   Database db_;
   TextTokenizer tokenizer_;
-  FtsBuffer buffer_;
   SideWork side_work_;
+  FtsBuffer buffer_;
   TextStore texts_;
   TextStore attributes_;
   TextSharing sharing_;

@@ -143,7 +143,7 @@ TextStore::Rows::iterator TextStore::Load(std::int64_t id) {
     ForEachText(key, bytes, [&row](std::int64_t at, std::string_view text) {
       if (at >= row.end) FailDamaged();
       row.bytes += CostOf(text);
-      row.texts.emplace(at, text);
+      row.texts.emplace(at, std::make_shared<const std::string>(text));
       return true;
     });
   }
@@ -206,19 +206,27 @@ std::string TextStore::Read(std::int64_t id) {
   if (row == rows_.end()) return reader_.Read(id);
   const Texts& texts = TextsOf(row->second);
   const auto text = texts.find(id);
-  return text == texts.end() ? std::string() : text->second;
+  return text == texts.end() ? std::string() : *text->second;
 }
 
 void TextStore::Write(std::int64_t id, std::string text) {
+  Write(id, std::make_shared<const std::string>(std::move(text)));
+}
+
+void TextStore::Write(std::int64_t id, std::shared_ptr<const std::string> text) {
   if (open_bytes_ >= kOpenBytes) Flush();
   if (!sealed_.empty()) PlaceSealed();
   Row& row = Open(id)->second;
   if (row.sealed) Unseal(&row);
-  std::string& kept = row.texts[id];
-  row.bytes += CostOf(text) - CostOf(kept);
-  open_bytes_ += CostOf(text) - CostOf(kept);
-  kept = std::move(text);
-  if (kept.empty()) row.texts.erase(id);
+  const auto kept = row.texts.find(id);
+  const std::size_t freed = kept == row.texts.end() ? 0 : CostOf(*kept->second);
+  row.bytes += CostOf(*text) - freed;
+  open_bytes_ += CostOf(*text) - freed;
+  if (!text->empty()) {
+    row.texts.insert_or_assign(id, std::move(text));
+  } else if (kept != row.texts.end()) {
+    row.texts.erase(kept);
+  }
 }
 
 // A row that has grown becomes several. A text that fills one has one of its own, so that its
@@ -232,10 +240,10 @@ std::vector<TextStore::Packed> TextStore::Pack(const Texts& texts, std::size_t m
     const std::int64_t first = text->first;
     bytes.clear();
     for (std::int64_t last = first; text != texts.end() && bytes.size() < row_bytes; ++text) {
-      if (!bytes.empty() && text->second.size() >= row_bytes) break;
+      if (!bytes.empty() && text->second->size() >= row_bytes) break;
       AppendNumber(&bytes, static_cast<std::uint64_t>(text->first - last));
-      AppendNumber(&bytes, text->second.size());
-      bytes += text->second;
+      AppendNumber(&bytes, text->second->size());
+      bytes += *text->second;
       last = text->first;
     }
     packed.push_back({first, Compress(bytes)});

@@ -77,6 +77,8 @@ class TextStore {
   // Replaces a text; an empty one is none. May write out what is open. Throws also what has made
   // side work fail.
   void Write(std::int64_t id, std::string text);
+  // The same for a text that others use as well.
+  void Write(std::int64_t id, std::shared_ptr<const std::string> text);
 
   // Writes everything out. To be called before a commit. Throws as Write() does.
   void Flush();
@@ -84,7 +86,7 @@ class TextStore {
   void Clear();
 
  private:
-  using Texts = std::map<std::int64_t, std::string>;
+  using Texts = std::map<std::int64_t, std::shared_ptr<const std::string>>;
   struct Packed {
     std::int64_t first;
     std::string bytes;

@@ -2,7 +2,7 @@
 // segment.
 //
 // FTS5 looks each word of a text up in one large table of its own, which costs a miss of the
-// processor's caches or two for every word. Here the words of one text are sorted out first, in
+// processor's caches or two for every word. Here the words of one text come sorted out, which takes
 // little memory, so that the large table is asked once for each different word of a text.
 
 #ifndef QUARRY_DAEMONS_TARNELASTICD_WORD_LISTS_H_
@@ -16,20 +16,15 @@
 #include <string_view>
 #include <vector>
 
-#include "daemons/tarnelasticd/text_tokenizer.h"
+#include "daemons/tarnelasticd/word_cutter.h"
 
 namespace quarry::engine {
 
 // One thread at a time.
 class WordLists {
  public:
-  // `tokenizer` must outlive the lists.
-  explicit WordLists(const TextTokenizer& tokenizer);
-
-  // Adds the text `id`, which must be above all that were added since Clear(), cut into its
-  // columns. Returns how many words each column has, or nothing, with nothing added, when the text
-  // is too long, or one of its words: those are for FTS5, which takes any.
-  std::vector<std::size_t> Add(std::int64_t id, const std::vector<std::string_view>& columns);
+  // Adds the text `id`, which must be above all that were added since Clear().
+  void Add(std::int64_t id, const CutText& text);
 
   bool empty() const { return words_.empty(); }
   // Roughly the memory that is held.
@@ -43,18 +38,7 @@ class WordLists {
 
   void Clear();
 
-  static constexpr std::size_t kMaxText = std::size_t{4} << 20;
-  static constexpr std::size_t kMaxWord = 1000;
-
  private:
-  // A word of the text at hand.
-  struct Local {
-    std::uint32_t begin;  // in folded_
-    std::uint32_t size;
-    std::uint64_t hash;
-    std::uint32_t slot;  // in local_slots_
-    std::uint32_t count;
-  };
   // A word of all texts. Its list lies in blocks, each twice as large as the one before and with
   // the address of the next one behind its end.
   struct Word {
@@ -73,31 +57,12 @@ class WordLists {
     std::uint32_t word;  // its number from 1; 0: free
   };
 
-  void TakeWord(std::string_view word);
-  void GrowLocal();
-  void ClearLocal();
-  void PlacePositions();
-  void Prefetch(std::size_t local) const;
-  void Store(std::int64_t id, const std::vector<std::size_t>& starts);
-  std::size_t EncodePositions(const std::uint32_t* places, std::size_t count,
-                              const std::vector<std::size_t>& starts);
+  void Prefetch(const std::vector<CutText::Word>& words, std::size_t next) const;
   Word& Find(std::string_view word, std::uint64_t hash);
   void Grow();
   char* Allocate(std::size_t bytes);
   void Append(Word* word, const char* bytes, std::size_t size);
   static void CopyList(const Word& word, std::string* list);
-
-  const TextTokenizer& tokenizer_;
-  const std::uint64_t seed_;
-
-  std::string folded_;  // the words of the text at hand
-  std::vector<Local> locals_;
-  std::vector<std::uint32_t> local_slots_;  // numbers of locals_ from 1; 0: free
-  std::vector<std::uint32_t> stream_;       // the text as numbers of locals_
-  std::vector<std::uint32_t> places_;       // where in stream_ each word stands, word by word
-  std::vector<std::uint32_t> place_ends_;
-  std::string encoded_;
-  bool has_long_word_ = false;
 
   std::vector<Word> words_;
   std::vector<Slot> slots_;

@@ -5,11 +5,13 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <atomic>
 #include <cmath>
 #include <iterator>
 #include <map>
 #include <memory>
 #include <random>
+#include <thread>
 #include <vector>
 
 #include "common/json.h"
@@ -68,7 +70,7 @@ class FtsBufferTest : public testing::Test {
     tokenizer_.reset();
     db_ = Connect("tested");
     tokenizer_ = std::make_unique<TextTokenizer>(db_->handle());
-    buffer_ = std::make_unique<FtsBuffer>(schema_, db_.get(), *tokenizer_);
+    buffer_ = std::make_unique<FtsBuffer>(schema_, db_.get(), *tokenizer_, &work_);
   }
 
   void Begin() {
@@ -89,7 +91,7 @@ class FtsBufferTest : public testing::Test {
   }
 
   void Insert(std::int64_t id, const Columns& columns) {
-    buffer_->InsertBody(id, Pack(columns));
+    buffer_->InsertBody(id, std::make_shared<const std::string>(Pack(columns)));
     RunModel("INSERT INTO body(rowid,t0,t1,t2) VALUES(?1,?2,?3,?4)", id, columns);
     texts_[id] = columns;
   }
@@ -153,6 +155,7 @@ class FtsBufferTest : public testing::Test {
   std::unique_ptr<Database> model_;
   std::unique_ptr<Database> db_;
   std::unique_ptr<TextTokenizer> tokenizer_;
+  SideWork work_;
   std::unique_ptr<FtsBuffer> buffer_;
   std::map<std::int64_t, Columns> texts_;
   std::map<std::int64_t, Columns> before_;
@@ -310,16 +313,93 @@ TEST_F(FtsBufferTest, TellsMemory) {
   Begin();
   EXPECT_EQ(buffer_->list_bytes(), 0U);
   Insert(1, {Text(3000, 3000), "", ""});
+  work_.RunAll();
+  Insert(2, {"one", "", ""});
   EXPECT_GT(buffer_->list_bytes(), 3000U);
   buffer_->Flush();
   EXPECT_EQ(buffer_->list_bytes(), 0U);
   Rollback();
 }
 
+// Whoever cuts texts, in whatever order they are done.
+TEST_F(FtsBufferTest, OthersCutTheSameWords) {
+  std::atomic<bool> is_over{false};
+  std::vector<std::thread> helpers;
+  for (int i = 0; i < 2; ++i) {
+    helpers.emplace_back([&] {
+      while (!is_over) work_.RunAll();
+    });
+  }
+  std::int64_t id = 0;
+  for (int round = 0; round < 4; ++round) {
+    Begin();
+    for (int i = 0; i < 60; ++i) {
+      const std::string long_word(i % 20 == 7 ? 2000 : 20, 'x');
+      Insert(++id, {Text(i % 15 == 0 ? 9000 : 90, 3000), long_word, Text(5, 10)});
+    }
+    Remove(id - 3);
+    Change(id - 5, {"one two", "", Text(20, 50)});
+    if (round == 2) {
+      Rollback();
+    } else {
+      Commit();
+    }
+  }
+  is_over = true;
+  for (std::thread& helper : helpers) helper.join();
+  ExpectSame();
+}
+
+TEST_F(FtsBufferTest, ForgetsWhatIsRolledBackWhileItIsCut) {
+  for (const bool is_cut : {false, true}) {
+    Begin();
+    Insert(1, {"one", "", ""});
+    if (is_cut) work_.RunAll();
+    Rollback();
+    work_.RunAll();
+    Begin();
+    Commit();
+    ExpectSame();
+  }
+  Begin();
+  Insert(1, {"other", "", ""});
+  Commit();
+  ExpectSame();
+}
+
+TEST_F(FtsBufferTest, TellsWhatHasFailedBesideIt) {
+  for (const bool by_flush : {false, true}) {
+    Begin();
+    Insert(1, {"one", "", ""});
+    sqlite3_hard_heap_limit64(1);
+    work_.RunAll();
+    sqlite3_hard_heap_limit64(0);
+    if (by_flush) {
+      EXPECT_THROW(buffer_->Flush(), Error);
+    } else {
+      EXPECT_THROW(Insert(2, {"two", "", ""}), Error);
+    }
+    Rollback();
+  }
+  Begin();
+  Insert(1, {"one two", "", ""});
+  Commit();
+  ExpectSame();
+}
+
+TEST_F(FtsBufferTest, MayEndBeforeItsWork) {
+  Begin();
+  Insert(1, {"one", "", ""});
+  const auto task = work_.Add([] {});
+  buffer_.reset();
+  work_.Finish(task);
+  work_.RunAll();
+}
+
 // Another library's tables are not touched.
 TEST_F(FtsBufferTest, LeavesToFts5WhatIsNotUnderstood) {
   db_->Execute("UPDATE body_config SET v=5 WHERE k='version'");
-  buffer_ = std::make_unique<FtsBuffer>(schema_, db_.get(), *tokenizer_);
+  buffer_ = std::make_unique<FtsBuffer>(schema_, db_.get(), *tokenizer_, &work_);
   db_->Execute("UPDATE body_config SET v=4 WHERE k='version'");
   Begin();
   Insert(1, {"one", "", ""});

@@ -1,4 +1,4 @@
-// Lists of words against a model that writes down every place.
+// Texts that are cut into words, and lists of these, against a model that writes down every place.
 
 #include "daemons/tarnelasticd/word_lists.h"
 
@@ -30,11 +30,14 @@ class WordListsTest : public testing::Test {
     test::WriteFile(dir_ / "db", "");
     db_ = std::make_unique<Database>(dir_ / "db");
     tokenizer_ = std::make_unique<TextTokenizer>(db_->handle());
-    lists_ = std::make_unique<WordLists>(*tokenizer_);
+    cutter_ = std::make_unique<WordCutter>(*tokenizer_);
   }
 
   std::vector<std::size_t> Add(std::int64_t id, const std::vector<std::string>& columns) {
-    return lists_->Add(id, {columns.begin(), columns.end()});
+    CutText cut;
+    cutter_->Cut({columns.begin(), columns.end()}, &cut);
+    lists_.Add(id, cut);
+    return cut.sizes;
   }
 
   void AddToModel(std::int64_t id, const std::vector<std::string>& columns) {
@@ -68,7 +71,7 @@ class WordListsTest : public testing::Test {
   Places Read() const {
     Places places;
     std::string last;
-    lists_->ForEach([&](std::string_view word, std::string_view list) {
+    lists_.ForEach([&](std::string_view word, std::string_view list) {
       EXPECT_TRUE(places.empty() || last < word);
       last = word;
       const char* at = list.data();
@@ -89,50 +92,51 @@ class WordListsTest : public testing::Test {
   test::TempDir dir_;
   std::unique_ptr<Database> db_;
   std::unique_ptr<TextTokenizer> tokenizer_;
-  std::unique_ptr<WordLists> lists_;
+  std::unique_ptr<WordCutter> cutter_;
+  WordLists lists_;
   Places model_;
 };
 
 TEST_F(WordListsTest, KeepsWordsWithTheirPlaces) {
-  EXPECT_TRUE(lists_->empty());
+  EXPECT_TRUE(lists_.empty());
   EXPECT_THAT(Add(3, {"One two, one", "", "TWO"}), ElementsAre(3, 0, 1));
-  EXPECT_FALSE(lists_->empty());
+  EXPECT_FALSE(lists_.empty());
   EXPECT_THAT(Add(9, {"", "two", ""}), ElementsAre(0, 1, 0));
   const Places expected = {{"one", {{3, {{0, 0}, {0, 2}}}}},
                            {"two", {{3, {{0, 1}, {2, 0}}}, {9, {{1, 0}}}}}};
   EXPECT_EQ(Read(), expected);
-  lists_->Clear();
-  EXPECT_TRUE(lists_->empty());
-  EXPECT_EQ(lists_->bytes(), 0U);
+  lists_.Clear();
+  EXPECT_TRUE(lists_.empty());
+  EXPECT_EQ(lists_.bytes(), 0U);
   EXPECT_EQ(Read(), Places());
 }
 
 TEST_F(WordListsTest, CountsWordsOfTextsWithoutAny) {
   EXPECT_THAT(Add(1, {"", "-- "}), ElementsAre(0, 0));
-  EXPECT_TRUE(lists_->empty());
+  EXPECT_TRUE(lists_.empty());
 }
 
 TEST_F(WordListsTest, LeavesLongWordsAndTextsToOthers) {
-  EXPECT_THAT(Add(1, {"short " + std::string(WordLists::kMaxWord + 1, 'a')}), IsEmpty());
-  EXPECT_TRUE(lists_->empty());
-  EXPECT_THAT(Add(2, {std::string(WordLists::kMaxText, ' '), "a"}), IsEmpty());
-  EXPECT_TRUE(lists_->empty());
-  EXPECT_THAT(Add(3, {std::string(WordLists::kMaxWord, 'a')}), ElementsAre(1));
-  EXPECT_THAT(Add(4, {std::string(WordLists::kMaxText - 1, ' ') + "b"}), ElementsAre(1));
-  const Places expected = {{std::string(WordLists::kMaxWord, 'a'), {{3, {{0, 0}}}}},
+  EXPECT_THAT(Add(1, {"short " + std::string(WordCutter::kMaxWord + 1, 'a')}), IsEmpty());
+  EXPECT_TRUE(lists_.empty());
+  EXPECT_THAT(Add(2, {std::string(WordCutter::kMaxText, ' '), "a"}), IsEmpty());
+  EXPECT_TRUE(lists_.empty());
+  EXPECT_THAT(Add(3, {std::string(WordCutter::kMaxWord, 'a')}), ElementsAre(1));
+  EXPECT_THAT(Add(4, {std::string(WordCutter::kMaxText - 1, ' ') + "b"}), ElementsAre(1));
+  const Places expected = {{std::string(WordCutter::kMaxWord, 'a'), {{3, {{0, 0}}}}},
                            {"b", {{4, {{0, 0}}}}}};
   EXPECT_EQ(Read(), expected);
 }
 
 TEST_F(WordListsTest, TellsMemory) {
-  const std::size_t before = lists_->bytes();
+  const std::size_t before = lists_.bytes();
   for (int i = 1; i <= 300; ++i) {
     std::string text;
     for (int j = 0; j < 300; ++j) text += "w" + std::to_string(300 * i + j) + " ";
     Add(i, {text});
   }
-  EXPECT_GT(lists_->bytes(), before + 90000 * 20);
-  EXPECT_LT(lists_->bytes(), before + 90000 * 200);
+  EXPECT_GT(lists_.bytes(), before + 90000 * 20);
+  EXPECT_LT(lists_.bytes(), before + 90000 * 200);
 }
 
 TEST_F(WordListsTest, HoldsWhatTheModelDoes) {
