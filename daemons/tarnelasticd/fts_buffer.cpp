@@ -6,6 +6,7 @@
 
 #include "daemons/tarnelasticd/engine_error.h"
 #include "daemons/tarnelasticd/fts_number.h"
+#include "daemons/tarnelasticd/segment_merger.h"
 #include "daemons/tarnelasticd/segment_writer.h"
 #include "daemons/tarnelasticd/text_lengths.h"
 
@@ -19,8 +20,6 @@ constexpr std::size_t kCuttingBytes = std::size_t{4} << 20;
 
 constexpr const char* kBody = "body";
 constexpr char kMainIndex = '0';
-// So many of a level become one. A search looks into each.
-constexpr std::size_t kManySegments = 8;
 // Leaves that are merged at least, so that small segments do not come to be many.
 constexpr std::int64_t kLeastMerge = 16;
 
@@ -159,11 +158,13 @@ void FtsBuffer::FlushLists() {
   if (!structure) throw Error(kDamagedIndex, "The full text is not as it should be");
   const std::int64_t leaves = lists_.empty() ? 0 : WriteSegment(&*structure);
   ClearLists();
+  if (leaves > 0) MergeFullLevels(db_, kBody, &*structure);
   ForgetFts(db_);
   if (leaves > 0) MergeSegments(*structure, leaves);
 }
 
-// FTS5 merges of itself when it writes. It is asked for as much work as it would do then, so that
+// What is too large to be merged at once is left to FTS5, which merges of itself when it writes. It
+// is asked for as much work as it would do then, so that
 // no commit waits for all of it.
 void FtsBuffer::MergeSegments(const FtsStructure& structure, std::int64_t written) {
   const bool is_due = std::any_of(

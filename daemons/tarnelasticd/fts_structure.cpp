@@ -18,8 +18,6 @@ constexpr std::int64_t kMaxSegmentId = (std::int64_t{1} << 16) - 1;
 constexpr std::int64_t kMaxLeaf = (std::int64_t{1} << 31) - 1;
 // FTS5 takes no more.
 constexpr std::int64_t kMostSegments = 2000;
-// More than a table of any size comes to by itself.
-constexpr std::size_t kManyLevels = 8;
 
 bool IsWithin(std::int64_t value, std::int64_t most) {
   return value >= 0 && value <= most;
@@ -46,17 +44,6 @@ void WriteRecord(Database* db, const std::string& table, std::int64_t id,
       .Run();
 }
 
-void DropEmptyLevels(FtsStructure* structure) {
-  std::vector<FtsStructure::Level>& levels = structure->levels;
-  while (levels.size() > kManyLevels) {
-    const auto empty =
-        std::find_if(levels.begin(), levels.end(),
-                     [](const FtsStructure::Level& level) { return level.segments.empty(); });
-    if (empty == levels.end()) return;
-    levels.erase(empty);
-  }
-}
-
 }  // namespace
 
 std::int64_t FtsStructure::FreeSegment() const {
@@ -67,6 +54,14 @@ std::int64_t FtsStructure::FreeSegment() const {
   std::int64_t free = 1;
   while (used.count(free) > 0) ++free;
   return free <= kMostSegments ? free : 0;
+}
+
+std::int64_t FtsStructure::NextSegment() const {
+  std::int64_t last = 0;
+  for (const Level& level : levels) {
+    for (const Segment& segment : level.segments) last = std::max(last, segment.id);
+  }
+  return last < kMostSegments ? last + 1 : FreeSegment();
 }
 
 std::optional<FtsStructure> ReadStructure(Database* db, const std::string& table) {
@@ -143,18 +138,6 @@ void AddToTotals(Database* db, const std::string& table, std::uint64_t rows,
   AppendVarint(&record, take() + rows);
   for (const std::uint64_t count : words) AppendVarint(&record, take() + count);
   WriteRecord(db, table, kTotalsRow, record);
-}
-
-// FTS5 puts the one segment on a new level each time and never gives one up. The more there are the
-// more it merges with each write, and with 2000 it takes the table for damaged.
-void MergeAllSegments(Database* db, const std::string& table) {
-  db->Execute("INSERT INTO " + table + "(" + table + ") VALUES('optimize')");
-  WriteOutFts(db, table);
-  std::optional<FtsStructure> structure = ReadStructure(db, table);
-  if (!structure || structure->levels.size() <= kManyLevels) return;
-  DropEmptyLevels(&*structure);
-  WriteStructure(db, table, *structure);
-  ForgetFts(db);
 }
 
 }  // namespace quarry::engine

@@ -25,6 +25,8 @@ struct FtsStructure {
 
   // A number that no segment has, or 0 when there are as many as can be.
   std::int64_t FreeSegment() const;
+  // The same behind all others where there is one: what is written there is appended to the table.
+  std::int64_t NextSegment() const;
 };
 
 // Nothing where the tables are of a form that is not understood here, as those of a library to come
@@ -45,9 +47,6 @@ void WriteStructure(Database* db, const std::string& table, const FtsStructure& 
 // WriteStructure().
 void AddToTotals(Database* db, const std::string& table, std::uint64_t rows,
                  const std::vector<std::uint64_t>& words);
-
-// Has FTS5 make one segment of all, which writes the whole table anew.
-void MergeAllSegments(Database* db, const std::string& table);
 
 }  // namespace quarry::engine
 

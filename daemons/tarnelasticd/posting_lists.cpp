@@ -88,7 +88,8 @@ double WeighPositions(std::string_view positions, const std::vector<double>& wei
 class PostingLists::Gatherer {
  public:
   // What lies behind `last_id` has been deleted, or is damage that must not take memory.
-  Gatherer(const std::vector<double>& weights, std::int64_t last_id, const Visitor& visit)
+  // Without weights, how often a document has a word is not counted.
+  Gatherer(const std::vector<double>* weights, std::int64_t last_id, const Visitor& visit)
       : weights_(weights), last_id_(last_id), visit_(visit) {
     batch_.reserve(kBatch);
   }
@@ -108,7 +109,8 @@ class PostingLists::Gatherer {
       settled_ids_.push_back(entry.id);
     }
     if (entry.positions.empty()) return;
-    batch_.push_back({entry.id, static_cast<float>(WeighPositions(entry.positions, weights_))});
+    const double weight = weights_ == nullptr ? 1 : WeighPositions(entry.positions, *weights_);
+    batch_.push_back({entry.id, static_cast<float>(weight)});
     if (batch_.size() == kBatch) Flush();
   }
 
@@ -118,7 +120,7 @@ class PostingLists::Gatherer {
   }
 
  private:
-  const std::vector<double>& weights_;
+  const std::vector<double>* const weights_;
   const std::int64_t last_id_;
   const Visitor& visit_;
   std::vector<Posting> batch_;
@@ -157,7 +159,7 @@ bool PostingLists::IsWorthMerging() const {
 
 void PostingLists::ForEach(std::string_view word, bool prefix, const Visitor& visit) {
   const std::string key = kMainIndex + std::string(word);
-  Gatherer gatherer(weights_, last_id_, visit);
+  Gatherer gatherer(&weights_, last_id_, visit);
   if (prefix) {
     GatherBeginning(key, &gatherer, [](const std::string&) {});
   } else {
@@ -182,7 +184,7 @@ void PostingLists::CountWords(
   const Visitor add = [&](const std::vector<Posting>& some) {
     for (const Posting& posting : some) rows += count_of(posting.id);
   };
-  Gatherer gatherer(weights_, last_id_, add);
+  Gatherer gatherer(nullptr, last_id_, add);
   GatherBeginning(std::string(1, kMainIndex), &gatherer, [&](const std::string& key) {
     gatherer.Flush();
     if (rows > 0) visit(std::string_view(key).substr(1), rows);

@@ -9,7 +9,6 @@ namespace quarry::engine {
 namespace {
 
 constexpr std::size_t kHeader = 4;
-constexpr int kLeafBits = 37;  // the number of a leaf, with what marks other kinds of rows
 constexpr std::size_t kLeavesBetweenChecks = 64;
 // Far more than a word's positions in one text of the largest size can take.
 constexpr std::uint64_t kMaxPositions = std::uint64_t{1} << 30;
@@ -25,7 +24,7 @@ std::size_t Number16(std::string_view leaf, std::size_t at) {
 
 }  // namespace
 
-std::uint64_t TakeVarint(const char** at, const char* end) {
+std::uint64_t TakeLongVarint(const char** at, const char* end) {
   std::uint64_t value = 0;
   for (int i = 0; i < 9; ++i) {
     if (*at >= end) FailDamaged();
@@ -118,6 +117,7 @@ void SegmentReader::ReadKey() {
   key_.append(at_, static_cast<std::size_t>(size));
   at_ += size;
   row_ = 0;
+  is_first_ = true;
 }
 
 // Where the list at hand ends on this leaf, or the leaf.
@@ -137,6 +137,7 @@ bool SegmentReader::TakeEntry(Entry* entry) {
   is_first_ = false;
   const std::uint64_t size = TakeNumber();
   entry->id = row_;
+  entry->is_marked = (size & 1) != 0;
   entry->positions = TakePositions(size >> 1);
   return true;
 }

@@ -32,15 +32,28 @@ struct Segment {
   std::int64_t last_leaf = 0;
 };
 
+// In the id of a segment's row in TABLE_data the segment's number stands before so many bits, which
+// are the number of a leaf, with what marks other kinds of rows.
+constexpr int kLeafBits = 37;
+
 // One document in a word's list.
 struct Entry {
   std::int64_t id = 0;
   std::string_view positions;  // empty when the document no longer has the word
+  bool is_marked = false;      // whether the row was deleted before
 };
+
+// What TakeVarint() does where the number has several bytes, or none is left.
+std::uint64_t TakeLongVarint(const char** at, const char* end);
 
 // Numbers of up to nine bytes, seven bits in each of the first eight, the highest first. Throws
 // Error kDamagedIndex when `bytes` end within the number.
-std::uint64_t TakeVarint(const char** at, const char* end);
+inline std::uint64_t TakeVarint(const char** at, const char* end) {
+  if (*at < end && static_cast<unsigned char>(**at) < 0x80) {
+    return static_cast<unsigned char>(*(*at)++);
+  }
+  return TakeLongVarint(at, end);
+}
 
 // Goes through a segment's words once. One thread at a time, as its database. All that fails throws
 // Error as Database does.
@@ -62,16 +75,19 @@ class SegmentReader {
   template <typename Visit>
   void ReadList(Visit visit) {
     Entry entry;
-    is_first_ = true;
     while (TakeEntry(&entry)) visit(entry);
   }
+  // The same one by one: false behind the last one. Views are valid until the next call.
+  bool TakeEntry(Entry* entry);
+
+  // The leaf at hand. Those before it are not read again.
+  std::int64_t leaf() const { return next_leaf_ - 1 - (segment_.id << kLeafBits); }
 
  private:
   std::int64_t FindLeaf(std::string_view key);
   bool NextLeaf();
   void CheckAllRead() const;
   void ReadKey();
-  bool TakeEntry(Entry* entry);
   std::string_view TakePositions(std::uint64_t size);
   const char* Limit() const;
   std::uint64_t TakeNumber() { return TakeVarint(&at_, Limit()); }

@@ -11,6 +11,8 @@
 #include <string_view>
 
 #include "daemons/tarnelasticd/database.h"
+#include "daemons/tarnelasticd/doclist_index.h"
+#include "daemons/tarnelasticd/segment_reader.h"
 
 namespace quarry::engine {
 
@@ -21,32 +23,48 @@ class SegmentWriter {
   SegmentWriter(Database* db, const std::string& table, std::int64_t segment);
 
   // Words must come in order of their bytes; `key` has FTS5's mark of the main index before it, and
-  // at most half as many bytes as a leaf. A list is as WordLists says.
+  // at most kMaxKey bytes, or Error kDamagedIndex is thrown. A list is as WordLists says.
   void Add(std::string_view key, std::string_view list);
+
+  // The same document by document, which must ascend. Each word must have one.
+  void BeginWord(std::string_view key);
+  void AddEntry(const Entry& entry);
 
   // Writes what is left. Returns how many leaves the segment has, numbered from 1.
   std::int64_t Finish();
 
   // Bytes of a leaf: what FTS5 fills one up to where nobody says otherwise.
   static constexpr std::size_t kLeafBytes = 4050;
+  // No word of FTS5's is longer.
+  static constexpr std::size_t kMaxKey = 40000;
 
  private:
+  std::size_t Used() const { return static_cast<std::size_t>(at_ - leaf_bytes_.data()); }
   std::size_t Room() const;
-  void AddKey(std::string_view key);
+  void Put(std::uint64_t number);
+  void Put(std::string_view bytes);
   void AddPositions(std::string_view positions);
-  void AddPlace(std::string_view key);
+  void BeginPlace(std::string_view key);
+  void EndPlace();
+  void BeginLeaf();
   void EndLeaf();
 
   Statement leaves_;
   Statement places_;
+  DoclistIndex doclist_index_;
   const std::int64_t segment_;
   std::int64_t leaf_ = 1;
-  std::string contents_;  // of the leaf, with its header
-  std::string words_;     // where words begin on it
+  std::string leaf_bytes_;  // with room for any
+  char* at_ = nullptr;      // where the contents end
+  std::string words_;       // where words begin on the leaf
   std::size_t last_word_ = 0;
-  std::string key_;        // the last one
-  bool has_word_ = false;  // whether a word begins on the leaf
-  bool is_begun_ = false;  // whether a row id before its first word does
+  std::string key_;                // the last one
+  std::string place_;              // what leads to place_leaf_
+  std::int64_t place_leaf_ = 1;    // the last one on which a word begins
+  std::int64_t last_row_ = 0;      // of the list at hand
+  bool has_word_ = false;          // whether a word begins on the leaf
+  bool is_begun_ = false;          // whether a row id before its first word does
+  bool is_next_row_whole_ = true;  // as the first ones of a list and of a leaf are
 };
 
 }  // namespace quarry::engine

@@ -1,13 +1,14 @@
 #include "daemons/tarnelasticd/terms.h"
 
 #include <algorithm>
+#include <optional>
 #include <utility>
 
 #include "daemons/tarnelasticd/compression.h"
 #include "daemons/tarnelasticd/edit_distance.h"
 #include "daemons/tarnelasticd/engine_error.h"
-#include "daemons/tarnelasticd/fts_structure.h"
 #include "daemons/tarnelasticd/posting_lists.h"
+#include "daemons/tarnelasticd/segment_merger.h"
 #include "daemons/tarnelasticd/segment_writer.h"
 #include "daemons/tarnelasticd/text_sharing.h"
 #include "daemons/tarnelasticd/text_tokenizer.h"
@@ -208,17 +209,40 @@ class TermMerger {
   BlockWriter blocks_;
 };
 
-// What is in several pieces repeats their words, and is searched several times. Indexes into which
-// came what is in no order have half-filled pages.
-std::size_t PutTogether(Database* db) {
-  const PostingLists lists(db, "body", LastId(db), {}, [] {});
-  if (!lists.IsWorthMerging()) return 0;
-  MergeAllSegments(db, "body");
-  // Not for the few texts of a million documents, each time that there is one more of them.
-  if (LastId(db) <= lists.leaves() * kDocumentsPerLeaf) {
-    db->Execute("REINDEX docs;REINDEX text_hashes");
+// Reads the words of all texts, and makes them and those of names words to suggest.
+void ReadWords(Database* db, const std::vector<std::int32_t>& users) {
+  TermMerger terms(db);
+  PostingLists lists(db, "body", LastId(db), {}, [] {});
+  if (lists.IsReadable()) {
+    lists.CountWords([&users](std::int64_t text) { return users[static_cast<std::size_t>(text)]; },
+                     [&terms](std::string_view word, std::int64_t documents) {
+                       terms.AddOfTexts(word, documents);
+                     });
+  } else {
+    Statement words = db->Prepare("SELECT term,doc FROM body_terms ORDER BY term");
+    while (words.Step()) terms.AddOfTexts(words.Text(0), words.Int(1));
   }
-  return static_cast<std::size_t>(lists.leaves()) * SegmentWriter::kLeafBytes;
+  terms.Finish();
+}
+
+// The same while the texts' segments are merged. Returns whether that was done, not by FTS5.
+bool ReadWordsMerging(Database* db, const std::vector<std::int32_t>& users) {
+  std::optional<TermMerger> terms;
+  return MergeAllSegments(db, "body", [&](std::string_view word, const auto& texts) {
+    if (!terms) terms.emplace(db);
+    if (word.empty()) {
+      terms->Finish();
+      terms.reset();
+      return;
+    }
+    std::int64_t documents = 0;
+    for (const std::int64_t text : texts) {
+      // Behind the last text lies what is gone, or damage.
+      const auto index = static_cast<std::size_t>(text);
+      if (index < users.size()) documents += users[index];
+    }
+    terms->AddOfTexts(word, documents);
+  });
 }
 
 }  // namespace
@@ -234,21 +258,18 @@ std::size_t CollectTerms(Database* db) {
   db->Execute("DELETE FROM terms");
   // Makes FTS5 write out what it holds back.
   db->Prepare("SELECT 1 FROM body_terms LIMIT 1").Step();
-  const std::size_t merged = PutTogether(db);
-  TermMerger terms(db);
-  PostingLists lists(db, "body", LastId(db), {}, [] {});
-  if (lists.IsReadable()) {
-    const std::vector<std::int32_t> users = CountUsers(db);
-    lists.CountWords([&users](std::int64_t text) { return users[static_cast<std::size_t>(text)]; },
-                     [&terms](std::string_view word, std::int64_t documents) {
-                       terms.AddOfTexts(word, documents);
-                     });
-  } else {
-    Statement words = db->Prepare("SELECT term,doc FROM body_terms ORDER BY term");
-    while (words.Step()) terms.AddOfTexts(words.Text(0), words.Int(1));
+  const std::vector<std::int32_t> users = CountUsers(db);
+  const PostingLists lists(db, "body", LastId(db), {}, [] {});
+  // What is in several pieces repeats their words, and is searched several times.
+  const bool is_merged = lists.IsWorthMerging();
+  if (!is_merged || !ReadWordsMerging(db, users)) ReadWords(db, users);
+  if (!is_merged) return 0;
+  // Indexes into which came what is in no order have half-filled pages. Not for the few texts of a
+  // million documents, each time that there is one more of them.
+  if (LastId(db) <= lists.leaves() * kDocumentsPerLeaf) {
+    db->Execute("REINDEX docs;REINDEX text_hashes");
   }
-  terms.Finish();
-  return merged;
+  return static_cast<std::size_t>(lists.leaves()) * SegmentWriter::kLeafBytes;
 }
 
 bool HasTerms(Database* db) {

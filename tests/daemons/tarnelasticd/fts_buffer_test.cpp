@@ -16,6 +16,7 @@
 
 #include "common/json.h"
 #include "daemons/tarnelasticd/engine_error.h"
+#include "daemons/tarnelasticd/segment_merger.h"
 #include "daemons/tarnelasticd/varint.h"
 #include "tests/support/files.h"
 #include "tests/support/temp_dir.h"
