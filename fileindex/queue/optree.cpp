@@ -258,11 +258,11 @@ std::shared_ptr<OPNode> OPTree::NodeAt(std::string_view path) {
   return *node;
 }
 
-void OPTree::Attach(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& rec) {
-  if (std::exchange(rec->attached_, true)) return;
+void OPTree::Attach(const std::shared_ptr<OPNode>& node, std::shared_ptr<OP> rec) {
+  if (std::exchange(rec->attached_.is_done, true)) return;
   MakeRoom(ops);
   ops.push_back(rec);
-  node->ops.push_back(rec);
+  node->ops.push_back(std::move(rec));
   Ledger::Touch(*node);
 }
 

@@ -61,7 +61,14 @@ class QUARRY_EXPORT OP {
 
  private:
   friend class OPTree;
-  bool attached_ = false;  // it is in its tree's list and in a node's; here it takes up no room
+  // Whether it is in its tree's list and in a node's. A copy of the record is in neither.
+  struct Attachment {
+    Attachment() = default;
+    Attachment(const Attachment&) {}
+    Attachment& operator=(const Attachment&) { return *this; }
+    bool is_done = false;
+  };
+  Attachment attached_;  // here it takes up no room
 
  public:
   std::string src;   // OP_RENAME: the old full path
@@ -179,7 +186,7 @@ class QUARRY_EXPORT OPTree {
   void Insert(const std::shared_ptr<OPNode>& node, const EventLine& event, const Json::Value& data);
   void InsertAny(std::shared_ptr<OPNode> node, const EventLine& event, const Json::Value& data);
   std::shared_ptr<OPNode> NodeAt(std::string_view path);
-  void Attach(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& rec);
+  void Attach(const std::shared_ptr<OPNode>& node, std::shared_ptr<OP> rec);
   void Fold(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& rec,
             const RuleRow& rules);
   void FoldOnly(const std::shared_ptr<OPNode>& node, const RuleRow& rules);

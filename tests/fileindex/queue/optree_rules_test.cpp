@@ -341,6 +341,24 @@ TEST_F(RulesTest, RecordOfSeveralBitsIsAttachedOnce) {
   EXPECT_EQ(tree.ProcessOP([](std::shared_ptr<OP>) {}), 1);
 }
 
+TEST_F(RulesTest, CopiesOfARecordAreRecordsOfTheirOwn) {
+  OPTree tree(queue_.path());
+  const auto node = tree.GetNodeByPath("/a");
+  const auto rec = Pending(tree, node, OP_RENAME);
+  tree.HandleDelete(node, rec);
+  ASSERT_EQ(tree.ops.size(), 1u);
+  const auto copy = std::make_shared<OP>(*rec);
+  copy->op = OP_NONE;
+  rec->op = OP_RENAME;
+  tree.HandleModify(node, copy);
+  EXPECT_EQ(Texts(tree.ops), (Strings{"rename /a", "index /a"}));
+  // What is attached stays so, whatever it is told.
+  *copy = OP(node, OP_NONE);
+  tree.HandleModify(node, copy);
+  EXPECT_EQ(Texts(tree.ops), (Strings{"rename /a", "index /a"}));
+  EXPECT_EQ(node->ops, tree.ops);
+}
+
 TEST_F(RulesTest, RecordKeepsTheStandingThatItsLastBitGivesIt) {
   // The attributes are dropped for the pending configuration update, the deletion is not.
   const Json::Value change = Parsed(R"({"audio":true})");
