@@ -1,6 +1,8 @@
 #include "fileindex/queue/event_line.h"
 
 #include <charconv>
+#include <cstddef>
+#include <cstring>
 #include <system_error>
 
 namespace quarry::fileindex {
@@ -9,34 +11,35 @@ namespace {
 // What is left of a line. Each function takes something off its front, or returns false.
 class Scanner {
  public:
-  explicit Scanner(std::string_view line) : rest_(line) {}
+  explicit Scanner(std::string_view line) : at_(line.data()), end_(line.data() + line.size()) {}
 
-  bool empty() const { return rest_.empty(); }
+  bool empty() const { return at_ == end_; }
 
-  bool Take(std::string_view text) {
-    if (!rest_.starts_with(text)) return false;
-    rest_.remove_prefix(text.size());
+  // Of a length that is known to the compiler, so that no function is called for a few bytes.
+  template <std::size_t N>
+  bool Take(const char (&text)[N]) {
+    if (left() < N - 1 || std::memcmp(at_, text, N - 1) != 0) return false;
+    at_ += N - 1;
     return true;
   }
 
   // A text of any bytes but escapes.
   bool TakeText(std::string_view& text) {
     if (!Take("\"")) return false;
-    const std::size_t end = rest_.find('"');
-    if (end == std::string_view::npos) return false;
-    text = rest_.substr(0, end);
-    rest_.remove_prefix(end + 1);
+    const void* const quote = std::memchr(at_, '"', left());
+    if (quote == nullptr) return false;
+    const char* const stop = static_cast<const char*>(quote);
+    text = std::string_view(at_, static_cast<std::size_t>(stop - at_));
+    at_ = stop + 1;
     return true;
   }
 
   // Digits alone. A number that begins with 0 is left to the library.
   bool TakeNumber(std::uint32_t& number) {
-    if (rest_.empty() || rest_.front() == '0') return false;
-    const char* const end = rest_.data() + rest_.size();
-    const auto [stop, error] = std::from_chars(rest_.data(), end, number);
-    if (error != std::errc()) return false;
-    rest_.remove_prefix(static_cast<std::size_t>(stop - rest_.data()));
-    return true;
+    if (empty() || *at_ == '0') return false;
+    const auto [stop, error] = std::from_chars(at_, end_, number);
+    at_ = stop;
+    return error == std::errc();
   }
 
   bool TakeBool(bool& value) {
@@ -45,45 +48,28 @@ class Scanner {
   }
 
  private:
-  std::string_view rest_;
+  std::size_t left() const { return static_cast<std::size_t>(end_ - at_); }
+
+  const char* at_;
+  const char* end_;
 };
 
 // The keys that were met, as bits.
-enum Key : unsigned { kUnknown = 0, kEvent = 1, kIsDir = 2, kPath = 4, kPathOld = 8, kData = 16 };
-
-Key TakeKey(Scanner& line) {
-  if (line.Take("\"event\":")) return kEvent;
-  if (line.Take("\"is_dir\":")) return kIsDir;
-  if (line.Take("\"path\":")) return kPath;
-  if (line.Take("\"path_old\":")) return kPathOld;
-  if (line.Take("\"data\":")) return kData;
-  return kUnknown;
-}
-
-bool TakeValue(Scanner& line, Key key, EventLine& event) {
-  switch (key) {
-    case kEvent:
-      return line.TakeNumber(event.op);
-    case kIsDir:
-      return line.TakeBool(event.is_dir);
-    case kPath:
-      return line.TakeText(event.path);
-    case kPathOld:
-      return line.TakeText(event.path_old);
-    case kData:
-      return line.Take("null");
-    case kUnknown:
-      break;
-  }
-  return false;
-}
+enum Key : unsigned { kEvent = 1, kIsDir = 2, kPath = 4, kPathOld = 8, kData = 16 };
 
 // Of a key that comes twice, the library knows which one counts.
-bool TakeMember(Scanner& line, EventLine& event, unsigned& met) {
-  const Key key = TakeKey(line);
-  if ((met & key) != 0) return false;
+bool IsFirst(Key key, unsigned& met) {
+  const bool is_first = (met & key) == 0;
   met |= key;
-  return TakeValue(line, key, event);
+  return is_first;
+}
+
+bool TakeMember(Scanner& line, EventLine& event, unsigned& met) {
+  if (line.Take("\"event\":")) return IsFirst(kEvent, met) && line.TakeNumber(event.op);
+  if (line.Take("\"is_dir\":")) return IsFirst(kIsDir, met) && line.TakeBool(event.is_dir);
+  if (line.Take("\"path\":")) return IsFirst(kPath, met) && line.TakeText(event.path);
+  if (line.Take("\"path_old\":")) return IsFirst(kPathOld, met) && line.TakeText(event.path_old);
+  return line.Take("\"data\":") && IsFirst(kData, met) && line.Take("null");
 }
 
 }  // namespace

@@ -134,11 +134,19 @@ bool Ledger::IsAt(const OPNode& node, std::string_view name, std::uint32_t place
          children[place]->name == name;
 }
 
+// Whether a place of PrefetchPlace says that there is no child of that name: it has found no such
+// hash, and no child has come since.
+bool Ledger::IsBehind(const OPNode& node, std::uint32_t place) {
+  return place > kFewChildren && place == node.children.size() && node.books_->adopted == place;
+}
+
 const std::shared_ptr<OPNode>& Ledger::Child(OPNode& node, std::string_view name,
                                              std::uint32_t hash, std::uint32_t place, Pool* pool) {
-  if (!IsAt(node, name, place)) return Child(node, name, hash, pool);
-  Touch(*node.children[place]);
-  return node.children[place];
+  if (IsAt(node, name, place)) {
+    Touch(*node.children[place]);
+    return node.children[place];
+  }
+  return IsBehind(node, place) ? Create(node, name, hash, pool) : Child(node, name, hash, pool);
 }
 
 const std::shared_ptr<OPNode>& Ledger::Child(OPNode& node, std::string_view name,
@@ -149,6 +157,12 @@ const std::shared_ptr<OPNode>& Ledger::Child(OPNode& node, std::string_view name
     Touch(*node.children[found]);
     return node.children[found];
   }
+  return Create(node, name, hash, pool);
+}
+
+// All other children are accounted for.
+const std::shared_ptr<OPNode>& Ledger::Create(OPNode& node, std::string_view name,
+                                              std::uint32_t hash, Pool* pool) {
   MakeRoom(node.children);
   node.children.push_back(pool != nullptr
                               ? pool->Make<OPNode>(node.shared_from_this(), kUnnamed)
@@ -179,13 +193,12 @@ void Ledger::PrefetchName(const OPNode& node, std::uint32_t hash) {
 
 // A new child comes behind the last one.
 std::uint32_t Ledger::PrefetchPlace(const OPNode& node, std::uint32_t hash) {
-  std::size_t place = node.children.size();
-  if (node.books_) {
-    place = std::min<std::size_t>(
-        place, node.books_->names.Find(hash, [](std::uint32_t) { return true; }));
-  }
+  const OPNode::Books* const books = node.books_.get();
+  if (books == nullptr || books->adopted != node.children.size()) return OPNode::kNone;
+  const std::uint32_t place =
+      std::min(books->adopted, books->names.Find(hash, [](std::uint32_t) { return true; }));
   __builtin_prefetch(node.children.data() + place);
-  return static_cast<std::uint32_t>(place);
+  return place;
 }
 
 const OPNode* Ledger::PrefetchChild(const OPNode& node, std::uint32_t place) {

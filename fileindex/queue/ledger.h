@@ -166,6 +166,9 @@ class Ledger {
   static void Place(OPNode& node, OPNode::Books& books);
   static void EnterName(OPNode& node, OPNode::Books& books, std::uint32_t place);
   static bool IsAt(const OPNode& node, std::string_view name, std::uint32_t place);
+  static bool IsBehind(const OPNode& node, std::uint32_t place);
+  static const std::shared_ptr<OPNode>& Create(OPNode& node, std::string_view name,
+                                               std::uint32_t hash, Pool* pool);
   static bool IsInPlace(const OPNode& node);
   // Places among the node's children.
   static std::uint32_t Find(const OPNode& node, std::string_view name, std::uint32_t hash);

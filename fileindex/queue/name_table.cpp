@@ -13,10 +13,13 @@ namespace {
 // So much of a name is hashed at once.
 constexpr std::size_t kBlock = 256;
 
+__extension__ using Wide = unsigned __int128;
+
 struct Keys {
-  std::array<std::uint32_t, kBlock / 4> words;
+  std::array<std::uint64_t, kBlock / 8> words;
   std::uint64_t length;
-  std::uint64_t last;
+  std::uint64_t low;
+  std::uint64_t high;
 };
 
 std::uint64_t Spread(std::uint64_t number) {
@@ -34,65 +37,64 @@ Keys MakeKeys() {
   errno = saved_errno;
   const auto next = [&seed] { return Spread(seed += 0x9e3779b97f4a7c15); };
   Keys keys{};
-  for (std::uint32_t& word : keys.words) word = static_cast<std::uint32_t>(next() >> 32);
+  for (std::uint64_t& word : keys.words) word = next();
   keys.length = next() | 1;
-  keys.last = next() | 1;
+  keys.low = next() | 1;
+  keys.high = next() | 1;
   return keys;
 }
 
-// Eight bytes, as many as a piece has.
-std::uint64_t Piece(const char* bytes) {
-  std::uint64_t number = 0;
+template <typename Number>
+std::uint64_t NumberAt(const char* bytes) {
+  Number number = 0;
   std::memcpy(&number, bytes, sizeof(number));
   return number;
 }
 
-// The same of fewer bytes.
-std::uint64_t ShortPiece(const char* bytes, std::size_t count) {
-  std::uint64_t number = 0;
+Wide Product(std::uint64_t first, std::uint64_t second, const std::uint64_t* keys) {
+  return Wide{first + keys[0]} * (second + keys[1]);
+}
+
+// One to fifteen bytes. Of one count no two have the same numbers, though these may overlap.
+Wide ProductOfFew(const char* bytes, std::size_t count, const std::uint64_t* keys) {
+  using Byte = unsigned char;
+  const char* const end = bytes + count;
+  if (count >= 8) {
+    return Product(NumberAt<std::uint64_t>(bytes), NumberAt<std::uint64_t>(end - 8), keys);
+  }
   if (count >= 4) {
-    std::uint32_t first = 0;
-    std::uint32_t last = 0;
-    std::memcpy(&first, bytes, 4);
-    std::memcpy(&last, bytes + count - 4, 4);
-    return first | std::uint64_t{last} << 8 * (count - 4);
+    return Product(NumberAt<std::uint32_t>(bytes), NumberAt<std::uint32_t>(end - 4), keys);
   }
-  for (std::size_t i = 0; i < count; ++i) {
-    number |= std::uint64_t{static_cast<unsigned char>(bytes[i])} << 8 * i;
-  }
-  return number;
+  return Product(NumberAt<Byte>(bytes) << 8 | NumberAt<Byte>(end - 1),
+                 NumberAt<Byte>(bytes + count / 2), keys);
 }
 
-std::uint64_t Product(std::uint64_t piece, const std::uint32_t* keys) {
-  const auto low = static_cast<std::uint32_t>(piece);
-  const auto high = static_cast<std::uint32_t>(piece >> 32);
-  return std::uint64_t{low + keys[0]} * std::uint32_t{high + keys[1]};
-}
-
-// A block's pieces, each multiplied with a key of its own: two blocks that were chosen without the
-// keys have the same sum as rarely as by chance.
-std::uint64_t Sum(const Keys& keys, std::string_view block) {
-  std::uint64_t sum = block.size() * keys.length;
-  const std::uint32_t* key = keys.words.data();
-  while (block.size() >= 8) {
-    sum += Product(Piece(block.data()), key);
-    key += 2;
-    block.remove_prefix(8);
+// A block's numbers, added to keys of their own and multiplied pair by pair: two blocks that were
+// chosen without the keys have the same sum as rarely as by chance.
+Wide Sum(const Keys& keys, const char* bytes, std::size_t count) {
+  Wide sum = count * keys.length;
+  const std::uint64_t* key = keys.words.data();
+  for (; count >= 16; count -= 16, bytes += 16, key += 2) {
+    sum += Product(NumberAt<std::uint64_t>(bytes), NumberAt<std::uint64_t>(bytes + 8), key);
   }
-  if (!block.empty()) sum += Product(ShortPiece(block.data(), block.size()), key);
+  if (count > 0) sum += ProductOfFew(bytes, count, key);
   return sum;
+}
+
+std::uint64_t Fold(const Keys& keys, Wide sum) {
+  return static_cast<std::uint64_t>(sum) * keys.low +
+         static_cast<std::uint64_t>(sum >> 64) * keys.high;
 }
 
 }  // namespace
 
 std::uint32_t NameTable::HashOf(std::string_view name) {
   static const Keys keys = MakeKeys();
-  std::uint64_t sum = 0;
+  std::uint64_t before = 0;
   for (; name.size() > kBlock; name.remove_prefix(kBlock)) {
-    sum = Spread(sum + Sum(keys, name.substr(0, kBlock)));
+    before = Spread(Fold(keys, before + Sum(keys, name.data(), kBlock)));
   }
-  sum += Sum(keys, name);
-  return static_cast<std::uint32_t>((sum ^ sum >> 32) * keys.last >> 32);
+  return static_cast<std::uint32_t>(Fold(keys, before + Sum(keys, name.data(), name.size())) >> 32);
 }
 
 }  // namespace quarry::fileindex

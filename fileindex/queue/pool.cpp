@@ -65,7 +65,7 @@ struct Pool::Chunk {
   std::atomic<std::size_t> held{kOpen};
 };
 
-thread_local Pool* Pool::in_use_ = nullptr;
+constinit thread_local Pool* Pool::in_use_ = nullptr;
 
 std::size_t Pool::BytesInUse() {
   return chunks_in_use * kChunkSize;

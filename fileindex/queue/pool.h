@@ -47,7 +47,7 @@ class Pool {
   void Finish() noexcept;
 
   // The pool that is making an object: an allocator that knew it would take up room in each one.
-  static thread_local Pool* in_use_;
+  static constinit thread_local Pool* in_use_;
 
   Chunk* chunk_ = nullptr;  // the last one
   std::size_t used_ = 0;    // bytes of it
