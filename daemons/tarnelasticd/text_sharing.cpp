@@ -69,11 +69,11 @@ bool TextSharing::IsTaken(std::int64_t doc) {
   return users.Bind(1, doc).Step();
 }
 
+// Two statements, since one that replaces can fail half-way: against that SQLite has FTS5 write out
+// all that it has collected, each time.
 void TextSharing::SetCopy(std::int64_t doc, std::int64_t text) {
-  db_->Prepare("INSERT OR REPLACE INTO text_copies(doc,text) VALUES(?1,?2)")
-      .Bind(1, doc)
-      .Bind(2, text)
-      .Run();
+  DropCopy(doc);
+  db_->Prepare("INSERT INTO text_copies(doc,text) VALUES(?1,?2)").Bind(1, doc).Bind(2, text).Run();
 }
 
 void TextSharing::DropCopy(std::int64_t doc) {

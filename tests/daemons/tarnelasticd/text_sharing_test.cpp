@@ -76,6 +76,14 @@ class TextSharingTest : public EngineTest {
   std::map<std::string, std::string> model_;
 };
 
+// SQLite would have it do so before each statement that can fail half-way.
+TEST_F(TextSharingTest, DoesNotMakeFts5WriteBeforeTheCommit) {
+  for (int i = 0; i < 20; ++i) Store("/v/copy" + std::to_string(i), "the same");
+  Commit();
+  EXPECT_EQ(Count("(SELECT DISTINCT segid FROM labels_idx)"), 1);
+  EXPECT_EQ(Count("(SELECT DISTINCT segid FROM names_idx)"), 1);
+}
+
 TEST_F(TextSharingTest, TheOwnerMayGoFirst) {
   Store("/s/1", "harbour storm");
   Store("/s/2", "harbour storm");
