@@ -355,6 +355,10 @@ bool ReadPlainJson(std::string_view text, Json::Value* out) {
   return true;
 }
 
+void AppendJsonString(std::string* out, std::string_view text) {
+  AppendString(out, text);
+}
+
 std::string WriteJson(const Json::Value& value) {
   return Writer().Write(value);
 }

@@ -9,6 +9,8 @@
 #include <string>
 #include <string_view>
 
+#include "common/export.h"
+
 namespace quarry {
 
 // Reads `text` just as the JSON library in its strict mode would, or returns false, with `out` as
@@ -19,6 +21,9 @@ bool ReadPlainJson(std::string_view text, Json::Value* out);
 
 // The compact text of `value`, byte for byte as the JSON library writes it. Any thread.
 std::string WriteJson(const Json::Value& value);
+
+// Adds `text` as a JSON string, byte for byte as WriteJson does. Any thread.
+QUARRY_EXPORT void AppendJsonString(std::string* out, std::string_view text);
 
 }  // namespace quarry
 

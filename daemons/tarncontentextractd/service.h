@@ -8,6 +8,7 @@
 #include <chrono>
 #include <cstddef>
 #include <string>
+#include <vector>
 
 #include "daemons/tarncontentextractd/attributes.h"
 #include "daemons/tarncontentextractd/bad_files.h"
@@ -21,6 +22,10 @@ inline constexpr std::size_t kMaxBadFileBytes = std::size_t{8} << 20;
 // A request for many documents is answered once there are so many bytes of them, or so much time
 // has passed: whoever asks holds them all, and may have been told to stop.
 inline constexpr std::size_t kManyBytes = std::size_t{1} << 20;
+// A worker is given so many files at a time, and no further one once they have so many bytes: a
+// slow one holds up those behind it.
+inline constexpr std::size_t kFilesTogether = 8;
+inline constexpr std::int64_t kBytesTogether = std::int64_t{256} << 10;
 inline constexpr std::chrono::milliseconds kManyTime(300);
 
 // Makes documents of files. Any thread, any number at once.
@@ -38,11 +43,17 @@ class ExtractService {
   Json::Value ParseFile(const std::string& path, bool need_meta);
 
  private:
+  struct Draft;
+
   std::string Answer(const Json::Value& request);
-  Json::Value ParseAsked(const Json::Value& data);
+  Draft Begin(const std::string& path, bool need_meta);
+  Draft BeginAsked(const Json::Value& data);
+  std::string ParseOne(Draft draft);
   std::string ParseMany(const Json::Value& data);
-  bool AddContent(const std::string& path, int place, const Attributes& attributes,
-                  Json::Value& document);
+  Json::ArrayIndex ParseSome(const Json::Value& files, Json::ArrayIndex begin, std::string* out);
+  void OpenContent(int place, Draft* draft);
+  std::size_t ReadContents(std::vector<Draft>* drafts);
+  void TakeContent(PoolResult result, Draft* draft);
 
   WorkerPool& pool_;
   BadFiles bad_files_{kMaxBadFiles, kMaxBadFileBytes};

@@ -44,12 +44,15 @@ void Source::ReadUpTo(std::size_t size) {
   while (!at_end_ && bytes_.size() < size) {
     const std::size_t got = bytes_.size();
     bytes_.resize(std::min(size, got + RoomFor(got, *expected_)));
+    const std::size_t asked = bytes_.size() - got;
     ssize_t count = 0;
     do {
-      count = pread(fd_, bytes_.data() + got, bytes_.size() - got, static_cast<off_t>(got));
+      count = pread(fd_, bytes_.data() + got, asked, static_cast<off_t>(got));
     } while (count < 0 && errno == EINTR);
     bytes_.resize(got + static_cast<std::size_t>(std::max<ssize_t>(count, 0)));
-    if (count <= 0) at_end_ = true;
+    // Where the file has given what it said, a read that falls short has met its end.
+    at_end_ = count <= 0 ||
+              (bytes_.size() < got + asked && *expected_ > 0 && bytes_.size() >= *expected_);
   }
 }
 

@@ -68,18 +68,16 @@ std::vector<Field> ParseFile(const Registry& registry, Source& source) {
 }
 
 bool Announce(int channel, const std::string& problem) {
-  return SendAnswer(channel, problem.empty() ? kReady : problem) && problem.empty();
+  return SendMessage(channel, MakeMessage(problem.empty() ? kReady : problem)) && problem.empty();
 }
 
 void ServeFiles(const Registry& registry, int channel, int seconds) {
-  std::string extension;
-  UniqueFd file;
-  while (ReceiveRequest(channel, &extension, &file)) {
+  Request request;
+  while (ReceiveRequest(channel, &request)) {
     SetTimer(seconds);
-    Source source(file.get(), extension);
-    const bool sent = SendAnswer(channel, EncodeFields(ParseFile(registry, source)));
+    Source source(request.file.get(), request.extension);
+    const bool sent = SendMessage(channel, MakeAnswer(request.number, ParseFile(registry, source)));
     SetTimer(0);
-    file.Reset();
     if (!sent) return;
   }
 }

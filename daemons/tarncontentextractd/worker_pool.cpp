@@ -133,37 +133,85 @@ PoolOutcome WorkerPool::Ensure(Slot& slot) {
   return PoolOutcome::kDone;
 }
 
-PoolOutcome WorkerPool::ParseOnce(Slot& slot, int file, const std::string& extension,
-                                  const std::string& name, std::vector<Field>* out, bool* retry) {
-  const bool fresh = slot->FilesDone() == 0;
-  const WorkerOutcome outcome = slot->Parse(file, extension, options_.file_timeout, out);
-  if (outcome == WorkerOutcome::kDone) return PoolOutcome::kDone;
-  const std::string ending = slot->End();
-  Drop(slot);
-  if (outcome == WorkerOutcome::kStopped) return PoolOutcome::kStopped;
-  const bool died = outcome == WorkerOutcome::kDied;
-  *retry = died && !fresh;
-  if (!*retry) {
-    daemon::LogWarning("Content of " + name + " cannot be read: its worker " +
-                       (died ? ending : "did not answer in time"));
-  }
-  return PoolOutcome::kBadFile;
-}
+// Files on their way through one place for a worker.
+class WorkerPool::Run {
+ public:
+  Run(WorkerPool& pool, Slot& slot, const std::vector<PoolFile>& files)
+      : pool_(pool), slot_(slot), files_(files) {}
 
-PoolOutcome WorkerPool::Parse(int file, const std::string& extension, const std::string& name,
-                              std::vector<Field>* out) {
-  out->clear();
-  const Lease lease(*this);
-  if (lease.slot() == nullptr) return PoolOutcome::kStopped;
-  bool retry = true;
-  PoolOutcome outcome = PoolOutcome::kBroken;
-  while (retry) {
-    retry = false;
-    outcome = Ensure(*lease.slot());
-    if (outcome != PoolOutcome::kDone) return outcome;
-    outcome = ParseOnce(*lease.slot(), file, extension, name, out, &retry);
+  std::vector<PoolResult> ToEnd() {
+    while (go_on_ && results_.size() < files_.size()) {
+      const PoolOutcome outcome = pool_.Ensure(slot_);
+      if (outcome == PoolOutcome::kDone) {
+        ParseNext();
+      } else {
+        End(outcome);
+      }
+    }
+    return std::move(results_);
   }
-  return outcome;
+
+ private:
+  // The files behind those that are done: all that this worker may still take, or one of those that
+  // a dead one has left.
+  std::vector<WorkerFile> Next() const {
+    const std::size_t most = pool_.options_.files_per_worker - slot_->FilesDone();
+    const std::size_t begin = results_.size();
+    const std::size_t count =
+        begin < alone_until_ ? 1 : std::min(std::max<std::size_t>(most, 1), files_.size() - begin);
+    std::vector<WorkerFile> next;
+    for (std::size_t i = begin; i < begin + count; ++i) {
+      next.push_back({files_[i].fd, files_[i].extension});
+    }
+    return next;
+  }
+
+  void ParseNext() {
+    const bool fresh = slot_->FilesDone() == 0;
+    const std::vector<WorkerFile> next = Next();
+    const std::size_t end = results_.size() + next.size();
+    std::vector<std::vector<Field>> done;
+    const WorkerOutcome outcome = slot_->Parse(next, pool_.options_.file_timeout, &done);
+    for (std::vector<Field>& fields : done)
+      results_.push_back({PoolOutcome::kDone, std::move(fields)});
+    if (outcome != WorkerOutcome::kDone) Lose(outcome, fresh && next.size() == 1, end);
+  }
+
+  // The worker is of no more use.
+  void Lose(WorkerOutcome outcome, bool alone, std::size_t end) {
+    const std::string ending = slot_->End();
+    pool_.Drop(slot_);
+    if (outcome == WorkerOutcome::kStopped) return End(PoolOutcome::kStopped);
+    const bool died = outcome == WorkerOutcome::kDied;
+    if (died && !alone) {
+      alone_until_ = std::max(alone_until_, end);
+      return;
+    }
+    daemon::LogWarning("Content of " + files_[results_.size()].name +
+                       " cannot be read: its worker " + (died ? ending : "did not answer in time"));
+    results_.push_back({PoolOutcome::kBadFile, {}});
+    go_on_ = died;
+  }
+
+  // What holds for all that are left.
+  void End(PoolOutcome outcome) {
+    while (results_.size() < files_.size()) results_.push_back({outcome, {}});
+  }
+
+  WorkerPool& pool_;
+  Slot& slot_;
+  const std::vector<PoolFile>& files_;
+  std::vector<PoolResult> results_;
+  std::size_t alone_until_ = 0;
+  bool go_on_ = true;
+};
+
+std::vector<PoolResult> WorkerPool::Parse(const std::vector<PoolFile>& files) {
+  const Lease lease(*this);
+  if (lease.slot() != nullptr) return Run(*this, *lease.slot(), files).ToEnd();
+  std::vector<PoolResult> stopped(files.size());
+  for (PoolResult& each : stopped) each.outcome = PoolOutcome::kStopped;
+  return stopped;
 }
 
 }  // namespace quarry::extract

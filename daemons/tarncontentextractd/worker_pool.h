@@ -38,6 +38,18 @@ enum class PoolOutcome {
   kStopped,  // the pool is stopping; says nothing about the file
 };
 
+// A file to be parsed. The descriptor stays the caller's.
+struct PoolFile {
+  int fd = -1;
+  std::string extension;
+  std::string name;  // what log lines call it
+};
+
+struct PoolResult {
+  PoolOutcome outcome = PoolOutcome::kBroken;
+  std::vector<Field> fields;  // empty unless kDone
+};
+
 // Workers are started when they are first needed. Any thread, any number of threads at once.
 class WorkerPool {
  public:
@@ -47,12 +59,12 @@ class WorkerPool {
   WorkerPool(const WorkerPool&) = delete;
   WorkerPool& operator=(const WorkerPool&) = delete;
 
-  // Has a worker parse `file`, which stays the caller's. Blocks until a worker is free and has
-  // answered, at most the two timeouts, and at most twice that for a file whose worker died: such a
-  // file is given to a new worker before it is blamed, since an earlier file may have done the
-  // harm. `out` is empty unless kDone is returned. `name` is what log lines call the file.
-  PoolOutcome Parse(int file, const std::string& extension, const std::string& name,
-                    std::vector<Field>* out);
+  // Has one worker parse the files, one after the other. Blocks until a worker is free, and for at
+  // most the two timeouts for each file, and at most twice that for a file whose worker died: such
+  // a file is given to a new worker by itself before it is blamed, since an earlier file may have
+  // done the harm. Returns what became of the files in their order. Only behind one that timed out
+  // it ends early: those behind it have waited long enough, and may be given to Parse() again.
+  std::vector<PoolResult> Parse(const std::vector<PoolFile>& files);
 
   // Makes all that wait in Parse(), and all that come, return kStopped soon. Does not wait for
   // them.
@@ -65,13 +77,12 @@ class WorkerPool {
   using Clock = std::chrono::steady_clock;
   using Slot = std::unique_ptr<WorkerProcess>;
   class Lease;
+  class Run;
 
   Slot* Acquire();
   void Release(Slot* slot);
   void Drop(Slot& slot);
   PoolOutcome Ensure(Slot& slot);
-  PoolOutcome ParseOnce(Slot& slot, int file, const std::string& extension, const std::string& name,
-                        std::vector<Field>* out, bool* retry);
   bool Stopping() const;
   bool MayStart();
   void NoteStarted();

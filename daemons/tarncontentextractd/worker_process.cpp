@@ -27,6 +27,8 @@ using std::chrono::milliseconds;
 
 // An answer is stored in such steps, so that memory follows what arrives and not what is claimed.
 constexpr std::size_t kReadStep = std::size_t{1} << 20;
+// Room for many answers of the usual size, which is kept.
+constexpr std::size_t kInboxBytes = std::size_t{128} << 10;
 
 // How a child is to begin: alone in its group, without the daemon's signal mask, terminal or files.
 class SpawnPlan {
@@ -109,12 +111,12 @@ WorkerProcess::WorkerProcess(const std::vector<std::string>& command, millisecon
   Spawn(command, theirs.get());
   // Else the end of the worker could not be told from its silence.
   theirs.Reset();
-  std::string text;
+  std::string_view text;
   const WorkerOutcome outcome = ReadMessage(&text, Clock::now() + timeout);
   if (outcome == WorkerOutcome::kDone && text == kReady) return;
   const std::string ending = End();
   throw Error(kErrorSystem, outcome == WorkerOutcome::kDone
-                                ? "Its sandbox did not close: " + text
+                                ? "Its sandbox did not close: " + std::string(text)
                                 : "Worker not started: " + Describe(outcome, ending));
 }
 
@@ -158,47 +160,78 @@ WorkerOutcome WorkerProcess::WaitReadable(Deadline deadline) const {
 }
 
 bool WorkerProcess::HasSpoken() const {
+  if (begin_ < end_) return true;
   char byte = 0;
   return recv(channel_.get(), &byte, sizeof(byte), MSG_PEEK | MSG_DONTWAIT) >= 0;
 }
 
-WorkerOutcome WorkerProcess::ReadAll(char* buffer, std::size_t size, Deadline deadline) {
-  while (size > 0) {
-    const WorkerOutcome outcome = WaitReadable(deadline);
-    if (outcome != WorkerOutcome::kDone) return outcome;
-    const ssize_t count = recv(channel_.get(), buffer, size, MSG_DONTWAIT);
-    if (count < 0 && (errno == EINTR || errno == EAGAIN)) continue;
-    if (count <= 0) return WorkerOutcome::kDied;
-    buffer += count;
-    size -= static_cast<std::size_t>(count);
+// Reads until there are `wanted` bytes to look at, and whatever else has come by then.
+WorkerOutcome WorkerProcess::ReadMore(std::size_t wanted, Deadline deadline) {
+  if (begin_ == end_) begin_ = end_ = 0;
+  while (end_ - begin_ < wanted) {
+    if (begin_ + std::min(wanted, end_ - begin_ + kReadStep) > inbox_.size()) {
+      inbox_.erase(0, begin_);
+      end_ -= begin_;
+      begin_ = 0;
+      inbox_.resize(std::max(kInboxBytes, std::min(wanted, end_ + kReadStep)));
+    }
+    const ssize_t count =
+        recv(channel_.get(), inbox_.data() + end_, inbox_.size() - end_, MSG_DONTWAIT);
+    if (count > 0) {
+      end_ += static_cast<std::size_t>(count);
+    } else if (count == 0 || (errno != EINTR && errno != EAGAIN)) {
+      return WorkerOutcome::kDied;
+    } else {
+      const WorkerOutcome outcome = WaitReadable(deadline);
+      if (outcome != WorkerOutcome::kDone) return outcome;
+    }
   }
   return WorkerOutcome::kDone;
 }
 
-WorkerOutcome WorkerProcess::ReadMessage(std::string* text, Deadline deadline) {
+// The text is good until more is read.
+WorkerOutcome WorkerProcess::ReadMessage(std::string_view* text, Deadline deadline) {
   std::uint32_t size = 0;
-  WorkerOutcome outcome = ReadAll(reinterpret_cast<char*>(&size), sizeof(size), deadline);
-  if (outcome == WorkerOutcome::kDone && size > kMaxAnswerBytes) return WorkerOutcome::kDied;
-  text->clear();
-  while (outcome == WorkerOutcome::kDone && text->size() < size) {
-    const std::size_t got = text->size();
-    text->resize(std::min<std::size_t>(size, got + kReadStep));
-    outcome = ReadAll(text->data() + got, text->size() - got, deadline);
-  }
+  WorkerOutcome outcome = ReadMore(sizeof(size), deadline);
+  if (outcome != WorkerOutcome::kDone) return outcome;
+  std::memcpy(&size, inbox_.data() + begin_, sizeof(size));
+  if (size > kMaxAnswerBytes) return WorkerOutcome::kDied;
+  outcome = ReadMore(sizeof(size) + size, deadline);
+  if (outcome != WorkerOutcome::kDone) return outcome;
+  *text = std::string_view(inbox_).substr(begin_ + sizeof(size), size);
+  begin_ += sizeof(size) + size;
   return outcome;
 }
 
-WorkerOutcome WorkerProcess::Parse(int file, const std::string& extension, milliseconds timeout,
-                                   std::vector<Field>* out) {
+// Returns how many it takes.
+std::size_t WorkerProcess::Send(const std::vector<WorkerFile>& files) {
+  std::size_t sent = 0;
+  while (sent < files.size() &&
+         SendRequest(channel_.get(), next_ + static_cast<std::uint32_t>(sent),
+                     files[sent].extension, files[sent].fd)) {
+    ++sent;
+  }
+  return sent;
+}
+
+WorkerOutcome WorkerProcess::Parse(const std::vector<WorkerFile>& files, milliseconds timeout,
+                                   std::vector<std::vector<Field>>* out) {
   out->clear();
-  // What comes before it is asked for, or where nothing is taken, comes from no worker of ours. Its
-  // next answer would be taken for one about this file.
-  if (HasSpoken() || !SendRequest(channel_.get(), extension, file)) return WorkerOutcome::kDied;
-  std::string answer;
-  const WorkerOutcome outcome = ReadMessage(&answer, Clock::now() + timeout);
-  if (outcome != WorkerOutcome::kDone) return outcome;
-  if (!DecodeFields(answer, out)) return WorkerOutcome::kDied;
-  ++files_done_;
+  // What comes before it is asked for, or where nothing is taken, comes from no worker of ours.
+  if (HasSpoken()) return WorkerOutcome::kDied;
+  const std::size_t sent = Send(files);
+  if (sent == 0) return WorkerOutcome::kDied;
+  while (out->size() < sent) {
+    std::string_view answer;
+    const WorkerOutcome outcome = ReadMessage(&answer, Clock::now() + timeout);
+    if (outcome != WorkerOutcome::kDone) return outcome;
+    std::vector<Field> fields;
+    if (!ReadAnswer(answer, next_, &fields)) return WorkerOutcome::kDied;
+    out->push_back(std::move(fields));
+    ++next_;
+    ++files_done_;
+  }
+  if (begin_ == end_ && inbox_.size() > kInboxBytes) inbox_ = std::string();
   return WorkerOutcome::kDone;
 }
 

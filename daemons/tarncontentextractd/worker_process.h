@@ -9,6 +9,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "common/unique_fd.h"
@@ -24,6 +25,12 @@ enum class WorkerOutcome {
   kStopped,   // the daemon is about to stop
 };
 
+// A file to be parsed. The descriptor stays the caller's.
+struct WorkerFile {
+  int fd = -1;
+  std::string extension;
+};
+
 // A running worker, in a process group of its own. It is killed, with all its group, when the
 // object ends. One thread at a time.
 class WorkerProcess {
@@ -37,10 +44,12 @@ class WorkerProcess {
   WorkerProcess(const WorkerProcess&) = delete;
   WorkerProcess& operator=(const WorkerProcess&) = delete;
 
-  // Has the worker parse `file`, which stays the caller's. Blocks for at most `timeout`, or until
-  // `stop_fd` is readable. `out` is set for kDone and is empty otherwise.
-  WorkerOutcome Parse(int file, const std::string& extension, std::chrono::milliseconds timeout,
-                      std::vector<Field>* out);
+  // Has the worker parse the files one after the other, which it knows of all along, so that it
+  // need not wait for the next. Blocks for at most `timeout` for each, or until `stop_fd` is
+  // readable. `out` is set to the fields of those that it has answered for, the first ones. With
+  // kDone that is at least one, and less than all where the worker takes no more at a time.
+  WorkerOutcome Parse(const std::vector<WorkerFile>& files, std::chrono::milliseconds timeout,
+                      std::vector<std::vector<Field>>* out);
 
   // Files that this worker has parsed.
   std::size_t FilesDone() const { return files_done_; }
@@ -54,14 +63,19 @@ class WorkerProcess {
   using Deadline = std::chrono::steady_clock::time_point;
 
   void Spawn(const std::vector<std::string>& command, int channel);
-  WorkerOutcome ReadAll(char* buffer, std::size_t size, Deadline deadline);
-  WorkerOutcome ReadMessage(std::string* text, Deadline deadline);
+  std::size_t Send(const std::vector<WorkerFile>& files);
+  WorkerOutcome ReadMore(std::size_t wanted, Deadline deadline);
+  WorkerOutcome ReadMessage(std::string_view* text, Deadline deadline);
   bool HasSpoken() const;
   WorkerOutcome WaitReadable(Deadline deadline) const;
 
   pid_t pid_ = -1;
   int stop_fd_;
   UniqueFd channel_;
+  std::string inbox_;       // room for what has been read
+  std::size_t begin_ = 0;   // of what has not been looked at,
+  std::size_t end_ = 0;     // and its end
+  std::uint32_t next_ = 0;  // the number of the next request
   std::size_t files_done_ = 0;
   std::string ending_;
 };

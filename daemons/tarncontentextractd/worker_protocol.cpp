@@ -4,6 +4,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
 #include <cstdint>
 #include <cstring>
@@ -16,6 +17,8 @@ namespace {
 
 constexpr std::string_view kFieldPrefix = "TARNMD";
 constexpr std::size_t kMaxNameBytes = 64;
+constexpr std::size_t kNumberBytes = sizeof(std::uint32_t);
+constexpr std::size_t kMaxRequestBytes = kNumberBytes + kMaxExtensionBytes;
 
 template <typename T>
 void PutRaw(std::string& out, T value) {
@@ -58,6 +61,19 @@ void PutValue(std::string& out, const FieldValue& value) {
   if (const auto* text = std::get_if<std::string>(&value)) PutText(out, *text);
   if (const auto* whole = std::get_if<std::int64_t>(&value)) PutRaw(out, *whole);
   if (const auto* real = std::get_if<double>(&value)) PutRaw(out, *real);
+}
+
+void PutFields(std::string& out, const std::vector<Field>& fields) {
+  std::size_t room = out.size();
+  for (const Field& field : fields) {
+    const auto* text = std::get_if<std::string>(&field.value);
+    room += field.name.size() + (text == nullptr ? 0 : text->size()) + 16;
+  }
+  out.reserve(room);
+  for (const Field& field : fields) {
+    PutText(out, field.name);
+    PutValue(out, field.value);
+  }
 }
 
 template <typename T>
@@ -111,23 +127,23 @@ void TakeAttached(msghdr* message, UniqueFd* file) {
   file->Reset(fd);
 }
 
-bool ReceiveAll(int channel, char* buffer, std::size_t size, UniqueFd* file) {
-  while (size > 0) {
-    Attachment attachment;
-    iovec part{buffer, size};
-    msghdr message{};
-    message.msg_iov = &part;
-    message.msg_iovlen = 1;
-    message.msg_control = attachment.bytes;
-    message.msg_controllen = sizeof(attachment.bytes);
-    const ssize_t count = recvmsg(channel, &message, MSG_CMSG_CLOEXEC);
-    if (count < 0 && errno == EINTR) continue;
-    if (count <= 0) return false;
-    TakeAttached(&message, file);
-    buffer += count;
-    size -= static_cast<std::size_t>(count);
-  }
-  return true;
+// What has come, at least one byte; 0 when nothing more comes. (Together with a descriptor never
+// more than the message that brought it.)
+std::size_t ReceiveSome(int channel, char* buffer, std::size_t size, UniqueFd* file) {
+  Attachment attachment;
+  iovec part{buffer, size};
+  msghdr message{};
+  message.msg_iov = &part;
+  message.msg_iovlen = 1;
+  message.msg_control = attachment.bytes;
+  message.msg_controllen = sizeof(attachment.bytes);
+  ssize_t count = 0;
+  do {
+    count = recvmsg(channel, &message, MSG_CMSG_CLOEXEC);
+  } while (count < 0 && errno == EINTR);
+  if (count <= 0) return 0;
+  TakeAttached(&message, file);
+  return static_cast<std::size_t>(count);
 }
 
 }  // namespace
@@ -141,10 +157,7 @@ std::string MakeMessage(std::string_view text) {
 
 std::string EncodeFields(const std::vector<Field>& fields) {
   std::string bytes;
-  for (const Field& field : fields) {
-    PutText(bytes, field.name);
-    PutValue(bytes, field.value);
-  }
+  PutFields(bytes, fields);
   return bytes;
 }
 
@@ -161,8 +174,26 @@ bool DecodeFields(std::string_view bytes, std::vector<Field>* out) {
   return true;
 }
 
-bool SendRequest(int channel, const std::string& extension, int file) {
-  const std::string text = MakeMessage(std::string_view(extension).substr(0, kMaxExtensionBytes));
+std::string MakeAnswer(std::uint32_t number, const std::vector<Field>& fields) {
+  std::string message(sizeof(std::uint32_t), '\0');
+  PutRaw(message, number);
+  PutFields(message, fields);
+  const auto size = static_cast<std::uint32_t>(message.size() - sizeof(std::uint32_t));
+  std::memcpy(message.data(), &size, sizeof(size));
+  return message;
+}
+
+bool ReadAnswer(std::string_view bytes, std::uint32_t number, std::vector<Field>* out) {
+  out->clear();
+  std::uint32_t given = 0;
+  return TakeRaw(&bytes, &given) && given == number && DecodeFields(bytes, out);
+}
+
+bool SendRequest(int channel, std::uint32_t number, const std::string& extension, int file) {
+  std::string request;
+  PutRaw(request, number);
+  request.append(extension, 0, kMaxExtensionBytes);
+  const std::string text = MakeMessage(request);
   iovec part{const_cast<char*>(text.data()), text.size()};
   msghdr message{};
   message.msg_iov = &part;
@@ -173,28 +204,38 @@ bool SendRequest(int channel, const std::string& extension, int file) {
   do {
     count = sendmsg(channel, &message, MSG_NOSIGNAL | MSG_DONTWAIT);
   } while (count < 0 && errno == EINTR);
-  // So few bytes fit the socket's buffer whole: a worker that waits has emptied it.
+  // So few bytes are taken whole or not at all.
   return count == static_cast<ssize_t>(text.size());
 }
 
-bool ReceiveRequest(int channel, std::string* extension, UniqueFd* file) {
-  file->Reset();
+bool ReceiveRequest(int channel, Request* request) {
+  request->file.Reset();
+  std::array<char, sizeof(std::uint32_t) + kMaxRequestBytes> buffer;
+  std::size_t got = 0;
   std::uint32_t size = 0;
-  if (!ReceiveAll(channel, reinterpret_cast<char*>(&size), sizeof(size), file)) return false;
-  if (size > kMaxExtensionBytes) return false;
-  extension->resize(size);
-  return ReceiveAll(channel, extension->data(), size, file) && file->valid();
+  do {
+    const std::size_t count =
+        ReceiveSome(channel, buffer.data() + got, buffer.size() - got, &request->file);
+    if (count == 0) return false;
+    got += count;
+    if (got < sizeof(size)) continue;
+    std::memcpy(&size, buffer.data(), sizeof(size));
+    if (size < kNumberBytes || size > kMaxRequestBytes) return false;
+  } while (got < sizeof(size) + size);
+  std::string_view text(buffer.data() + sizeof(size), got - sizeof(size));
+  if (text.size() > size || !request->file.valid()) return false;
+  TakeRaw(&text, &request->number);
+  request->extension.assign(text);
+  return true;
 }
 
-bool SendAnswer(int channel, std::string_view text) {
-  const std::string message = MakeMessage(text);
-  std::string_view rest = message;
-  while (!rest.empty()) {
+bool SendMessage(int channel, std::string_view message) {
+  while (!message.empty()) {
     // Plain write(): the sandbox allows nothing more.
-    const ssize_t count = write(channel, rest.data(), rest.size());
+    const ssize_t count = write(channel, message.data(), message.size());
     if (count < 0 && errno == EINTR) continue;
     if (count <= 0) return false;
-    rest.remove_prefix(static_cast<std::size_t>(count));
+    message.remove_prefix(static_cast<std::size_t>(count));
   }
   return true;
 }

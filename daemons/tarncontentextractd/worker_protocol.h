@@ -1,14 +1,16 @@
 // What the daemon and a worker say to each other, on a pair of stream sockets.
 //
 // A message is a 4-byte length in the host's byte order and as many bytes. A worker's first message
-// is kReady, or says what was wrong. Then it answers one request after another: a request is the
-// extension of the file's name, with the file's descriptor attached; an answer is a list of fields.
-// The daemon trusts no answer further than these functions check it.
+// is kReady, or says what was wrong. Then it answers requests in their order: a request is a 4-byte
+// number and the extension of the file's name, with the file's descriptor attached; an answer is
+// that number and a list of fields. The daemon trusts no answer further than these functions check
+// it.
 
 #ifndef QUARRY_DAEMONS_TARNCONTENTEXTRACTD_WORKER_PROTOCOL_H_
 #define QUARRY_DAEMONS_TARNCONTENTEXTRACTD_WORKER_PROTOCOL_H_
 
 #include <cstddef>
+#include <cstdint>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -33,14 +35,27 @@ std::string EncodeFields(const std::vector<Field>& fields);
 // within the bounds of extractor.h.
 bool DecodeFields(std::string_view bytes, std::vector<Field>* out);
 
-// The daemon's: does not block, since a worker that waits has emptied its channel. Returns false
-// when the worker is gone or does not take the request.
-bool SendRequest(int channel, const std::string& extension, int file);
+// The answer to the request of that number, as a message.
+std::string MakeAnswer(std::uint32_t number, const std::vector<Field>& fields);
+
+// Reads what MakeAnswer wrote, without the length. Returns false, with `out` empty, for anything
+// else, another request's answer included.
+bool ReadAnswer(std::string_view bytes, std::uint32_t number, std::vector<Field>* out);
+
+struct Request {
+  std::uint32_t number = 0;
+  std::string extension;
+  UniqueFd file;
+};
+
+// The daemon's: does not block. `file` stays the caller's. Returns false, with nothing sent, when
+// the worker is gone or has too many requests before it.
+bool SendRequest(int channel, std::uint32_t number, const std::string& extension, int file);
 
 // The worker's: each blocks until all is through, and returns false when the daemon is gone or
-// breaks the rules.
-bool ReceiveRequest(int channel, std::string* extension, UniqueFd* file);
-bool SendAnswer(int channel, std::string_view text);
+// breaks the rules. `message` has its length in front.
+bool ReceiveRequest(int channel, Request* request);
+bool SendMessage(int channel, std::string_view message);
 
 }  // namespace quarry::extract
 

@@ -279,6 +279,26 @@ TEST_F(ServiceTest, AFileThatCannotBeReadNowIsToBeTriedAgain) {
   EXPECT_TRUE(HasContent(Document(dir_ / "page.html")));
 }
 
+TEST_F(ServiceTest, OfManyFilesThoseThatCannotBeReadNowAreToBeTriedAgain) {
+  const std::vector<std::string> paths(20, dir_ / "page.html");
+  ASSERT_EQ(Ask(ManyRequest(paths, true))["data"].size(), paths.size());
+  rlimit limit{};
+  ASSERT_EQ(getrlimit(RLIMIT_NOFILE, &limit), 0);
+  const int lowest_free = UniqueFd(open("/", O_PATH | O_CLOEXEC)).get();
+  const rlimit tight{static_cast<rlim_t>(lowest_free) + 3, limit.rlim_max};
+  ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &tight), 0);
+  const Json::Value data = Ask(ManyRequest(paths, true))["data"];
+  ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &limit), 0);
+  ASSERT_EQ(data.size(), paths.size());
+  int read = 0;
+  for (const Json::Value& document : data) {
+    // What could not be opened at all is null, and is asked for again as well.
+    EXPECT_EQ(document.isMember("QuarryContentStamp"), HasContent(document));
+    if (HasContent(document)) ++read;
+  }
+  EXPECT_GE(read, 2);
+}
+
 TEST_F(ServiceTest, ManyAskAtOnce) {
   std::vector<std::thread> threads;
   for (int t = 0; t < 6; ++t) {
@@ -332,6 +352,59 @@ TEST_F(HostileServiceTest, WhatAParserSaysOverrulesNoAttribute) {
   EXPECT_TRUE(document["TARNMDFSSize"].isIntegral());
 }
 
+TEST_F(HostileServiceTest, BadFilesAmongManyCostOnlyThemselves) {
+  std::vector<std::string> paths;
+  for (const char* what : {"good", "crash", "overrule", "garbage", "usedcrash", "ahead"}) {
+    paths.push_back(Hostile(what));
+  }
+  paths.push_back(dir_ / "missing");
+  for (int i = 0; i < 20; ++i) {
+    paths.push_back(dir_ / (std::to_string(i) + ".good"));
+    test::WriteFile(paths.back(), "words of " + std::to_string(i));
+  }
+  std::vector<Json::Value> documents;
+  // An answer may end before all are done.
+  for (std::size_t at = 0; at < paths.size(); at = documents.size()) {
+    const Json::Value answer =
+        Ask(ManyRequest({paths.begin() + static_cast<std::ptrdiff_t>(at), paths.end()}, true));
+    ASSERT_GE(answer["data"].size(), 1u);
+    for (const Json::Value& each : answer["data"]) documents.push_back(each);
+  }
+  ASSERT_EQ(documents.size(), paths.size());
+  for (std::size_t i = 0; i < paths.size(); ++i) {
+    if (i == 6) {
+      EXPECT_TRUE(documents[i].isNull());
+      continue;
+    }
+    EXPECT_EQ(documents[i]["TARNMDPath"].asString(), paths[i]);
+    EXPECT_EQ(documents[i]["QuarryContentStamp"].asString(), StampOf(paths[i]));
+    EXPECT_EQ(HasContent(documents[i]), i == 0 || i == 4 || i > 6) << paths[i];
+    if (i > 6) {
+      EXPECT_EQ(documents[i]["TARNMDTextContent"].asString(), "words of " + std::to_string(i - 7));
+    }
+  }
+  EXPECT_EQ(documents[2]["TARNMDFSSize"].asInt(), 10);
+}
+
+TEST_F(HostileServiceTest, AnAnswerEndsBehindAFileThatStalls) {
+  WorkerPoolOptions options = Options(HostileWorker());
+  options.file_timeout = seconds(2);
+  WorkerPool pool(options);
+  ExtractService service(pool);
+  const std::vector<std::string> paths = {Hostile("good"), Hostile("stall"), Hostile("pid")};
+  Json::Value answer;
+  ASSERT_TRUE(fromString(answer, service.Handle(ManyRequest(paths, true))));
+  ASSERT_EQ(answer["data"].size(), 2u);
+  EXPECT_TRUE(HasContent(answer["data"][0]));
+  EXPECT_FALSE(HasContent(answer["data"][1]));
+  EXPECT_EQ(answer["data"][1]["QuarryContentStamp"].asString(), StampOf(paths[1]));
+  // It is remembered, and the one behind it is no worse for it.
+  const std::vector<std::string> rest = {paths[1], paths[2]};
+  ASSERT_TRUE(fromString(answer, service.Handle(ManyRequest(rest, true))));
+  ASSERT_EQ(answer["data"].size(), 2u);
+  EXPECT_TRUE(answer["data"][1].isMember("TARNMDTitle"));
+}
+
 class BrokenServiceTest : public ServiceTest {
  protected:
   BrokenServiceTest() : ServiceTest(HostileWorker("open")) {}
@@ -342,6 +415,17 @@ TEST_F(BrokenServiceTest, WithoutWorkersThereAreAttributesAndNoStamp) {
   EXPECT_EQ(document["TARNMDFSName"].asString(), "page.html");
   EXPECT_FALSE(HasContent(document));
   EXPECT_FALSE(document.isMember("QuarryContentStamp")) << "another time it may succeed";
+}
+
+TEST_F(BrokenServiceTest, WithoutWorkersEachOfManyHasItsAttributes) {
+  const std::vector<std::string> paths(5, dir_ / "page.html");
+  const Json::Value data = Ask(ManyRequest(paths, true))["data"];
+  ASSERT_EQ(data.size(), paths.size());
+  for (const Json::Value& document : data) {
+    EXPECT_EQ(document["TARNMDFSName"].asString(), "page.html");
+    EXPECT_FALSE(HasContent(document));
+    EXPECT_FALSE(document.isMember("QuarryContentStamp"));
+  }
 }
 
 TEST_F(ServiceTest, IsAnErrorWhileTheDaemonStops) {

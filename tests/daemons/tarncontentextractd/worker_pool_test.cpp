@@ -5,6 +5,7 @@
 #include <unistd.h>
 
 #include <atomic>
+#include <map>
 #include <set>
 #include <thread>
 
@@ -29,11 +30,26 @@ class WorkerPoolTest : public ::testing::Test {
   }
 
   PoolOutcome Parse(WorkerPool& pool, const std::string& what) {
+    const std::vector<PoolResult> results = ParseAll(pool, {what});
+    fields_ = ToMap(results.at(0).fields);
+    return results.at(0).outcome;
+  }
+  // As many requests for the same file.
+  std::vector<PoolResult> ParseAll(WorkerPool& pool, const std::vector<std::string>& whats) {
     const UniqueFd file = OpenToRead(dir_ / "file");
-    std::vector<Field> fields{{"TARNMDStale", std::string()}};
-    const PoolOutcome outcome = pool.Parse(file.get(), what, "a name", &fields);
-    fields_ = ToMap(fields);
-    return outcome;
+    std::vector<PoolFile> files;
+    for (const std::string& what : whats) files.push_back({file.get(), what, "a name"});
+    return pool.Parse(files);
+  }
+  // What became of each file: "done", "bad", "broken" or "stopped".
+  static std::vector<std::string> Names(const std::vector<PoolResult>& results) {
+    std::vector<std::string> names;
+    for (const PoolResult& result : results) {
+      static constexpr const char* kNames[] = {"done", "bad", "broken", "stopped"};
+      names.emplace_back(kNames[static_cast<int>(result.outcome)]);
+      EXPECT_TRUE(result.outcome == PoolOutcome::kDone || result.fields.empty());
+    }
+    return names;
   }
   std::string PidOf(WorkerPool& pool) {
     EXPECT_EQ(Parse(pool, "pid"), PoolOutcome::kDone);
@@ -135,9 +151,7 @@ TEST_F(WorkerPoolTest, StopEndsWhoWorksAndWhoWaits) {
   std::vector<std::thread> threads;
   for (int i = 0; i < 3; ++i) {
     threads.emplace_back([&] {
-      const UniqueFd file = OpenToRead(dir_ / "file");
-      std::vector<Field> fields;
-      if (pool.Parse(file.get(), "stall", "", &fields) == PoolOutcome::kStopped) ++stopped;
+      if (ParseAll(pool, {"stall"}).at(0).outcome == PoolOutcome::kStopped) ++stopped;
     });
   }
   EXPECT_TRUE(test::WaitUntil([&] { return pool.WorkerCount() == 1; }));
@@ -155,6 +169,78 @@ TEST_F(WorkerPoolTest, StopEndsWhoStartsAWorker) {
   parser.join();
 }
 
+using Texts = std::vector<std::string>;
+
+TEST_F(WorkerPoolTest, AFileThatKillsCostsOnlyItselfWhateverCameBefore) {
+  for (const char* what : {"crash", "leave", "garbage", "other", "endless"}) {
+    WorkerPool pool(options_);
+    EXPECT_EQ(Names(ParseAll(pool, {"good", what, "pid", what, what, "good", "good"})),
+              (Texts{"done", "bad", "done", "bad", "bad", "done", "done"}))
+        << what;
+    EXPECT_EQ(Names(ParseAll(pool, {what})), (Texts{"bad"})) << what;
+  }
+}
+
+TEST_F(WorkerPoolTest, AFileThatKillsUsedWorkersOnlyIsDoneAmongOthers) {
+  WorkerPool pool(options_);
+  const std::vector<PoolResult> results =
+      ParseAll(pool, {"good", "usedcrash", "good", "usedcrash", "usedcrash"});
+  EXPECT_EQ(Names(results), (Texts(5, "done")));
+  for (const PoolResult& each : results) {
+    EXPECT_EQ(ToMap(each.fields)["TARNMDTextContent"], "some words");
+  }
+}
+
+TEST_F(WorkerPoolTest, FilesBehindALateAnswerGetTheirOwn) {
+  WorkerPool pool(options_);
+  const std::vector<PoolResult> results = ParseAll(pool, {"good", "ahead", "good", "pid"});
+  EXPECT_EQ(Names(results), (Texts(4, "done")));
+  EXPECT_EQ(ToMap(results[1].fields)["TARNMDTitle"], "early");
+  EXPECT_EQ(ToMap(results[2].fields)["TARNMDTextContent"], "some words");
+  EXPECT_EQ(ToMap(results[2].fields).count("TARNMDTitle"), 1u);
+  EXPECT_EQ(ToMap(results[3].fields)["TARNMDTitle"], PidOf(pool));
+}
+
+TEST_F(WorkerPoolTest, FilesBehindOneThatStallsAreGivenBack) {
+  options_.file_timeout = seconds(2);
+  WorkerPool pool(options_);
+  EXPECT_EQ(Names(ParseAll(pool, {"good", "stall", "good", "good"})), (Texts{"done", "bad"}));
+  EXPECT_EQ(Names(ParseAll(pool, {"good", "good"})), (Texts{"done", "done"}));
+}
+
+TEST_F(WorkerPoolTest, ReplacesAWorkerBetweenFilesThatCameTogether) {
+  options_.files_per_worker = 3;
+  WorkerPool pool(options_);
+  std::map<std::string, int> files_of;
+  for (const PoolResult& each : ParseAll(pool, Texts(10, "pid"))) {
+    ++files_of[ToMap(each.fields)["TARNMDTitle"]];
+  }
+  EXPECT_EQ(files_of.size(), 4u);
+  for (const auto& [pid, files] : files_of) EXPECT_LE(files, 3) << pid;
+}
+
+TEST_F(WorkerPoolTest, MoreFilesThanAWorkerTakesAtATimeAreAllDone) {
+  WorkerPool pool(options_);
+  EXPECT_EQ(Names(ParseAll(pool, Texts(2000, "good"))), Texts(2000, "done"));
+}
+
+TEST_F(WorkerPoolTest, WithoutWorkersAllFilesAreToldSo) {
+  options_.command = HostileWorker("open");
+  WorkerPool pool(options_);
+  EXPECT_EQ(Names(ParseAll(pool, {"good", "good"})), (Texts{"broken", "broken"}));
+}
+
+TEST_F(WorkerPoolTest, StopEndsFilesThatCameTogether) {
+  WorkerPool pool(options_);
+  std::thread parser([&] {
+    const Texts names = Names(ParseAll(pool, {"good", "stall", "good"}));
+    EXPECT_TRUE(names == (Texts{"done", "stopped", "stopped"}) || names == Texts(3, "stopped"));
+  });
+  EXPECT_TRUE(test::WaitUntil([&] { return pool.WorkerCount() == 1; }));
+  pool.Stop();
+  parser.join();
+}
+
 // Many at once, bad ones among them: each gets what is its own.
 TEST_F(WorkerPoolTest, BadFilesTakeNoOthersDown) {
   options_.workers = 3;
@@ -165,13 +251,20 @@ TEST_F(WorkerPoolTest, BadFilesTakeNoOthersDown) {
     threads.emplace_back([&, t] {
       const std::string path = dir_ / std::to_string(t);
       test::WriteFile(path, "words of " + std::to_string(t));
-      for (int i = 0; i < 12; ++i) {
+      for (int i = 0; i < 8; ++i) {
         const UniqueFd file = OpenToRead(path);
-        std::vector<Field> fields;
-        const bool bad = (t + i) % 5 == 0;
-        const PoolOutcome outcome = pool.Parse(file.get(), bad ? "crash" : "good", path, &fields);
-        EXPECT_EQ(outcome, bad ? PoolOutcome::kBadFile : PoolOutcome::kDone);
-        EXPECT_EQ(ToMap(fields)["TARNMDTextContent"], bad ? "" : "words of " + std::to_string(t));
+        std::vector<PoolFile> files;
+        for (int k = 0; k <= i; ++k) {
+          files.push_back({file.get(), (t + i + k) % 5 == 0 ? "crash" : "good", path});
+        }
+        const std::vector<PoolResult> results = pool.Parse(files);
+        ASSERT_EQ(results.size(), files.size());
+        for (std::size_t k = 0; k < files.size(); ++k) {
+          const bool bad = files[k].extension == "crash";
+          EXPECT_EQ(results[k].outcome, bad ? PoolOutcome::kBadFile : PoolOutcome::kDone);
+          EXPECT_EQ(ToMap(results[k].fields)["TARNMDTextContent"],
+                    bad ? "" : "words of " + std::to_string(t));
+        }
         EXPECT_LE(pool.WorkerCount(), 3u);
       }
     });

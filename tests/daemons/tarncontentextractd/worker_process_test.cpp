@@ -32,9 +32,19 @@ class WorkerProcessTest : public ::testing::Test {
 
   WorkerOutcome Parse(WorkerProcess& worker, const std::string& what,
                       milliseconds timeout = kPatience) {
-    std::vector<Field> fields{{"TARNMDStale", std::string()}};
-    const WorkerOutcome outcome = worker.Parse(file_.get(), what, timeout, &fields);
-    fields_ = ToMap(fields);
+    const WorkerOutcome outcome = ParseAll(worker, {what}, timeout);
+    fields_ = all_.empty() ? Fields() : all_[0];
+    return outcome;
+  }
+  // As many requests for the same file.
+  WorkerOutcome ParseAll(WorkerProcess& worker, const std::vector<std::string>& whats,
+                         milliseconds timeout = kPatience) {
+    std::vector<WorkerFile> files;
+    for (const std::string& what : whats) files.push_back({file_.get(), what});
+    std::vector<std::vector<Field>> all(2, {{"TARNMDStale", std::string()}});
+    const WorkerOutcome outcome = worker.Parse(files, timeout, &all);
+    all_.clear();
+    for (const std::vector<Field>& each : all) all_.push_back(ToMap(each));
     return outcome;
   }
 
@@ -60,6 +70,7 @@ class WorkerProcessTest : public ::testing::Test {
   test::TempDir dir_;
   UniqueFd file_;
   Fields fields_;
+  std::vector<Fields> all_;
 };
 
 class Forbidden : public WorkerProcessTest, public ::testing::WithParamInterface<const char*> {};
@@ -157,6 +168,7 @@ INSTANTIATE_TEST_SUITE_P(Ways, Deaths,
                                            Death{"leave", "ended with code 0"},
                                            Death{"memory", "ended with code 4"},
                                            Death{"garbage", "was ended by signal 9"},
+                                           Death{"other", "was ended by signal 9"},
                                            Death{"endless", "was ended by signal 9"}),
                          [](const auto& death) { return std::string(death.param.what); });
 
@@ -181,6 +193,70 @@ TEST_F(WorkerProcessTest, AnAnswerThatWasNotAskedForIsNotTakenForTheNextFile) {
   ASSERT_EQ(Parse(worker, "ahead"), WorkerOutcome::kDone);
   EXPECT_EQ(Parse(worker, "good"), WorkerOutcome::kDied);
 }
+
+TEST_F(WorkerProcessTest, TakesManyFilesAtATime) {
+  WorkerProcess worker(HostileWorker(), kPatience, -1);
+  for (std::size_t count : {1u, 2u, 30u}) {
+    ASSERT_EQ(ParseAll(worker, std::vector<std::string>(count, "descriptors")),
+              WorkerOutcome::kDone);
+    ASSERT_EQ(all_.size(), count);
+    for (Fields& each : all_) EXPECT_EQ(each["TARNMDTitle"], "0 1 2 3 4");
+  }
+  EXPECT_EQ(worker.FilesDone(), 33u);
+}
+
+TEST_F(WorkerProcessTest, TakesNoMoreAtATimeThanThereIsRoomFor) {
+  WorkerProcess worker(HostileWorker(), kPatience, -1);
+  std::size_t done = 0;
+  for (int round = 0; round < 3; ++round) {
+    ASSERT_EQ(ParseAll(worker, std::vector<std::string>(5000, "good")), WorkerOutcome::kDone);
+    EXPECT_GE(all_.size(), 8u);
+    EXPECT_LT(all_.size(), 5000u);
+    for (Fields& each : all_) EXPECT_EQ(each["TARNMDTextContent"], "some words");
+    done += all_.size();
+  }
+  EXPECT_EQ(worker.FilesDone(), done);
+}
+
+TEST_F(WorkerProcessTest, LongAnswersFollowEachOther) {
+  const std::string words(std::size_t{5} << 20, 'w');
+  test::WriteFile(dir_ / "long", words);
+  file_ = OpenToRead(dir_ / "long");
+  WorkerProcess worker(HostileWorker(), kPatience, -1);
+  ASSERT_EQ(ParseAll(worker, {"good", "pid", "good", "good"}), WorkerOutcome::kDone);
+  ASSERT_EQ(all_.size(), 4u);
+  for (const std::size_t i : {0u, 2u, 3u}) EXPECT_TRUE(all_[i]["TARNMDTextContent"] == words);
+  EXPECT_EQ(all_[1]["TARNMDTitle"], std::to_string(worker.pid()));
+  EXPECT_EQ(Parse(worker, "pid"), WorkerOutcome::kDone);
+}
+
+struct MiddleEnd {
+  const char* what;
+  WorkerOutcome outcome;
+  std::size_t answers;
+};
+
+class InTheMiddle : public WorkerProcessTest, public ::testing::WithParamInterface<MiddleEnd> {};
+
+TEST_P(InTheMiddle, WhatWasAnsweredBeforeIsKept) {
+  WorkerProcess worker(HostileWorker(), kPatience, -1);
+  EXPECT_EQ(ParseAll(worker, {"good", "pid", GetParam().what, "good", "good"}, seconds(2)),
+            GetParam().outcome);
+  ASSERT_EQ(all_.size(), GetParam().answers);
+  EXPECT_EQ(all_[0]["TARNMDTextContent"], "some words");
+  EXPECT_EQ(all_[1]["TARNMDTitle"], std::to_string(worker.pid()));
+}
+
+INSTANTIATE_TEST_SUITE_P(Ways, InTheMiddle,
+                         ::testing::Values(MiddleEnd{"crash", WorkerOutcome::kDied, 2},
+                                           MiddleEnd{"leave", WorkerOutcome::kDied, 2},
+                                           MiddleEnd{"garbage", WorkerOutcome::kDied, 2},
+                                           MiddleEnd{"endless", WorkerOutcome::kDied, 2},
+                                           MiddleEnd{"other", WorkerOutcome::kDied, 2},
+                                           // The first of its answers is its own.
+                                           MiddleEnd{"ahead", WorkerOutcome::kDied, 3},
+                                           MiddleEnd{"stall", WorkerOutcome::kTimedOut, 2}),
+                         [](const auto& way) { return std::string(way.param.what); });
 
 TEST_F(WorkerProcessTest, AFormatThatGivesUpKeepsWhatItFound) {
   WorkerProcess worker(HostileWorker(), kPatience, -1);

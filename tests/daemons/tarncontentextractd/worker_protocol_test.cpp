@@ -106,6 +106,19 @@ TEST(Fields, ChangedAtRandomNeverBreakTheReader) {
   }
 }
 
+TEST(Answer, IsReadByItsNumberOnly) {
+  const std::string message = MakeAnswer(3, Sample());
+  const std::string_view answer = std::string_view(message).substr(sizeof(std::uint32_t));
+  EXPECT_EQ(message, MakeMessage(answer));
+  std::vector<Field> out;
+  ASSERT_TRUE(ReadAnswer(answer, 3, &out));
+  EXPECT_EQ(ToMap(out), ToMap(Sample()));
+  EXPECT_FALSE(ReadAnswer(answer, 4, &out));
+  EXPECT_TRUE(out.empty());
+  for (const char* bad : {"", "123", "3\0\0\0x"}) EXPECT_FALSE(ReadAnswer(bad, 3, &out));
+  EXPECT_TRUE(ReadAnswer(std::string_view("\3\0\0\0", 4), 3, &out));
+}
+
 class Channel : public ::testing::Test {
  protected:
   Channel() {
@@ -117,47 +130,65 @@ class Channel : public ::testing::Test {
   void Write(const std::string& bytes) {
     ASSERT_EQ(write(daemon_.get(), bytes.data(), bytes.size()), static_cast<ssize_t>(bytes.size()));
   }
-  bool Receive() { return ReceiveRequest(worker_.get(), &extension_, &file_); }
+  bool Send(const std::string& extension, std::uint32_t number = 7) {
+    return SendRequest(daemon_.get(), number, extension, null_.get());
+  }
+  bool Receive() { return ReceiveRequest(worker_.get(), &request_); }
 
   UniqueFd daemon_;
   UniqueFd worker_;
-  std::string extension_;
-  UniqueFd file_;
+  UniqueFd null_ = OpenToRead("/dev/null");
+  Request request_;
 };
 
 TEST_F(Channel, ARequestBringsTheFileItself) {
-  const UniqueFd null = OpenToRead("/dev/null");
-  ASSERT_TRUE(SendRequest(daemon_.get(), "txt", null.get()));
+  ASSERT_TRUE(Send("txt"));
   ASSERT_TRUE(Receive());
-  EXPECT_EQ(extension_, "txt");
+  EXPECT_EQ(request_.extension, "txt");
+  EXPECT_EQ(request_.number, 7u);
   struct stat sent {};
   struct stat received {};
-  ASSERT_EQ(fstat(null.get(), &sent), 0);
-  ASSERT_EQ(fstat(file_.get(), &received), 0);
+  ASSERT_EQ(fstat(null_.get(), &sent), 0);
+  ASSERT_EQ(fstat(request_.file.get(), &received), 0);
   EXPECT_EQ(sent.st_rdev, received.st_rdev);
-  EXPECT_EQ(fcntl(file_.get(), F_GETFD) & FD_CLOEXEC, FD_CLOEXEC);
+  EXPECT_EQ(fcntl(request_.file.get(), F_GETFD) & FD_CLOEXEC, FD_CLOEXEC);
 }
 
 TEST_F(Channel, ExtensionsAreOfAnyBytesAndCutAtTheirBound) {
-  const UniqueFd null = OpenToRead("/dev/null");
   for (const std::string& extension :
        {std::string(), std::string("\xFF\0\n", 3), std::string(kMaxExtensionBytes, 'x')}) {
-    ASSERT_TRUE(SendRequest(daemon_.get(), extension, null.get()));
+    ASSERT_TRUE(Send(extension));
     ASSERT_TRUE(Receive());
-    EXPECT_EQ(extension_, extension);
+    EXPECT_EQ(request_.extension, extension);
   }
-  ASSERT_TRUE(SendRequest(daemon_.get(), std::string(1000, 'x'), null.get()));
+  ASSERT_TRUE(Send(std::string(1000, 'x')));
   ASSERT_TRUE(Receive());
-  EXPECT_EQ(extension_, std::string(kMaxExtensionBytes, 'x'));
+  EXPECT_EQ(request_.extension, std::string(kMaxExtensionBytes, 'x'));
 }
 
 TEST_F(Channel, ARequestWithoutAFileIsNone) {
-  Write(MakeMessage("txt"));
+  Write(MakeMessage("1234txt"));
   EXPECT_FALSE(Receive());
 }
 
+TEST_F(Channel, ARequestWithoutANumberIsNone) {
+  Write(MakeMessage("123"));
+  EXPECT_FALSE(Receive());
+}
+
+TEST_F(Channel, RequestsThatWaitAreTakenOneByOne) {
+  for (std::uint32_t number = 0; number < 20; ++number) {
+    ASSERT_TRUE(Send(std::string(number, 'x'), number));
+  }
+  for (std::uint32_t number = 0; number < 20; ++number) {
+    ASSERT_TRUE(Receive());
+    EXPECT_EQ(request_.number, number);
+    EXPECT_EQ(request_.extension, std::string(number, 'x'));
+  }
+}
+
 TEST_F(Channel, ARequestThatIsTooLongIsNone) {
-  Write(MakeMessage(std::string(kMaxExtensionBytes + 1, 'x')));
+  Write(MakeMessage(std::string(kMaxExtensionBytes + 5, 'x')));
   EXPECT_FALSE(Receive());
 }
 
@@ -169,22 +200,20 @@ TEST_F(Channel, ARequestThatEndsEarlyIsNone) {
 }
 
 TEST_F(Channel, AWorkerThatTakesNothingDoesNotHoldTheDaemonUp) {
-  const UniqueFd null = OpenToRead("/dev/null");
   int sent = 0;
-  while (sent < 1000000 && SendRequest(daemon_.get(), "txt", null.get())) ++sent;
+  while (sent < 1000000 && Send("txt")) ++sent;
   EXPECT_GT(sent, 0);
   EXPECT_LT(sent, 1000000);
 }
 
 TEST_F(Channel, AWorkerThatIsGoneIsNoticed) {
-  const UniqueFd null = OpenToRead("/dev/null");
   worker_.Reset();
-  EXPECT_FALSE(SendRequest(daemon_.get(), "txt", null.get()));
+  EXPECT_FALSE(Send("txt"));
 }
 
 TEST_F(Channel, ALongAnswerArrivesWhole) {
   const std::string text(std::size_t{4} << 20, 'x');
-  std::thread sender([&] { EXPECT_TRUE(SendAnswer(worker_.get(), text)); });
+  std::thread sender([&] { EXPECT_TRUE(SendMessage(worker_.get(), MakeMessage(text))); });
   std::string received(text.size() + sizeof(std::uint32_t), '\0');
   EXPECT_EQ(recv(daemon_.get(), received.data(), received.size(), MSG_WAITALL),
             static_cast<ssize_t>(received.size()));

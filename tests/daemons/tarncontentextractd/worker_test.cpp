@@ -4,6 +4,7 @@
 
 #include <gtest/gtest.h>
 #include <sys/socket.h>
+#include <unistd.h>
 
 #include <stdexcept>
 #include <thread>
@@ -60,9 +61,9 @@ class WorkerTest : public ::testing::Test {
   }
   Fields Ask(const std::string& bytes, const std::string& extension) {
     test::WriteFile(dir_ / "file", bytes);
-    EXPECT_TRUE(SendRequest(daemon_.get(), extension, OpenToRead(dir_ / "file").get()));
+    EXPECT_TRUE(SendRequest(daemon_.get(), 5, extension, OpenToRead(dir_ / "file").get()));
     std::vector<Field> fields;
-    EXPECT_TRUE(DecodeFields(Receive(), &fields));
+    EXPECT_TRUE(ReadAnswer(Receive(), 5, &fields));
     return ToMap(fields);
   }
 
@@ -89,8 +90,25 @@ TEST_F(WorkerTest, ServesFileAfterFileUntilTheChannelCloses) {
   worker.join();
 }
 
+TEST_F(WorkerTest, AnswersWhatWaitsInItsOrder) {
+  for (std::uint32_t number = 0; number < 20; ++number) {
+    test::WriteFile(dir_ / "file", "words of " + std::to_string(number));
+    const UniqueFd file = OpenToRead(dir_ / "file");
+    ASSERT_TRUE(SendRequest(daemon_.get(), number, "txt", file.get()));
+    ASSERT_EQ(unlink((dir_ / "file").c_str()), 0);
+  }
+  std::thread worker([this] { ServeFiles(StandardRegistry(), worker_.get(), kSeconds); });
+  for (std::uint32_t number = 0; number < 20; ++number) {
+    std::vector<Field> fields;
+    EXPECT_TRUE(ReadAnswer(Receive(), number, &fields));
+    EXPECT_EQ(ToMap(fields)["TARNMDTextContent"], "words of " + std::to_string(number));
+  }
+  daemon_.Reset();
+  worker.join();
+}
+
 TEST_F(WorkerTest, EndsAtARequestThatIsNone) {
-  const std::string request = MakeMessage("txt");
+  const std::string request = MakeMessage("1234txt");
   ASSERT_GT(send(daemon_.get(), request.data(), request.size(), MSG_NOSIGNAL), 0);
   ServeFiles(StandardRegistry(), worker_.get(), kSeconds);
   EXPECT_EQ(send(daemon_.get(), "", 0, MSG_NOSIGNAL), 0);

@@ -127,7 +127,8 @@ class HostileExtractor : public Extractor {
     if (what == "spin") Spin();
     if (what == "memory") Devour();
     if (what == "throw") Throw(out);
-    if (what == "garbage") SendAnswer(kWorkerChannel, "no fields at all");
+    if (what == "garbage") SendMessage(kWorkerChannel, MakeMessage("no fields at all"));
+    if (what == "other") AnswerFor(files_seen + 5);
     if (what == "endless") ClaimMuch();
     if (what == "ahead") AnswerTwice();
     if (what == "usedcrash" && files_seen > 1) raise(SIGKILL);
@@ -151,9 +152,14 @@ class HostileExtractor : public Extractor {
   }
   // So that what comes next is one answer late.
   static void AnswerTwice() {
-    const std::string answer = MakeMessage(EncodeFields({{kTitleField, std::string("early")}}));
-    const std::string both = answer + answer;
-    if (write(kWorkerChannel, both.data(), both.size()) < 0) _exit(1);
+    AnswerFor(files_seen - 1);
+    AnswerFor(files_seen - 1);
+  }
+  // Requests are counted from 0.
+  static void AnswerFor(int number) {
+    const std::string answer =
+        MakeAnswer(static_cast<std::uint32_t>(number), {{kTitleField, std::string("early")}});
+    if (!SendMessage(kWorkerChannel, answer)) _exit(1);
   }
   // Claims an answer of 4 GiB.
   [[noreturn]] static void ClaimMuch() {
@@ -167,7 +173,7 @@ int Main(const std::string& mode) {
   const int channel = kWorkerChannel;
   if (mode == "dies") return 7;
   if (mode == "silent") Stall();
-  if (mode == "talks") return SendAnswer(channel, "nonsense") ? 0 : 1;
+  if (mode == "talks") return SendMessage(channel, MakeMessage("nonsense")) ? 0 : 1;
   if (mode == "open") return Announce(channel, FindGap()) ? 0 : kExitNotClosed;
   Registry registry;
   registry.Add(std::make_unique<HostileExtractor>());
