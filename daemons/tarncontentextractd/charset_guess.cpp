@@ -25,16 +25,19 @@ bool IsControl(unsigned char c) {
   return c < 0x08 || (c > 0x0D && c < 0x20 && c != 0x1B) || c == 0x7F;
 }
 
-// Eight ASCII characters at once that need no closer look: none of them below a blank.
-bool IsPlainEight(const char* at) {
-  std::uint64_t word = 0;
-  std::memcpy(&word, at, sizeof(word));
-  constexpr std::uint64_t kHigh = 0x8080808080808080u;
-  constexpr std::uint64_t kOnes = 0x0101010101010101u;
-  if ((word & kHigh) != 0) return false;
-  const bool any_below_blank = (((word | kHigh) - kOnes * 0x20) & kHigh) != kHigh;
-  const bool any_delete = ((word + kOnes) & kHigh) != 0;
-  return !any_below_blank && !any_delete;
+// So many characters are looked at together; compilers do that at once.
+constexpr std::size_t kBlock = 32;
+
+// Whether these are ASCII characters that need no closer look: nothing that CountAscii counts.
+bool IsPlainBlock(const char* at) {
+  unsigned char odd = 0;
+  for (std::size_t i = 0; i < kBlock; ++i) {
+    const auto c = static_cast<unsigned char>(at[i]);
+    const unsigned printable = static_cast<unsigned char>(c - 0x20) < 0x7F - 0x20 ? 1 : 0;
+    const unsigned space = static_cast<unsigned char>(c - 0x08) < 0x0E - 0x08 ? 1 : 0;
+    odd = static_cast<unsigned char>(odd | ((printable | space) ^ 1));
+  }
+  return odd == 0;
 }
 
 void CountAscii(std::string_view bytes, std::size_t at, ByteCounts* counts) {
@@ -164,13 +167,18 @@ ByteCounts CountBytes(std::string_view bytes) {
   counts.size = bytes.size();
   std::size_t at = 0;
   while (at < bytes.size()) {
-    if (bytes.size() - at >= 8 && IsPlainEight(bytes.data() + at)) {
-      at += 8;
-    } else if (IsAsciiByte(bytes[at])) {
-      CountAscii(bytes, at, &counts);
-      ++at;
-    } else {
-      CountHigh(bytes, &at, &counts);
+    if (bytes.size() - at >= kBlock && IsPlainBlock(bytes.data() + at)) {
+      at += kBlock;
+      continue;
+    }
+    const std::size_t end = std::min(at + kBlock, bytes.size());
+    while (at < end) {
+      if (IsAsciiByte(bytes[at])) {
+        CountAscii(bytes, at, &counts);
+        ++at;
+      } else {
+        CountHigh(bytes, &at, &counts);
+      }
     }
   }
   return counts;

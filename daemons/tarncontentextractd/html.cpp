@@ -2,7 +2,6 @@
 
 #include <libxml/HTMLparser.h>
 
-#include <algorithm>
 #include <memory>
 #include <utility>
 
@@ -59,7 +58,9 @@ xmlSAXHandler Handler() {
 
 // The parser takes a NUL for the end.
 void ReplaceNuls(std::string& text) {
-  std::replace(text.begin(), text.end(), '\0', ' ');
+  for (std::size_t at = text.find('\0'); at != std::string::npos; at = text.find('\0', at)) {
+    text[at] = ' ';
+  }
 }
 
 // Returns false, with `out` as it was, where that cannot be done.
@@ -76,6 +77,7 @@ class HtmlExtractor : public Extractor {
   const char* Name() const override { return "html"; }
 
   bool Recognizes(std::string_view head) const override {
+    if (!BeginsLikeMarkup(head)) return false;
     const std::string start = AsciiLower(AsciiHead(head));
     for (const std::string_view mark : {"<!doctype html", "<html"}) {
       if (start.substr(0, mark.size()) == mark) return true;

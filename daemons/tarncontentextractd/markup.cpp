@@ -93,6 +93,16 @@ std::string AsciiHead(std::string_view head) {
   return std::string(SkipSpace(ascii));
 }
 
+bool BeginsLikeMarkup(std::string_view head) {
+  for (const char c : head.substr(0, kAsciiHeadBytes)) {
+    if (c == '<') return true;
+    const bool passed = IsSpace(c) || c == '\0' || static_cast<unsigned char>(c) >= 0xFE ||
+                        c == '\xEF' || c == '\xBB' || c == '\xBF';
+    if (!passed) return false;
+  }
+  return false;
+}
+
 std::string DeclaredCharset(std::string_view bytes) {
   const std::string_view head = bytes.substr(0, kDeclarationBytes);
   for (const std::string_view word : {"encoding", "charset"}) {

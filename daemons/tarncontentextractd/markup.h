@@ -30,6 +30,9 @@ std::string_view SkipSpace(std::string_view text);
 // recognised as well, and so is a mark in front. At most the first KiB.
 std::string AsciiHead(std::string_view head);
 
+// Whether AsciiHead might begin with "<". Most files are told from markup by that alone.
+bool BeginsLikeMarkup(std::string_view head);
+
 // The encoding that a text names for itself, as HTML ("charset=") or XML ("encoding=") does it in
 // its first 4 KiB; empty where it does not.
 std::string DeclaredCharset(std::string_view bytes);

@@ -30,6 +30,44 @@ bool IsInvisible(std::int32_t c) {
          (c >= 0x2060 && c <= 0x2069) || U_IS_UNICODE_NONCHAR(c);
 }
 
+bool IsLooseSpace(char c) {
+  return c == ' ' || c == '\n';
+}
+
+// Behind the plain characters from `at` on.
+std::size_t PlainEnd(std::string_view utf8, std::size_t at) {
+  while (at < utf8.size() && IsPlainAscii(utf8[at])) ++at;
+  return at;
+}
+
+// So many characters are looked at together; compilers do that at once.
+constexpr std::size_t kBlock = 32;
+
+// Whether there are only plain characters and, each in front of one, single blanks and line feeds.
+bool IsCleanBlock(const char* at) {
+  unsigned char odd = 0;
+  for (std::size_t i = 0; i < kBlock; ++i) {
+    const unsigned plain = IsPlainAscii(at[i]) ? 1 : 0;
+    const unsigned space = IsLooseSpace(at[i]) ? 1 : 0;
+    const unsigned next = IsPlainAscii(at[i + 1]) ? 1 : 0;
+    odd = static_cast<unsigned char>(odd | ((plain | (space & next)) ^ 1));
+  }
+  return odd == 0;
+}
+
+// Behind the text from `at` on, where a plain character stands, that is clean as it is. Ends with a
+// plain character.
+std::size_t CleanEnd(std::string_view utf8, std::size_t at) {
+  while (at + kBlock < utf8.size() && IsCleanBlock(utf8.data() + at)) at += kBlock;
+  while (true) {
+    at = PlainEnd(utf8, at);
+    const bool goes_on =
+        at + 1 < utf8.size() && IsLooseSpace(utf8[at]) && IsPlainAscii(utf8[at + 1]);
+    if (!goes_on) return at;
+    ++at;
+  }
+}
+
 }  // namespace
 
 void TextSink::Space() {
@@ -60,10 +98,12 @@ void TextSink::Put(std::string_view piece) {
   text_.append(piece);
 }
 
-// Most text is runs of these: they go in whole.
+// Most text is runs of plain characters, or of words that one blank or line feed keeps apart, which
+// is as it is to be: they go in whole.
 std::size_t TextSink::AppendPlainRun(std::string_view utf8, std::size_t at) {
-  std::size_t end = at;
-  while (end < utf8.size() && IsPlainAscii(utf8[end])) ++end;
+  // Of what does not fit no more is looked at, and the cut itself is left to Put.
+  const std::size_t room = limit_ - std::min(limit_, text_.size() + 1);
+  const std::size_t end = room == 0 ? PlainEnd(utf8, at) : CleanEnd(utf8.substr(0, at + room), at);
   Put(utf8.substr(at, end - at));
   return end;
 }

@@ -184,7 +184,7 @@ class XmlExtractor : public Extractor {
   const char* Name() const override { return "xml"; }
 
   bool Recognizes(std::string_view head) const override {
-    return AsciiHead(head).substr(0, 5) == "<?xml";
+    return BeginsLikeMarkup(head) && AsciiHead(head).substr(0, 5) == "<?xml";
   }
 
   bool Claims(std::string_view extension) const override {

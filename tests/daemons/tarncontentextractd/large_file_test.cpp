@@ -24,11 +24,11 @@ class LargeFile : public ::testing::Test {
  protected:
   // The text that a worker finds, which must survive it.
   std::string Parse(const std::string& extension) {
-    std::vector<Field> fields;
-    EXPECT_EQ(
-        worker_.Parse(OpenToRead(dir_ / "file").get(), extension, std::chrono::minutes(4), &fields),
-        WorkerOutcome::kDone);
-    return ToMap(fields)["TARNMDTextContent"];
+    const UniqueFd file = OpenToRead(dir_ / "file");
+    std::vector<std::vector<Field>> answers;
+    EXPECT_EQ(worker_.Parse({{file.get(), extension}}, std::chrono::minutes(4), &answers),
+              WorkerOutcome::kDone);
+    return answers.empty() ? std::string() : ToMap(answers[0])["TARNMDTextContent"];
   }
   std::string TextOfFile(const std::string& bytes, const std::string& extension) {
     test::WriteFile(dir_ / "file", bytes);

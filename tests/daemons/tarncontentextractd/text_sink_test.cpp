@@ -113,6 +113,74 @@ TEST(TextSink, MakesValidUtf8OfAnything) {
   }
 }
 
+// Character by character, as the rules are written.
+std::string CleanedSlowly(const std::string& utf8, std::size_t limit) {
+  std::string text;
+  char gap = 0;
+  for (std::size_t at = 0; at < utf8.size();) {
+    const std::size_t start = at;
+    const std::int32_t c = NextCharacter(utf8, &at);
+    if (c == '\n' || c == '\r' || c == 0x0B || c == 0x0C || c == 0x85 || c == 0x2028) {
+      gap = '\n';
+    } else if ((c >= 0 && c <= 0x20) || (c >= 0x7F && c <= 0xA0) || c == 0x3000) {
+      gap = gap == 0 ? ' ' : gap;
+    } else if (c != 0xAD) {
+      std::string piece = c < 0 ? "\xEF\xBF\xBD" : utf8.substr(start, at - start);
+      if (gap != 0 && !text.empty()) piece.insert(0, 1, gap);
+      if (text.size() + piece.size() > limit) break;
+      text += piece;
+      gap = 0;
+    }
+  }
+  return text;
+}
+
+TEST(TextSink, IsAsGoodAsASlowOneWhateverThePieces) {
+  const std::vector<std::string> pieces{"word",
+                                        "a",
+                                        " ",
+                                        "\n",
+                                        "\t",
+                                        "\r\n",
+                                        "  ",
+                                        "\xC3\xA9",
+                                        "\xC2\xA0",
+                                        "\xE4\xB8\xAD",
+                                        "\xC2\xAD",
+                                        "\x7F",
+                                        "\x01",
+                                        ".",
+                                        "\xFF",
+                                        "\xE3\x80\x80",
+                                        "a b c d e f g h i j k l m n o p\nq"};
+  std::mt19937 random(3);
+  for (int round = 0; round < 5000; ++round) {
+    TextSink whole(1 << 20);
+    std::string all;
+    for (auto count = random() % 12; count > 0; --count) {
+      std::string text;
+      for (auto parts = random() % 30; parts > 0; --parts) {
+        // Most of it words and single blanks, as in life.
+        const bool odd = random() % 8 == 0;
+        text +=
+            odd ? pieces[random() % pieces.size()] : "word" + std::string(1, " \n"[random() % 2]);
+      }
+      whole.Append(text);
+      all += text;
+    }
+    ASSERT_EQ(whole.text(), CleanedSlowly(all, 1 << 20)) << ::testing::PrintToString(all);
+    const std::size_t limit = random() % (all.size() + 2);
+    ASSERT_EQ(Clean(all, limit), CleanedSlowly(all, limit)) << ::testing::PrintToString(all);
+  }
+}
+
+TEST(TextSink, ALongRunIsCutAtTheLimit) {
+  std::string words;
+  while (words.size() < (std::size_t{8} << 20)) words += "word ";
+  const std::size_t limit = words.size() / 2;
+  EXPECT_TRUE(Clean(words, limit) == CleanedSlowly(words, limit));
+}
+
 // Against ICU's reading of every two bytes, and of every three and four that matter.
 TEST(Utf8, TellsCharactersFromOtherBytes) {
   const auto check = [](const std::string& bytes) {
