@@ -16,7 +16,7 @@ namespace {
 constexpr std::size_t kEntryBytes = 160;
 
 // Texts that wait to be cut into words take no more memory than that.
-constexpr std::size_t kCuttingBytes = std::size_t{4} << 20;
+constexpr std::size_t kCuttingBytes = std::size_t{16} << 20;
 
 constexpr const char* kBody = "body";
 constexpr char kMainIndex = '0';
@@ -113,7 +113,7 @@ void FtsBuffer::LeaveToCut(std::int64_t id, const std::shared_ptr<const std::str
   text->body = body;
   text->columns = UnpackTexts(schema_, *body);
   cutting_bytes_ += body->size();
-  cutting_.push_back({id, text, work_->Add([text, cutters = cutters_] {
+  cutting_.push_back({id, text, work_->Add(body->size(), [text, cutters = cutters_] {
                         text->words = cutters->Cut(text->columns);
                       })});
 }

@@ -1,6 +1,7 @@
 #include "daemons/tarnelasticd/side_work.h"
 
 #include <algorithm>
+#include <system_error>
 #include <utility>
 
 namespace quarry::engine {
@@ -17,28 +18,63 @@ class SideWork::Task {
   std::exception_ptr failure_;
 };
 
-std::shared_ptr<SideWork::Task> SideWork::Add(std::function<void()> run) {
+SideWork::~SideWork() {
+  {
+    const std::lock_guard<std::mutex> lock(mutex_);
+    large_.clear();
+  }
+  if (helper_.joinable()) helper_.join();
+}
+
+std::shared_ptr<SideWork::Task> SideWork::Add(std::size_t bytes, std::function<void()> run) {
   auto task = std::make_shared<Task>(std::move(run));
   const std::lock_guard<std::mutex> lock(mutex_);
-  waiting_.push_back(task);
+  if (bytes < kLarge) {
+    waiting_.push_back(task);
+    return task;
+  }
+  large_.push_back(task);
+  StartHelper();
   return task;
 }
 
-std::shared_ptr<SideWork::Task> SideWork::TakeFirst() noexcept {
+// Without a thread the task waits for who needs it.
+void SideWork::StartHelper() {
+  if (is_helping_) return;
+  if (helper_.joinable()) helper_.join();
+  try {
+    helper_ = std::thread([this] { Help(); });
+    is_helping_ = true;
+  } catch (const std::system_error&) {
+  }
+}
+
+void SideWork::Help() noexcept {
+  while (const std::shared_ptr<Task> task = TakeFirst(&large_)) Run(task.get());
+}
+
+// The helper ends when it is told that there is nothing.
+std::shared_ptr<SideWork::Task> SideWork::TakeFirst(Queue* queue) noexcept {
   const std::lock_guard<std::mutex> lock(mutex_);
-  if (waiting_.empty()) return nullptr;
-  std::shared_ptr<Task> task = std::move(waiting_.front());
-  waiting_.pop_front();
+  if (queue->empty()) {
+    if (queue == &large_) is_helping_ = false;
+    return nullptr;
+  }
+  std::shared_ptr<Task> task = std::move(queue->front());
+  queue->pop_front();
   return task;
 }
 
 // Whether nobody had begun it; nobody else will then.
 bool SideWork::Take(const std::shared_ptr<Task>& task) noexcept {
   const std::lock_guard<std::mutex> lock(mutex_);
-  const auto found = std::find(waiting_.begin(), waiting_.end(), task);
-  if (found == waiting_.end()) return false;
-  waiting_.erase(found);
-  return true;
+  for (Queue* queue : {&waiting_, &large_}) {
+    const auto found = std::find(queue->begin(), queue->end(), task);
+    if (found == queue->end()) continue;
+    queue->erase(found);
+    return true;
+  }
+  return false;
 }
 
 void SideWork::Run(Task* task) noexcept {
@@ -57,7 +93,7 @@ void SideWork::Run(Task* task) noexcept {
 }
 
 void SideWork::RunAll() noexcept {
-  while (const std::shared_ptr<Task> task = TakeFirst()) Run(task.get());
+  while (const std::shared_ptr<Task> task = TakeFirst(&waiting_)) Run(task.get());
 }
 
 bool SideWork::IsDone(const Task& task) const {

@@ -1,33 +1,43 @@
 // Work that a writer leaves to whoever has time for it.
 //
 // An index has one writer at a time, so what need not be done by it should not be: compressing
-// texts takes longer than storing them. There are no threads for it. Whoever has had the writer
-// does afterwards what has been left, while the next one writes already; what the writer needs
-// before that, it does itself.
+// texts takes longer than storing them. Whoever has had the writer does afterwards what has been
+// left, while the next one writes already; what the writer needs before that, it does itself. Only
+// for large tasks, which somebody would wait for, there is a thread, as long as there are any.
 
 #ifndef QUARRY_DAEMONS_TARNELASTICD_SIDE_WORK_H_
 #define QUARRY_DAEMONS_TARNELASTICD_SIDE_WORK_H_
 
 #include <condition_variable>
+#include <cstddef>
 #include <deque>
 #include <exception>
 #include <functional>
 #include <memory>
 #include <mutex>
+#include <thread>
 
 namespace quarry::engine {
 
-// Any thread. Blocks only in Finish().
+// Any thread. Blocks only in Finish(), and at the end for what is being done.
 class SideWork {
  public:
   class Task;
 
-  // Leaves `run`, which is called at most once, by any thread. What it uses must stay as long as
-  // the task does, also when nobody asks for it any more.
-  std::shared_ptr<Task> Add(std::function<void()> run);
+  SideWork() = default;
+  ~SideWork();
+  SideWork(const SideWork&) = delete;
+  SideWork& operator=(const SideWork&) = delete;
 
-  // Does all that nobody has begun.
+  // Leaves `run`, which works on so many bytes and is called at most once, by any thread. What it
+  // uses must stay as long as the task does, also when nobody asks for it any more.
+  std::shared_ptr<Task> Add(std::size_t bytes, std::function<void()> run);
+
+  // Does all that nobody has begun, but for what is large.
   void RunAll() noexcept;
+
+  // What works on so many bytes is large.
+  static constexpr std::size_t kLarge = std::size_t{1} << 20;
 
   bool IsDone(const Task& task) const;
   // Returns when the task has been done, by the caller where nobody has begun it. Throws what it
@@ -37,13 +47,19 @@ class SideWork {
   void Drop(const std::shared_ptr<Task>& task) noexcept;
 
  private:
-  std::shared_ptr<Task> TakeFirst() noexcept;
+  using Queue = std::deque<std::shared_ptr<Task>>;
+  void StartHelper();
+  void Help() noexcept;
+  std::shared_ptr<Task> TakeFirst(Queue* queue) noexcept;
   bool Take(const std::shared_ptr<Task>& task) noexcept;
   void Run(Task* task) noexcept;
 
   mutable std::mutex mutex_;
   std::condition_variable done_;
-  std::deque<std::shared_ptr<Task>> waiting_;  // guarded by mutex_
+  Queue waiting_;  // this and what follows: guarded by mutex_
+  Queue large_;
+  std::thread helper_;
+  bool is_helping_ = false;
 };
 
 }  // namespace quarry::engine

@@ -13,7 +13,9 @@
 namespace quarry::engine {
 namespace {
 
+// So many bytes of texts are open, and so many together with those that are being compressed.
 constexpr std::size_t kOpenBytes = std::size_t{4} << 20;
+constexpr std::size_t kHeldBytes = std::size_t{16} << 20;
 
 // What a text takes in memory beside its bytes.
 constexpr std::size_t kEntryBytes = 80;
@@ -170,7 +172,8 @@ void TextStore::Seal(std::int64_t key, Row* row) {
   sealed->texts = std::move(row->texts);
   row->texts.clear();
   row->sealed = sealed;
-  row->task = work_->Add([sealed, bytes = row->bytes, row_bytes = table_.row_bytes] {
+  sealed_bytes_ += row->bytes;
+  row->task = work_->Add(row->bytes, [sealed, bytes = row->bytes, row_bytes = table_.row_bytes] {
     sealed->packed = Pack(sealed->texts, bytes, row_bytes);
   });
 }
@@ -181,6 +184,7 @@ void TextStore::Unseal(Row* row) {
   work_->Drop(row->task);
   row->task.reset();
   row->sealed.reset();
+  sealed_bytes_ -= row->bytes;
 }
 
 // Puts into the table what has been compressed.
@@ -195,6 +199,7 @@ void TextStore::PlaceSealed() {
     }
     WriteOut(key, row->second);
     open_bytes_ -= row->second.bytes;
+    sealed_bytes_ -= row->second.bytes;
     rows_.erase(row);
     reader_.Clear();
   }
@@ -214,16 +219,20 @@ void TextStore::Write(std::int64_t id, std::string text) {
 }
 
 void TextStore::Write(std::int64_t id, std::shared_ptr<const std::string> text) {
-  if (open_bytes_ >= kOpenBytes) Flush();
   if (!sealed_.empty()) PlaceSealed();
-  Row& row = Open(id)->second;
+  if (open_bytes_ >= kHeldBytes || open_bytes_ - sealed_bytes_ >= kOpenBytes) Flush();
+  const auto opened = Open(id);
+  Row& row = opened->second;
   if (row.sealed) Unseal(&row);
   const auto kept = row.texts.find(id);
   const std::size_t freed = kept == row.texts.end() ? 0 : CostOf(*kept->second);
   row.bytes += CostOf(*text) - freed;
   open_bytes_ += CostOf(*text) - freed;
   if (!text->empty()) {
+    const bool is_full = text->size() >= table_.row_bytes;
     row.texts.insert_or_assign(id, std::move(text));
+    // Large ones take the longest, and nothing will join them.
+    if (is_full && row.texts.rbegin()->first == id) Seal(opened->first, &row);
   } else if (kept != row.texts.end()) {
     row.texts.erase(kept);
   }
@@ -277,6 +286,7 @@ void TextStore::Clear() {
   rows_.clear();
   sealed_.clear();
   open_bytes_ = 0;
+  sealed_bytes_ = 0;
 }
 
 }  // namespace quarry::engine

@@ -129,7 +129,8 @@ class TextStore {
   TextReader reader_;
   Rows rows_;                         // by the first id that is their own; they never meet
   std::vector<std::int64_t> sealed_;  // keys of rows_ that may be sealed
-  std::size_t open_bytes_ = 0;
+  std::size_t open_bytes_ = 0;        // of all rows
+  std::size_t sealed_bytes_ = 0;      // of these, of rows that are sealed
 };
 
 }  // namespace quarry::engine

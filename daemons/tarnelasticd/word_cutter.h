@@ -44,7 +44,7 @@ class WordCutter {
   // Cuts a text, given by its columns. What `cut` had is gone.
   void Cut(const std::vector<std::string_view>& columns, CutText* cut);
 
-  static constexpr std::size_t kMaxText = std::size_t{4} << 20;
+  static constexpr std::size_t kMaxText = std::size_t{12} << 20;
   static constexpr std::size_t kMaxWord = 1000;
 
  private:

@@ -116,14 +116,17 @@ void WordLists::CopyList(const Word& word, std::string* list) {
   list->clear();
   const char* block = word.first_block;
   std::uint32_t bytes = kFirstBlock;
-  for (std::uint32_t left = word.list_bytes;;) {
-    const std::uint32_t part = std::min(left, bytes);
-    list->append(block, part);
-    left -= part;
-    if (left == 0) return;
-    std::memcpy(&block, block + bytes, sizeof block);
+  std::uint32_t left = word.list_bytes;
+  while (left > bytes) {
+    const char* next = nullptr;
+    std::memcpy(&next, block + bytes, sizeof next);
+    __builtin_prefetch(next);
+    list->append(block, bytes);
+    left -= bytes;
+    block = next;
     bytes = std::min(2 * bytes, kLargestBlock);
   }
+  list->append(block, left);
 }
 
 std::size_t WordLists::bytes() const {
@@ -144,10 +147,16 @@ void WordLists::ForEach(const Visitor& visit) const {
     return std::string_view(a.word->text, a.word->size) <
            std::string_view(b.word->text, b.word->size);
   });
+  // Words lie in the order in which they came, so each would be waited for.
+  constexpr std::size_t kNear = 4;
+  constexpr std::size_t kFar = 8;
   std::string list;
-  for (const Place& place : order) {
-    CopyList(*place.word, &list);
-    visit({place.word->text, place.word->size}, list);
+  for (std::size_t i = 0; i < order.size(); ++i) {
+    if (i + kFar < order.size()) __builtin_prefetch(order[i + kFar].word);
+    if (i + kNear < order.size()) __builtin_prefetch(order[i + kNear].word->first_block);
+    const Word& word = *order[i].word;
+    CopyList(word, &list);
+    visit({word.text, word.size}, list);
   }
 }
 

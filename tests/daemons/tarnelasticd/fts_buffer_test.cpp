@@ -391,7 +391,7 @@ TEST_F(FtsBufferTest, TellsWhatHasFailedBesideIt) {
 TEST_F(FtsBufferTest, MayEndBeforeItsWork) {
   Begin();
   Insert(1, {"one", "", ""});
-  const auto task = work_.Add([] {});
+  const auto task = work_.Add(1, [] {});
   buffer_.reset();
   work_.Finish(task);
   work_.RunAll();

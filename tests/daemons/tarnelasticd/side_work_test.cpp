@@ -15,8 +15,8 @@ namespace {
 TEST(SideWorkTest, IsDoneOnceAndInOrder) {
   SideWork work;
   std::vector<int> done;
-  const auto first = work.Add([&done] { done.push_back(1); });
-  work.Add([&done] { done.push_back(2); });
+  const auto first = work.Add(1, [&done] { done.push_back(1); });
+  work.Add(1, [&done] { done.push_back(2); });
   EXPECT_FALSE(work.IsDone(*first));
   work.RunAll();
   EXPECT_TRUE(work.IsDone(*first));
@@ -29,8 +29,8 @@ TEST(SideWorkTest, WhoNeedsItDoesWhatNobodyHasBegun) {
   SideWork work;
   int others = 0;
   int done = 0;
-  work.Add([&others] { ++others; });
-  const auto task = work.Add([&done] { ++done; });
+  work.Add(1, [&others] { ++others; });
+  const auto task = work.Add(1, [&done] { ++done; });
   work.Finish(task);
   EXPECT_EQ(done, 1);
   EXPECT_EQ(others, 0);
@@ -44,7 +44,7 @@ TEST(SideWorkTest, WhoNeedsItWaitsForWhoHasBegun) {
   std::promise<void> begun;
   std::promise<void> may_end;
   int done = 0;
-  const auto task = work.Add([&] {
+  const auto task = work.Add(1, [&] {
     begun.set_value();
     may_end.get_future().wait();
     ++done;
@@ -61,11 +61,11 @@ TEST(SideWorkTest, WhoNeedsItWaitsForWhoHasBegun) {
 
 TEST(SideWorkTest, FailuresComeToWhoNeedsIt) {
   SideWork work;
-  const auto thrown = work.Add([] { throw std::runtime_error("failed"); });
-  const auto memory = work.Add([] { throw std::bad_alloc(); });
-  const auto own = work.Add([] { throw std::bad_alloc(); });
+  const auto thrown = work.Add(1, [] { throw std::runtime_error("failed"); });
+  const auto memory = work.Add(1, [] { throw std::bad_alloc(); });
+  const auto own = work.Add(1, [] { throw std::bad_alloc(); });
   int done = 0;
-  work.Finish(work.Add([&done] { ++done; }));
+  work.Finish(work.Add(1, [&done] { ++done; }));
   EXPECT_THROW(work.Finish(own), std::bad_alloc);
   work.RunAll();
   EXPECT_TRUE(work.IsDone(*thrown));
@@ -77,13 +77,69 @@ TEST(SideWorkTest, FailuresComeToWhoNeedsIt) {
 TEST(SideWorkTest, WhatIsDroppedIsNotBegun) {
   SideWork work;
   int done = 0;
-  const auto task = work.Add([&done] { ++done; });
-  const auto before = work.Add([&done] { ++done; });
+  const auto task = work.Add(1, [&done] { ++done; });
+  const auto before = work.Add(1, [&done] { ++done; });
   work.Finish(before);
   work.Drop(task);
   work.Drop(before);
   work.RunAll();
   EXPECT_EQ(done, 1);
+}
+
+TEST(SideWorkTest, WhatIsLargeIsDoneWithoutAnybody) {
+  SideWork work;
+  for (int round = 0; round < 20; ++round) {
+    std::promise<std::thread::id> doer;
+    const auto task =
+        work.Add(SideWork::kLarge, [&doer] { doer.set_value(std::this_thread::get_id()); });
+    EXPECT_NE(doer.get_future().get(), std::this_thread::get_id());
+    work.Finish(task);
+  }
+}
+
+TEST(SideWorkTest, WhoNeedsWhatIsLargeDoesItWhereTheThreadIsBusy) {
+  SideWork work;
+  std::promise<void> begun;
+  std::promise<void> may_end;
+  const auto busy = work.Add(SideWork::kLarge, [&] {
+    begun.set_value();
+    may_end.get_future().wait();
+  });
+  begun.get_future().wait();
+  std::thread::id doer;
+  const auto task = work.Add(SideWork::kLarge, [&doer] { doer = std::this_thread::get_id(); });
+  work.RunAll();
+  EXPECT_FALSE(work.IsDone(*task));
+  work.Finish(task);
+  EXPECT_EQ(doer, std::this_thread::get_id());
+  may_end.set_value();
+  work.Finish(busy);
+}
+
+TEST(SideWorkTest, EndsWhenWhatHasBegunIsDone) {
+  std::promise<void> begun;
+  std::promise<void> may_end;
+  std::atomic<int> done{0};
+  std::thread opener;
+  {
+    SideWork work;
+    work.Add(SideWork::kLarge, [&] {
+      begun.set_value();
+      may_end.get_future().wait();
+      ++done;
+    });
+    begun.get_future().wait();
+    work.Add(1, [&done] { done += 100; });
+    opener = std::thread([&may_end] { may_end.set_value(); });
+  }
+  EXPECT_EQ(done, 1);
+  opener.join();
+}
+
+TEST(SideWorkTest, FailuresOfWhatIsLargeComeToWhoNeedsIt) {
+  SideWork work;
+  const auto task = work.Add(SideWork::kLarge, [] { throw std::bad_alloc(); });
+  EXPECT_THROW(work.Finish(task), std::bad_alloc);
 }
 
 TEST(SideWorkTest, ManyShareIt) {
@@ -97,7 +153,8 @@ TEST(SideWorkTest, ManyShareIt) {
     });
   }
   std::vector<std::shared_ptr<SideWork::Task>> tasks;
-  for (int i = 0; i < 1000; ++i) tasks.push_back(work.Add([&done] { ++done; }));
+  for (int i = 0; i < 1000; ++i)
+    tasks.push_back(work.Add(i % 9 == 0 ? SideWork::kLarge : 1, [&done] { ++done; }));
   for (const auto& task : tasks) work.Finish(task);
   EXPECT_EQ(done, 1000);
   is_over = true;

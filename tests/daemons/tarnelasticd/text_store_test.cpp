@@ -340,6 +340,36 @@ TEST_F(TextStoreWorkTest, OthersMakeTheSameRows) {
   EXPECT_EQ(contents[0], contents[1]);
 }
 
+// As soon as it has come, and without anybody's help.
+TEST_F(TextStoreWorkTest, ALargeTextIsCompressedAtOnce) {
+  texts_[1] = "before";
+  texts_[2] = std::string(SideWork::kLarge, 'x');
+  texts_[3] = RandomText(&random_, 6 * SideWork::kLarge);
+  for (const auto& [id, text] : texts_) store_.Write(id, text);
+  for (std::int64_t id = 4; Rows() < 2; ++id) {
+    texts_[id] = "behind";
+    store_.Write(id, texts_[id]);
+    std::this_thread::yield();
+  }
+  texts_[2] = "changed";
+  store_.Write(2, texts_[2]);
+  for (const auto& [id, text] : texts_) ASSERT_EQ(store_.Read(id), text) << id;
+  store_.Flush();
+  for (const auto& [id, text] : texts_) ASSERT_EQ(ReadText(&db_, kTexts, id), text) << id;
+}
+
+// So much at once that there is no waiting for helpers any more.
+TEST_F(TextStoreWorkTest, HoldsNoMoreThanItMay) {
+  for (std::int64_t id = 0; id < 100; ++id) {
+    texts_[id] = RandomText(&random_, kTexts.row_bytes);
+    store_.Write(id, texts_[id]);
+  }
+  EXPECT_GT(Rows(), 100 - 70);
+  ExpectTexts(texts_, 100);
+  store_.Flush();
+  ExpectTexts(texts_, 100);
+}
+
 TEST(TextStoreEndTest, MayEndBeforeItsWork) {
   SideWork work;
   {
