@@ -30,6 +30,8 @@ class Source {
   std::string_view Head();
   // The first kMaxFileBytes. Valid as long as the object.
   std::string_view Bytes();
+  // How many bytes it says that it has; 0 where it does not say.
+  std::size_t Expected();
   // For libraries that read for themselves; -1 for bytes.
   int fd() const { return fd_; }
   const std::string& extension() const { return extension_; }

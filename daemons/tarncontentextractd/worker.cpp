@@ -4,8 +4,10 @@
 #include <sys/time.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <exception>
 #include <new>
+#include <string>
 
 #include "daemons/tarncontentextractd/charset.h"
 #include "daemons/tarncontentextractd/markup.h"
@@ -51,6 +53,40 @@ void TryParsers(const Registry& registry) {
   }
 }
 
+// Answers that the daemon need not be woken for yet, since there is more to do. It must not wait
+// long for any: a file that takes its time is begun with nothing held back.
+class HeldAnswers {
+ public:
+  explicit HeldAnswers(int channel) : channel_(channel) {}
+
+  void Add(std::string message) {
+    if (held_.empty()) since_ = Clock::now();
+    held_ += message;
+  }
+
+  bool MayWaitFor(Source& next) const {
+    return held_.size() < kMostHeld && next.Expected() <= kQuickFile &&
+           Clock::now() - since_ < kLongestHeld;
+  }
+
+  // Returns false when the daemon is gone.
+  bool Send() {
+    const bool sent = SendMessage(channel_, held_);
+    held_.clear();
+    return sent;
+  }
+
+ private:
+  using Clock = std::chrono::steady_clock;
+  static constexpr std::size_t kMostHeld = std::size_t{64} << 10;
+  static constexpr std::size_t kQuickFile = std::size_t{64} << 10;
+  static constexpr std::chrono::milliseconds kLongestHeld{20};
+
+  int channel_;
+  std::string held_;
+  Clock::time_point since_;
+};
+
 }  // namespace
 
 std::vector<Field> ParseFile(const Registry& registry, Source& source) {
@@ -72,13 +108,20 @@ bool Announce(int channel, const std::string& problem) {
 }
 
 void ServeFiles(const Registry& registry, int channel, int seconds) {
+  HeldAnswers answers(channel);
   Request request;
-  while (ReceiveRequest(channel, &request)) {
+  while (true) {
+    Received received = ReceiveRequest(channel, false, &request);
+    if (received == Received::kNothing) {
+      SetTimer(0);
+      if (!answers.Send()) return;
+      received = ReceiveRequest(channel, true, &request);
+    }
+    if (received != Received::kRequest) return;
     SetTimer(seconds);
     Source source(request.file.get(), request.extension);
-    const bool sent = SendMessage(channel, MakeAnswer(request.number, ParseFile(registry, source)));
-    SetTimer(0);
-    if (!sent) return;
+    if (!answers.MayWaitFor(source) && !answers.Send()) return;
+    answers.Add(MakeAnswer(request.number, ParseFile(registry, source)));
   }
 }
 

@@ -174,16 +174,18 @@ class WorkerPool::Run {
     const WorkerOutcome outcome = slot_->Parse(next, pool_.options_.file_timeout, &done);
     for (std::vector<Field>& fields : done)
       results_.push_back({PoolOutcome::kDone, std::move(fields)});
-    if (outcome != WorkerOutcome::kDone) Lose(outcome, fresh && next.size() == 1, end);
+    if (outcome != WorkerOutcome::kDone) Lose(outcome, fresh, next.size() > 1, end);
   }
 
   // The worker is of no more use.
-  void Lose(WorkerOutcome outcome, bool alone, std::size_t end) {
+  void Lose(WorkerOutcome outcome, bool fresh, bool together, std::size_t end) {
     const std::string ending = slot_->End();
     pool_.Drop(slot_);
     if (outcome == WorkerOutcome::kStopped) return End(PoolOutcome::kStopped);
     const bool died = outcome == WorkerOutcome::kDied;
-    if (died && !alone) {
+    // Of several files any may be the cause, as a worker may hold answers back for a moment; and an
+    // earlier file may have done the harm.
+    if (together || (died && !fresh)) {
       alone_until_ = std::max(alone_until_, end);
       return;
     }

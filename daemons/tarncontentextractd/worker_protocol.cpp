@@ -127,9 +127,9 @@ void TakeAttached(msghdr* message, UniqueFd* file) {
   file->Reset(fd);
 }
 
-// What has come, at least one byte; 0 when nothing more comes. (Together with a descriptor never
-// more than the message that brought it.)
-std::size_t ReceiveSome(int channel, char* buffer, std::size_t size, UniqueFd* file) {
+// What has come, at least one byte; 0 when nothing more comes, -1 when nothing has yet. (Together
+// with a descriptor never more than the message that brought it.)
+ssize_t ReceiveSome(int channel, bool wait, char* buffer, std::size_t size, UniqueFd* file) {
   Attachment attachment;
   iovec part{buffer, size};
   msghdr message{};
@@ -139,11 +139,11 @@ std::size_t ReceiveSome(int channel, char* buffer, std::size_t size, UniqueFd* f
   message.msg_controllen = sizeof(attachment.bytes);
   ssize_t count = 0;
   do {
-    count = recvmsg(channel, &message, MSG_CMSG_CLOEXEC);
+    count = recvmsg(channel, &message, MSG_CMSG_CLOEXEC | (wait ? 0 : MSG_DONTWAIT));
   } while (count < 0 && errno == EINTR);
-  if (count <= 0) return 0;
+  if (count < 0) return errno == EAGAIN && !wait ? -1 : 0;
   TakeAttached(&message, file);
-  return static_cast<std::size_t>(count);
+  return count;
 }
 
 }  // namespace
@@ -208,25 +208,26 @@ bool SendRequest(int channel, std::uint32_t number, const std::string& extension
   return count == static_cast<ssize_t>(text.size());
 }
 
-bool ReceiveRequest(int channel, Request* request) {
+Received ReceiveRequest(int channel, bool wait, Request* request) {
   request->file.Reset();
   std::array<char, sizeof(std::uint32_t) + kMaxRequestBytes> buffer;
   std::size_t got = 0;
   std::uint32_t size = 0;
   do {
-    const std::size_t count =
-        ReceiveSome(channel, buffer.data() + got, buffer.size() - got, &request->file);
-    if (count == 0) return false;
-    got += count;
+    const ssize_t count = ReceiveSome(channel, wait || got > 0, buffer.data() + got,
+                                      buffer.size() - got, &request->file);
+    if (count < 0) return Received::kNothing;
+    if (count == 0) return Received::kEnd;
+    got += static_cast<std::size_t>(count);
     if (got < sizeof(size)) continue;
     std::memcpy(&size, buffer.data(), sizeof(size));
-    if (size < kNumberBytes || size > kMaxRequestBytes) return false;
+    if (size < kNumberBytes || size > kMaxRequestBytes) return Received::kEnd;
   } while (got < sizeof(size) + size);
   std::string_view text(buffer.data() + sizeof(size), got - sizeof(size));
-  if (text.size() > size || !request->file.valid()) return false;
+  if (text.size() > size || !request->file.valid()) return Received::kEnd;
   TakeRaw(&text, &request->number);
   request->extension.assign(text);
-  return true;
+  return Received::kRequest;
 }
 
 bool SendMessage(int channel, std::string_view message) {

@@ -52,9 +52,13 @@ struct Request {
 // the worker is gone or has too many requests before it.
 bool SendRequest(int channel, std::uint32_t number, const std::string& extension, int file);
 
-// The worker's: each blocks until all is through, and returns false when the daemon is gone or
-// breaks the rules. `message` has its length in front.
-bool ReceiveRequest(int channel, Request* request);
+// The worker's. kNothing, where it need not wait, stands for no request yet; kEnd for a daemon that
+// is gone or breaks the rules.
+enum class Received { kRequest, kNothing, kEnd };
+Received ReceiveRequest(int channel, bool wait, Request* request);
+
+// The worker's: blocks until all is through, and returns false when the daemon is gone. `message`
+// has its length in front; there may be several.
 bool SendMessage(int channel, std::string_view message);
 
 }  // namespace quarry::extract

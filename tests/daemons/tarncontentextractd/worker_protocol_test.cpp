@@ -133,7 +133,7 @@ class Channel : public ::testing::Test {
   bool Send(const std::string& extension, std::uint32_t number = 7) {
     return SendRequest(daemon_.get(), number, extension, null_.get());
   }
-  bool Receive() { return ReceiveRequest(worker_.get(), &request_); }
+  bool Receive() { return ReceiveRequest(worker_.get(), true, &request_) == Received::kRequest; }
 
   UniqueFd daemon_;
   UniqueFd worker_;
@@ -174,6 +174,17 @@ TEST_F(Channel, ARequestWithoutAFileIsNone) {
 TEST_F(Channel, ARequestWithoutANumberIsNone) {
   Write(MakeMessage("123"));
   EXPECT_FALSE(Receive());
+}
+
+TEST_F(Channel, AWorkerThatNeedNotWaitIsToldThatThereIsNothingYet) {
+  EXPECT_EQ(ReceiveRequest(worker_.get(), false, &request_), Received::kNothing);
+  ASSERT_TRUE(Send("txt"));
+  EXPECT_EQ(ReceiveRequest(worker_.get(), false, &request_), Received::kRequest);
+  EXPECT_TRUE(request_.file.valid());
+  EXPECT_EQ(ReceiveRequest(worker_.get(), false, &request_), Received::kNothing);
+  EXPECT_FALSE(request_.file.valid()) << "a file is held no longer than for its answer";
+  daemon_.Reset();
+  EXPECT_EQ(ReceiveRequest(worker_.get(), false, &request_), Received::kEnd);
 }
 
 TEST_F(Channel, RequestsThatWaitAreTakenOneByOne) {
