@@ -1,6 +1,7 @@
 #include "daemons/tarnelasticd/document.h"
 
 #include <algorithm>
+#include <deque>
 #include <utility>
 
 #include "common/file_util.h"
@@ -59,9 +60,19 @@ Cell MakeCell(Storage storage, const Json::Value& value) {
   throw Error(kDamagedIndex, "A stored document is damaged");
 }
 
+// Full texts by columns. They are large: what is a string in the document is not copied.
+struct Texts {
+  std::vector<std::string_view> columns;
+  std::deque<std::string> made;  // the others, which do not move
+};
+
 // Packed: for each text that is not empty its column, its length and its bytes.
-std::string Pack(const std::vector<std::string>& texts) {
+std::string Pack(const std::vector<std::string_view>& texts) {
+  constexpr std::size_t kMostNumbers = 20;
+  std::size_t most = 0;
+  for (const std::string_view text : texts) most += text.empty() ? 0 : text.size() + kMostNumbers;
   std::string packed;
+  packed.reserve(most);
   for (std::size_t i = 0; i < texts.size(); ++i) {
     if (texts[i].empty()) continue;
     AppendNumber(&packed, i);
@@ -99,15 +110,19 @@ std::string ExtraLabel(const Schema& schema, const Json::Value& extra, const std
 
 // Sorts one field into the document's parts.
 void StoreField(const Field* field, const Json::Value& value, const std::string& name,
-                StoredDocument* document, std::vector<std::string>* texts, Json::Value* extra) {
+                StoredDocument* document, Texts* texts, Json::Value* extra) {
   if (field == nullptr) {
     (*extra)[name] = value;
     return;
   }
   if (field->storage == Storage::kPath) return;
   if (field->storage == Storage::kText) {
-    (*texts)[field->column] = TextOf(value);
-    if (!value.isString()) (*extra)[name] = value;
+    if (value.isString()) {
+      texts->columns[field->column] = ViewOf(value);
+    } else {
+      texts->columns[field->column] = texts->made.emplace_back(TextOf(value));
+      (*extra)[name] = value;
+    }
     return;
   }
   Cell cell = MakeCell(field->storage, value);
@@ -157,14 +172,15 @@ StoredDocument MakeDocument(const Schema& schema, std::string_view path,
   StoredDocument stored;
   stored.row.path = path;
   stored.row.cells.resize(schema.row_columns());
-  std::vector<std::string> texts(schema.text_columns());
+  Texts texts;
+  texts.columns.resize(schema.text_columns());
   Json::Value extra(Json::objectValue);
   for (auto item = document.begin(); item != document.end(); ++item) {
     if (item->isNull()) continue;
     const std::string name = item.name();
     StoreField(schema.Find(name), *item, name, &stored, &texts, &extra);
   }
-  stored.body = Pack(texts);
+  stored.body = Pack(texts.columns);
   if (!extra.empty()) stored.row.extra = toString(extra);
   stored.labels.name = NameOf(schema, document, stored.row.path);
   stored.labels.extra = ExtraLabel(schema, extra, stored.labels.name);
