@@ -248,6 +248,11 @@ void AppendEscaped(std::string* out, char c) {
   constexpr char kHex[] = "0123456789abcdef";
   constexpr std::string_view kNamed = "\"\\\b\f\n\r\t";
   constexpr std::string_view kLetters = "\"\\bfnrt";
+  // The one that nearly all texts have.
+  if (c == '\n') {
+    out->append("\\n", 2);
+    return;
+  }
   out->push_back('\\');
   const std::size_t named = kNamed.find(c);
   if (named != std::string_view::npos) return out->push_back(kLetters[named]);

@@ -18,6 +18,9 @@
 namespace quarry::extract {
 namespace {
 
+// Room is made at once for as many documents of such a size as are asked for.
+constexpr std::size_t kUsualBytes = std::size_t{8} << 10;
+
 std::string ErrnoText() {
   return std::generic_category().message(errno);
 }
@@ -193,7 +196,7 @@ Json::ArrayIndex ExtractService::ParseSome(const Json::Value& files, Json::Array
   }
   const std::size_t complete = ReadContents(&drafts);
   for (std::size_t i = 0; i < complete; ++i) {
-    if (!out->empty()) *out += ',';
+    if (i > 0) *out += ',';
     if (drafts[i].good) {
       drafts[i].AppendTo(out);
     } else {
@@ -208,12 +211,15 @@ std::string ExtractService::ParseMany(const Json::Value& data) {
   GetJsonValue(files, data, "files", true);
   if (!files.isArray()) throw Error(kErrorBadParameter, "Not an array: files");
   const auto end = std::chrono::steady_clock::now() + kManyTime;
-  std::string documents;
+  std::string answer;
+  answer.reserve(std::min(files.size() * kUsualBytes, kManyBytes));
+  answer = "{\"data\":[";
   for (Json::ArrayIndex at = 0; at < files.size();) {
-    at = ParseSome(files, at, &documents);
-    if (documents.size() >= kManyBytes || std::chrono::steady_clock::now() >= end) break;
+    if (at > 0) answer += ',';
+    at = ParseSome(files, at, &answer);
+    if (answer.size() >= kManyBytes || std::chrono::steady_clock::now() >= end) break;
   }
-  return "{\"data\":[" + documents + "],\"success\":true}";
+  return std::move(answer += "],\"success\":true}");
 }
 
 std::string ExtractService::Answer(const Json::Value& request) {
