@@ -3,8 +3,11 @@
 #include <fcntl.h>
 
 #include <cstdio>
+#include <string_view>
+#include <utility>
 
 #include "common/file_util.h"
+#include "common/json_text.h"
 #include "daemons/tarncontentextractd/stamp.h"
 
 namespace quarry::extract {
@@ -12,9 +15,33 @@ namespace {
 
 constexpr std::int64_t kBlockBytes = 512;
 
-Json::Int64 Number(std::int64_t value) {
-  return value;
-}
+// An object in the making, as text.
+class ObjectText {
+ public:
+  void Add(std::string_view name, std::string_view text) {
+    AddName(name);
+    AppendJsonString(&text_, text);
+  }
+  void Add(std::string_view name, std::int64_t number) {
+    AddName(name);
+    text_ += std::to_string(number);
+  }
+  void AddBool(std::string_view name, bool value) {
+    AddName(name);
+    text_ += value ? "true" : "false";
+  }
+  std::string Take() { return std::move(text_ += '}'); }
+
+ private:
+  void AddName(std::string_view name) {
+    if (text_.size() > 1) text_ += ',';
+    text_ += '"';
+    text_ += name;
+    text_ += "\":";
+  }
+
+  std::string text_ = "{";
+};
 
 std::string OctalMode(mode_t mode) {
   char text[16];
@@ -22,41 +49,41 @@ std::string OctalMode(mode_t mode) {
   return text;
 }
 
-void SetNames(const std::string& path, Json::Value& document) {
+void SetNames(const std::string& path, ObjectText& document) {
   const std::string name = Basename(path);
   const std::string parent = Dirname(path);
   const std::string extension = GetFileExtension(path, true);
-  document["TARNMDPath"] = path;
-  document["TARNMDParent"] = parent.empty() ? "/" : parent;
-  document["TARNMDFSName"] = name;
-  document["TARNMDDisplayName"] = name;
-  document["TARNMDExtension"] = extension;
-  document["TARNMDKind"] = extension;
+  document.Add("TARNMDPath", path);
+  document.Add("TARNMDParent", parent.empty() ? "/" : parent);
+  document.Add("TARNMDFSName", name);
+  document.Add("TARNMDDisplayName", name);
+  document.Add("TARNMDExtension", extension);
+  document.Add("TARNMDKind", extension);
 }
 
-void SetOwnership(const struct stat& status, Json::Value& document) {
-  document["TARNMDIsDir"] = S_ISDIR(status.st_mode);
-  document["TARNMDOwnerUserID"] = std::to_string(status.st_uid);
-  document["TARNMDOwnerGroupID"] = std::to_string(status.st_gid);
-  document["TARNMDPrivilege"] = OctalMode(status.st_mode);
+void SetOwnership(const struct stat& status, ObjectText& document) {
+  document.AddBool("TARNMDIsDir", S_ISDIR(status.st_mode));
+  document.Add("TARNMDOwnerUserID", std::to_string(status.st_uid));
+  document.Add("TARNMDOwnerGroupID", std::to_string(status.st_gid));
+  document.Add("TARNMDPrivilege", OctalMode(status.st_mode));
 }
 
-void SetSizes(const struct stat& status, Json::Value& document) {
-  document["TARNMDFSSize"] = Number(status.st_size);
-  document["TARNMDLogicalSize"] = Number(status.st_size);
-  document["TARNMDPhysicalSize"] = Number(status.st_blocks * kBlockBytes);
+void SetSizes(const struct stat& status, ObjectText& document) {
+  document.Add("TARNMDFSSize", std::int64_t{status.st_size});
+  document.Add("TARNMDLogicalSize", std::int64_t{status.st_size});
+  document.Add("TARNMDPhysicalSize", std::int64_t{status.st_blocks * kBlockBytes});
 }
 
-void SetTimes(const Attributes& attributes, Json::Value& document) {
+void SetTimes(const Attributes& attributes, ObjectText& document) {
   const struct stat& status = attributes.status;
-  document["TARNMDFSContentChangeDate"] = Number(status.st_mtim.tv_sec);
-  document["TARNMDContentModificationDate"] = Number(status.st_mtim.tv_sec);
-  document["TARNMDAttributeChangeDate"] = Number(status.st_ctim.tv_sec);
-  document["TARNMDLastUsedDate"] = Number(status.st_atim.tv_sec);
+  document.Add("TARNMDFSContentChangeDate", std::int64_t{status.st_mtim.tv_sec});
+  document.Add("TARNMDContentModificationDate", std::int64_t{status.st_mtim.tv_sec});
+  document.Add("TARNMDAttributeChangeDate", std::int64_t{status.st_ctim.tv_sec});
+  document.Add("TARNMDLastUsedDate", std::int64_t{status.st_atim.tv_sec});
   if (attributes.birth_time == 0) return;
-  document["TARNMDFSCreationDate"] = Number(attributes.birth_time);
-  document["TARNMDContentCreationDate"] = Number(attributes.birth_time);
-  document["TARNMDDateAdded"] = Number(attributes.birth_time);
+  document.Add("TARNMDFSCreationDate", std::int64_t{attributes.birth_time});
+  document.Add("TARNMDContentCreationDate", std::int64_t{attributes.birth_time});
+  document.Add("TARNMDDateAdded", std::int64_t{attributes.birth_time});
 }
 
 }  // namespace
@@ -71,14 +98,14 @@ bool ReadAttributes(int place, Attributes* out) {
   return true;
 }
 
-Json::Value AttributeDocument(const std::string& path, const Attributes& attributes) {
-  Json::Value document(Json::objectValue);
+std::string AttributeText(const std::string& path, const Attributes& attributes) {
+  ObjectText document;
+  document.Add(kAttributeStampField, AttributeStamp(attributes.status));
   SetNames(path, document);
   SetOwnership(attributes.status, document);
   SetSizes(attributes.status, document);
   SetTimes(attributes, document);
-  document[kAttributeStampField] = AttributeStamp(attributes.status);
-  return document;
+  return document.Take();
 }
 
 }  // namespace quarry::extract

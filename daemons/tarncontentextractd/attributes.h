@@ -3,7 +3,6 @@
 #ifndef QUARRY_DAEMONS_TARNCONTENTEXTRACTD_ATTRIBUTES_H_
 #define QUARRY_DAEMONS_TARNCONTENTEXTRACTD_ATTRIBUTES_H_
 
-#include <json/json.h>
 #include <sys/stat.h>
 
 #include <cstdint>
@@ -21,8 +20,9 @@ struct Attributes {
 // failure.
 bool ReadAttributes(int place, Attributes* out);
 
-// The document of `path` without its content. Names are byte strings: what is not UTF-8 is kept.
-Json::Value AttributeDocument(const std::string& path, const Attributes& attributes);
+// The document of `path` without its content, as the text of a JSON object. Names are byte strings:
+// what is not UTF-8 is kept.
+std::string AttributeText(const std::string& path, const Attributes& attributes);
 
 }  // namespace quarry::extract
 

@@ -39,6 +39,10 @@ Json::Value Parsed(const std::string& text) {
   return value;
 }
 
+Json::Value AttributeDocument(const std::string& path, const Attributes& attributes) {
+  return Parsed(AttributeText(path, attributes));
+}
+
 TEST(AttributeDocument, HoldsEveryFieldOfAFile) {
   const Json::Value expected = Parsed(R"({
     "TARNMDPath": "/volume1/photo/a.tar.JPG",
