@@ -189,6 +189,8 @@ TEST(Utf8, TellsCharactersFromOtherBytes) {
     while (at < bytes.size()) valid = NextCharacter(bytes, &at) >= 0 && valid;
     ASSERT_EQ(at, bytes.size());
     ASSERT_EQ(valid, IsValidUtf8(bytes)) << ::testing::PrintToString(bytes);
+    ASSERT_EQ(valid, IsUtf8(bytes)) << ::testing::PrintToString(bytes);
+    ASSERT_EQ(valid, IsUtf8("12345678" + bytes + "12345678")) << ::testing::PrintToString(bytes);
   };
   for (int a = 1; a < 256; ++a) {
     for (int b = 1; b < 256; ++b) {
