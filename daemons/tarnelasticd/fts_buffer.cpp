@@ -7,7 +7,6 @@
 #include "daemons/tarnelasticd/engine_error.h"
 #include "daemons/tarnelasticd/fts_number.h"
 #include "daemons/tarnelasticd/segment_merger.h"
-#include "daemons/tarnelasticd/segment_writer.h"
 #include "daemons/tarnelasticd/text_lengths.h"
 
 namespace quarry::engine {
@@ -28,6 +27,11 @@ std::size_t SizeOf(const std::string& text) {
 }
 std::size_t SizeOf(const std::optional<Labels>& labels) {
   return labels ? labels->name.size() + labels->extra.size() : 0;
+}
+
+std::string DirectoryOf(Database* db) {
+  const std::string path = sqlite3_db_filename(db->handle(), "main");
+  return path.substr(0, path.rfind('/') + 1);
 }
 
 template <typename Map, typename State>
@@ -72,6 +76,7 @@ FtsBuffer::FtsBuffer(const Schema& schema, Database* db, const TextTokenizer& to
       has_own_segments_(ReadStructure(db, kBody).has_value()),
       work_(work),
       cutters_(std::make_shared<WordCutters>()),
+      runs_(DirectoryOf(db)),
       listed_words_(schema.text_columns()) {}
 
 FtsBuffer::~FtsBuffer() {
@@ -156,7 +161,9 @@ void FtsBuffer::FlushLists() {
   AddToTotals(db_, kBody, listed_, listed_words_);
   std::optional<FtsStructure> structure = ReadStructure(db_, kBody);
   if (!structure) throw Error(kDamagedIndex, "The full text is not as it should be");
-  const std::int64_t leaves = lists_.empty() ? 0 : WriteSegment(&*structure);
+  if (!runs_.empty()) runs_.Add(lists_);
+  const bool has_words = !runs_.empty() || !lists_.empty();
+  const std::int64_t leaves = has_words ? WriteSegment(&*structure) : 0;
   ClearLists();
   if (leaves > 0) MergeFullLevels(db_, kBody, &*structure);
   ForgetFts(db_);
@@ -164,8 +171,7 @@ void FtsBuffer::FlushLists() {
 }
 
 // What is too large to be merged at once is left to FTS5, which merges of itself when it writes. It
-// is asked for as much work as it would do then, so that
-// no commit waits for all of it.
+// is asked for as much work as it would do then, so that no commit waits for all of it.
 void FtsBuffer::MergeSegments(const FtsStructure& structure, std::int64_t written) {
   const bool is_due = std::any_of(
       structure.levels.begin(), structure.levels.end(), [](const FtsStructure::Level& level) {
@@ -178,6 +184,36 @@ void FtsBuffer::MergeSegments(const FtsStructure& structure, std::int64_t writte
       .Run();
 }
 
+void FtsBuffer::SaveLists() {
+  TakeCut(/*all=*/true);
+  if (runs_.IsFull()) {
+    FlushLists();
+    return;
+  }
+  runs_.Add(lists_);
+  lists_.Clear();
+}
+
+void FtsBuffer::WriteWords(SegmentWriter* writer) {
+  std::string key;
+  const auto begin = [&](std::string_view word) {
+    key = kMainIndex;
+    key += word;
+    writer->BeginWord(key);
+  };
+  if (runs_.empty()) {
+    lists_.ForEach([&](std::string_view word, std::string_view list) {
+      begin(word);
+      writer->AddList(list);
+    });
+    return;
+  }
+  runs_.ForEach([&](std::string_view word, const std::vector<std::string_view>& lists) {
+    begin(word);
+    for (const std::string_view list : lists) writer->AddList(list);
+  });
+}
+
 // Returns how many leaves it has.
 std::int64_t FtsBuffer::WriteSegment(FtsStructure* structure) {
   Segment segment;
@@ -185,12 +221,7 @@ std::int64_t FtsBuffer::WriteSegment(FtsStructure* structure) {
   if (segment.id == 0) throw Error(kDamagedIndex, "The full text has too many parts");
   segment.first_leaf = 1;
   SegmentWriter writer(db_, kBody, segment.id);
-  std::string key;
-  lists_.ForEach([&](std::string_view word, std::string_view list) {
-    key = kMainIndex;
-    key += word;
-    writer.Add(key, list);
-  });
+  WriteWords(&writer);
   segment.last_leaf = writer.Finish();
   if (structure->levels.empty()) structure->levels.emplace_back();
   structure->levels.front().segments.push_back(segment);
@@ -203,6 +234,7 @@ void FtsBuffer::ClearLists() {
   for (const Cutting& cutting : cutting_) work_->Drop(cutting.task);
   cutting_.clear();
   cutting_bytes_ = 0;
+  runs_.Clear();
   lists_.Clear();
   last_listed_ = 0;
   listed_ = 0;

@@ -23,10 +23,12 @@
 #include "daemons/tarnelasticd/document.h"
 #include "daemons/tarnelasticd/fts_structure.h"
 #include "daemons/tarnelasticd/schema.h"
+#include "daemons/tarnelasticd/segment_writer.h"
 #include "daemons/tarnelasticd/side_work.h"
 #include "daemons/tarnelasticd/text_tokenizer.h"
 #include "daemons/tarnelasticd/word_cutter.h"
 #include "daemons/tarnelasticd/word_lists.h"
+#include "daemons/tarnelasticd/word_runs.h"
 
 namespace quarry::engine {
 
@@ -54,6 +56,9 @@ class FtsBuffer {
   std::size_t bytes() const { return bytes_; }
   std::size_t list_bytes() const { return lists_.bytes(); }
 
+  // Keeps the words of new texts elsewhere than in memory, until Flush(). Now and then they are
+  // written as a segment.
+  void SaveLists();
   // Applies everything, and is empty then.
   void Flush();
   void Clear();
@@ -90,6 +95,7 @@ class FtsBuffer {
   void AddToLists(std::int64_t id, const CutText& words);
   void FlushLists();
   std::int64_t WriteSegment(FtsStructure* structure);
+  void WriteWords(SegmentWriter* writer);
   void MergeSegments(const FtsStructure& structure, std::int64_t written);
   void ClearLists();
   void FlushLabels(std::int64_t id, const Change<std::optional<Labels>>& change);
@@ -111,9 +117,10 @@ class FtsBuffer {
   const std::shared_ptr<WordCutters> cutters_;
   std::deque<Cutting> cutting_;  // on their way to lists_
   std::size_t cutting_bytes_ = 0;
+  WordRuns runs_;  // before lists_
   WordLists lists_;
   std::int64_t last_listed_ = 0;             // also of those on their way
-  std::uint64_t listed_ = 0;                 // rows in lists_
+  std::uint64_t listed_ = 0;                 // rows in runs_ and lists_
   std::vector<std::uint64_t> listed_words_;  // by columns
 };
 

@@ -66,6 +66,7 @@ IndexWriter::IndexWriter(const std::string& database_path, std::shared_ptr<const
       select_row_sql_("SELECT " + DocsColumns(*schema_) + " FROM docs WHERE path=?1") {
   Configure(&db_);
   LoadCounters();
+  collected_id_ = next_id_;
 }
 
 IndexWriter::~IndexWriter() {
@@ -118,9 +119,11 @@ void IndexWriter::Rollback() noexcept {
 
 // Checked with each change, since a writer that is never idle leaves CommitIfOld() no turn.
 void IndexWriter::KeepWithinLimits() {
-  if (buffer_.bytes() >= limits_.flush_bytes || buffer_.list_bytes() >= limits_.list_bytes) {
+  if (buffer_.bytes() >= limits_.flush_bytes) {
     transaction_bytes_ += buffer_.bytes();
     buffer_.Flush();
+  } else if (buffer_.list_bytes() >= limits_.list_bytes) {
+    buffer_.SaveLists();
   }
   if (transaction_bytes_ >= limits_.commit_bytes || IsOld()) CommitNow();
 }
@@ -136,7 +139,10 @@ void IndexWriter::CommitNow() {
   buffer_.Flush();
   texts_.Flush();
   attributes_.Flush();
-  if (terms_requested_) transaction_bytes_ += CollectTerms(&db_);
+  if (terms_requested_) {
+    transaction_bytes_ += CollectTerms(&db_, next_id_ - collected_id_);
+    collected_id_ = next_id_;
+  }
   db_.Prepare("INSERT OR REPLACE INTO meta(key,value) VALUES('documents',?1)")
       .Bind(1, documents_.load())
       .Run();

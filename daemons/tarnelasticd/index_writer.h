@@ -31,7 +31,7 @@ namespace quarry::engine {
 struct WriterLimits {
   // Changes of full text are handed to FTS5 when they take so much memory.
   std::size_t flush_bytes = std::size_t{8} << 20;
-  // The words of new texts are written as a segment when they take so much memory.
+  // The words of new texts wait for that outside of memory when they take so much of it.
   std::size_t list_bytes = std::size_t{16} << 20;
   // A transaction ends when it has taken so much text, or has been open so long.
   std::size_t commit_bytes = std::size_t{256} << 20;
@@ -127,6 +127,7 @@ class IndexWriter {
   std::string update_sql_;
   std::string select_row_sql_;
   std::int64_t next_id_ = 1;
+  std::int64_t collected_id_ = 1;  // the next one when words were collected last
   std::atomic<std::int64_t> documents_{0};
   std::atomic<bool> uncommitted_{false};
   bool lost_ = false;

@@ -148,13 +148,28 @@ std::int64_t PostingLists::leaves() const {
   return std::accumulate(segments_.begin(), segments_.end(), std::int64_t{0}, AddLeaves);
 }
 
-// A large one would be written anew for minutes, and is merged step by step as it grows anyway.
+// A large one would be written anew for minutes, and is merged step by step as it grows anyway. In
+// a few segments of about the same size hardly any word is repeated so often that merging would
+// pay.
 bool PostingLists::IsWorthMerging() const {
   constexpr std::int64_t kMaxLeaves = 20000;
-  std::int64_t largest = 0;
-  for (const Segment& segment : segments_) largest = std::max(largest, AddLeaves(0, segment));
+  constexpr std::int64_t kFewLeaves = 512;
+  constexpr std::int64_t kFewSegments = 3;
   const std::int64_t all = leaves();
-  return all <= kMaxLeaves && (all - largest) * 8 > all;
+  std::int64_t large_ones = 0;
+  std::int64_t in_large_ones = 0;
+  std::int64_t largest = 0;
+  for (const Segment& segment : segments_) {
+    const std::int64_t size = AddLeaves(0, segment);
+    largest = std::max(largest, size);
+    if (size * 16 < all) continue;
+    ++large_ones;
+    in_large_ones += size;
+  }
+  if (all > kMaxLeaves) return false;
+  const std::int64_t kept =
+      all > kFewLeaves && large_ones <= kFewSegments ? in_large_ones : largest;
+  return (all - kept) * 8 > all;
 }
 
 void PostingLists::ForEach(std::string_view word, bool prefix, const Visitor& visit) {

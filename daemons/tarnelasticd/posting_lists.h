@@ -35,8 +35,8 @@ class PostingLists {
   // library to come may be, FTS5 must be asked.
   bool IsReadable() const { return is_readable_; }
 
-  // Whether the table is small, and so much of it lies outside of its largest segment that making
-  // one of all saves noticeable room.
+  // Whether the table is small, and so much of it lies outside of its few largest segments that
+  // making one of all saves noticeable room.
   bool IsWorthMerging() const;
   // How many leaves the segments have.
   std::int64_t leaves() const;

@@ -163,6 +163,25 @@ class SegmentMerger {
   std::vector<std::int64_t> rows_;  // that have it
 };
 
+// The oldest segments of a level go on to the next one as they are where the newest is far smaller:
+// they would be written anew for the sake of a few leaves. Returns whether any do.
+bool PassOnLarge(std::size_t level, FtsStructure* structure) {
+  constexpr std::int64_t kTimes = 8;
+  constexpr std::int64_t kFewLeaves = 256;
+  if (level + 1 >= kManyLevels) return false;
+  if (level + 1 == structure->levels.size()) structure->levels.emplace_back();
+  std::vector<Segment>& from = structure->levels[level].segments;
+  std::vector<Segment>& to = structure->levels[level + 1].segments;
+  const std::int64_t large = std::max(kFewLeaves, kTimes * CountLeaves({from.back()}));
+  const auto first_small = std::find_if(from.begin(), from.end(), [large](const Segment& segment) {
+    return CountLeaves({segment}) < large;
+  });
+  const bool has_large = first_small != from.begin();
+  to.insert(to.end(), from.begin(), first_small);
+  from.erase(from.begin(), first_small);
+  return has_large;
+}
+
 // Makes `segments` of `structure`, which are not in it any more, one segment `id` of a level.
 void MergeInto(Database* db, const std::string& table, const std::vector<Segment>& segments,
                std::int64_t id, std::size_t level, const WordVisitor& visit,
@@ -230,10 +249,13 @@ bool MergeAllSegments(Database* db, const std::string& table, const WordVisitor&
 
 void MergeFullLevels(Database* db, const std::string& table, FtsStructure* structure) {
   for (std::size_t i = 0; i < structure->levels.size(); ++i) {
-    const FtsStructure::Level& level = structure->levels[i];
     // A merge that FTS5 has begun goes on with the last segment of the next level.
-    const bool is_free = level.merging == 0 && (i == 0 || structure->levels[i - 1].merging == 0);
-    if (!is_free || level.segments.size() < kManySegments) continue;
+    const bool is_free =
+        structure->levels[i].merging == 0 && (i == 0 || structure->levels[i - 1].merging == 0);
+    if (!is_free || structure->levels[i].segments.size() < kManySegments) continue;
+    if (PassOnLarge(i, structure)) WriteStructure(db, table, *structure);
+    const FtsStructure::Level& level = structure->levels[i];
+    if (level.segments.size() < kManySegments) continue;
     if (level.segments.size() > kMostInputs || CountLeaves(level.segments) > kMostLeaves) continue;
     const std::int64_t id = structure->NextSegment();
     const std::vector<Segment> segments = std::exchange(structure->levels[i].segments, {});

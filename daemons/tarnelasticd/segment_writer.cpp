@@ -111,8 +111,7 @@ void SegmentWriter::AddEntry(const Entry& entry) {
   AddPositions(entry.positions);
 }
 
-void SegmentWriter::Add(std::string_view key, std::string_view list) {
-  BeginWord(key);
+void SegmentWriter::AddList(std::string_view list) {
   const char* at = list.data();
   const char* const end = at + list.size();
   Entry entry;

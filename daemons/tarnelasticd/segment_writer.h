@@ -23,12 +23,12 @@ class SegmentWriter {
   SegmentWriter(Database* db, const std::string& table, std::int64_t segment);
 
   // Words must come in order of their bytes; `key` has FTS5's mark of the main index before it, and
-  // at most kMaxKey bytes, or Error kDamagedIndex is thrown. A list is as WordLists says.
-  void Add(std::string_view key, std::string_view list);
-
-  // The same document by document, which must ascend. Each word must have one.
+  // at most kMaxKey bytes, or Error kDamagedIndex is thrown.
   void BeginWord(std::string_view key);
+  // Documents must ascend. Each word must have one.
   void AddEntry(const Entry& entry);
+  // The same with all documents of a list, which is as WordLists says.
+  void AddList(std::string_view list);
 
   // Writes what is left. Returns how many leaves the segment has, numbered from 1.
   std::int64_t Finish();

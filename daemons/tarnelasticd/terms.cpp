@@ -20,8 +20,9 @@ namespace {
 // Larger ones compress better, but looking one word up reads a whole one.
 constexpr std::size_t kBlockBytes = std::size_t{32} << 10;
 
-// So many rows of an index are made anew in the time that it takes to merge a leaf of full text.
-constexpr std::int64_t kDocumentsPerLeaf = 32;
+// Indexes of so many rows are made anew when more than one of so many is new.
+constexpr std::int64_t kMaxSorted = 200000;
+constexpr std::int64_t kFewOf = 8;
 
 [[noreturn]] void FailDamaged() {
   throw Error(kDamagedIndex, "The words to suggest are damaged");
@@ -254,7 +255,7 @@ std::string CreateTermTables() {
          "CREATE VIRTUAL TABLE label_terms USING fts5vocab('labels','row');";
 }
 
-std::size_t CollectTerms(Database* db) {
+std::size_t CollectTerms(Database* db, std::int64_t new_documents) {
   db->Execute("DELETE FROM terms");
   // Makes FTS5 write out what it holds back.
   db->Prepare("SELECT 1 FROM body_terms LIMIT 1").Step();
@@ -263,13 +264,12 @@ std::size_t CollectTerms(Database* db) {
   // What is in several pieces repeats their words, and is searched several times.
   const bool is_merged = lists.IsWorthMerging();
   if (!is_merged || !ReadWordsMerging(db, users)) ReadWords(db, users);
-  if (!is_merged) return 0;
-  // Indexes into which came what is in no order have half-filled pages. Not for the few texts of a
-  // million documents, each time that there is one more of them.
-  if (LastId(db) <= lists.leaves() * kDocumentsPerLeaf) {
+  // Indexes into which came what is in no order have half-filled pages.
+  const std::int64_t documents = LastId(db);
+  if (documents <= kMaxSorted && new_documents * kFewOf > documents) {
     db->Execute("REINDEX docs;REINDEX text_hashes");
   }
-  return static_cast<std::size_t>(lists.leaves()) * SegmentWriter::kLeafBytes;
+  return is_merged ? static_cast<std::size_t>(lists.leaves()) * SegmentWriter::kLeafBytes : 0;
 }
 
 bool HasTerms(Database* db) {

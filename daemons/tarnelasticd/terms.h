@@ -32,9 +32,10 @@ constexpr std::int64_t kMaxTermLetters = 40;
 std::string CreateTermTables();
 
 // Collects the words of all documents anew, inside the transaction that is open. Where the full
-// text of a small index has come in many pieces it is put together first. Returns how many bytes of
-// it were, roughly. Throws Error as Database does, as all below do.
-std::size_t CollectTerms(Database* db);
+// text of a small index has come in many pieces it is put together first, and where many documents
+// are new, other indexes. Returns how many bytes of full text were put together, roughly. Throws
+// Error as Database does, as all below do.
+std::size_t CollectTerms(Database* db, std::int64_t new_documents);
 
 // Whether words have been collected, and there were any.
 bool HasTerms(Database* db);

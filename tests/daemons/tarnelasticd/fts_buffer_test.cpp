@@ -397,6 +397,46 @@ TEST_F(FtsBufferTest, MayEndBeforeItsWork) {
   work_.RunAll();
 }
 
+TEST_F(FtsBufferTest, MakesOneSegmentOfSavedLists) {
+  Begin();
+  for (int id = 1; id < 30; ++id) {
+    Insert(id, {Text(200, 3000), id % 4 == 0 ? "" : "all", ""});
+    if (id % 5 == 0) {
+      buffer_->SaveLists();
+      EXPECT_EQ(buffer_->list_bytes(), 0U);
+    }
+  }
+  buffer_->SaveLists();
+  EXPECT_EQ(Segments(), 0);
+  Remove(7);
+  Commit();
+  EXPECT_EQ(Segments(), 2);  // that of the new texts, and what FTS5 has of the removed one
+  ExpectSame();
+}
+
+TEST_F(FtsBufferTest, SavesListsOnlySoOften) {
+  Begin();
+  for (int id = 1; id <= 12; ++id) {
+    Insert(id, {"one w" + std::to_string(id), "", ""});
+    buffer_->SaveLists();
+  }
+  EXPECT_EQ(Segments(), 1);
+  Commit();
+  EXPECT_EQ(Segments(), 2);
+  ExpectSame();
+}
+
+TEST_F(FtsBufferTest, ForgetsSavedListsThatAreRolledBack) {
+  Begin();
+  Insert(1, {"one", "", ""});
+  buffer_->SaveLists();
+  Rollback();
+  Begin();
+  Insert(1, {"two", "", ""});
+  Commit();
+  ExpectSame();
+}
+
 // Another library's tables are not touched.
 TEST_F(FtsBufferTest, LeavesToFts5WhatIsNotUnderstood) {
   db_->Execute("UPDATE body_config SET v=5 WHERE k='version'");
@@ -444,6 +484,7 @@ TEST_F(FtsBufferTest, HoldsWhatFts5DoesThroughRandomChanges) {
         }
       }
       if (random_() % 8 == 0) buffer_->Flush();
+      if (random_() % 4 == 0) buffer_->SaveLists();
     }
     if (random_() % 6 == 0) {
       Rollback();

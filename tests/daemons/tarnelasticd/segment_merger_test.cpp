@@ -273,6 +273,33 @@ TEST_F(SegmentMergerTest, MergesFullLevelsOnly) {
   ExpectSame();
 }
 
+// For the sake of a few new leaves many would be written anew.
+TEST_F(SegmentMergerTest, LeavesLargeSegmentsAlone) {
+  Both("INSERT INTO body(body,rank) VALUES('hashsize',67108864)");
+  for (int id = 1; id < 3; ++id) {
+    std::string text;
+    for (int i = 0; i < 130000; ++i) text += "word" + std::to_string(id * 1000000 + i * 7) + ' ';
+    Insert(id, text);
+  }
+  const char* const large = "SELECT hex(block) FROM body_data WHERE id>>37 IN (1,2)";
+  const std::vector<std::string> before = Rows(tested_.get(), large);
+  for (int id = 3; id < 17; ++id) {
+    Insert(id, "one");
+    tested_->Execute("BEGIN");
+    WriteOutFts(tested_.get(), "body");
+    std::optional<FtsStructure> structure = ReadStructure(tested_.get(), "body");
+    MergeFullLevels(tested_.get(), "body", &*structure);
+    ForgetFts(tested_.get());
+    tested_->Execute("COMMIT");
+  }
+  EXPECT_TRUE(Rows(tested_.get(), large) == before);
+  EXPECT_GT(before.size(), 512U);
+  EXPECT_LE(Segments(), 10);
+  ExpectSame();
+  EXPECT_TRUE(MergeAll());
+  ExpectSame();
+}
+
 TEST_F(SegmentMergerTest, HoldsWhatFts5DoesThroughRandomChanges) {
   for (int round = 0; round < 40; ++round) {
     // Now and then FTS5 merges between.

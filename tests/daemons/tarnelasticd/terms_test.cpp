@@ -100,9 +100,9 @@ TEST_F(TermsTest, AreThoseOfTheLastCollection) {
 
 // What has been written anew must not stay in the log as long as nobody writes.
 TEST_F(TermsTest, LeaveNoLogOfMergedTexts) {
-  for (const std::uint64_t first : {1000000U, 2000000U}) {
+  for (const std::uint64_t first : {1000000U, 2000000U, 3000000U, 4000000U}) {
     std::string text;
-    for (std::uint64_t i = 0; i < 180000; ++i) {
+    for (std::uint64_t i = 0; i < 90000; ++i) {
       text += std::to_string((first + i) * 0x9e3779b97f4a7c15U) + ' ';
     }
     Add("/s/" + std::to_string(first), text);
