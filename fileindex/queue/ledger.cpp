@@ -219,10 +219,9 @@ void Ledger::PrefetchRecord(const OPNode& node) {
   if (!node.ops.empty()) __builtin_prefetch(node.ops.front().get());
 }
 
-// Whoever is in a list has all nodes above it in the lists of their parents.
-void Ledger::Touch(OPNode& node) {
+void Ledger::List(OPNode& node) {
   for (OPNode* at = &node; at->parent; at = at->parent.get()) {
-    if (at->next_reindexable_ != OPNode::kNone && at->next_movable_ != OPNode::kNone) return;
+    if (IsListed(*at)) return;
     if (!IsInPlace(*at)) return;  // it will be touched when it is adopted
     OPNode::Books& books = *at->parent->books_;
     Prepend(*at, books.first_reindexable, &OPNode::next_reindexable_);

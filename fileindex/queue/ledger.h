@@ -91,7 +91,9 @@ class Ledger {
   static void PrefetchRecord(const OPNode& node);
 
   // Makes sure that walks from above come by this node.
-  static void Touch(OPNode& node);
+  static void Touch(OPNode& node) {
+    if (!IsListed(node)) List(node);
+  }
 
   // Empties a list of ChildIndex and hands its nodes out, the movable ones in order of creation.
   static std::vector<OPNode*> TakeReindexable(OPNode& node);
@@ -166,6 +168,11 @@ class Ledger {
   static void Place(OPNode& node, OPNode::Books& books);
   static void EnterName(OPNode& node, OPNode::Books& books, std::uint32_t place);
   static bool IsAt(const OPNode& node, std::string_view name, std::uint32_t place);
+  // Whoever is in a list has all nodes above it in the lists of their parents.
+  static bool IsListed(const OPNode& node) {
+    return node.next_reindexable_ != OPNode::kNone && node.next_movable_ != OPNode::kNone;
+  }
+  static void List(OPNode& node);
   static bool IsBehind(const OPNode& node, std::uint32_t place);
   static const std::shared_ptr<OPNode>& Create(OPNode& node, std::string_view name,
                                                std::uint32_t hash, Pool* pool);

@@ -86,14 +86,20 @@ std::uint64_t Fold(const Keys& keys, Wide sum) {
          static_cast<std::uint64_t>(sum >> 64) * keys.high;
 }
 
-}  // namespace
-
-std::uint32_t NameTable::HashOf(std::string_view name) {
-  static const Keys keys = MakeKeys();
+// What the whole blocks at the front of a long name come to, which are taken off it.
+[[gnu::noinline]] std::uint64_t TakeBlocks(const Keys& keys, std::string_view& name) {
   std::uint64_t before = 0;
   for (; name.size() > kBlock; name.remove_prefix(kBlock)) {
     before = Spread(Fold(keys, before + Sum(keys, name.data(), kBlock)));
   }
+  return before;
+}
+
+}  // namespace
+
+std::uint32_t NameTable::HashOf(std::string_view name) {
+  static const Keys keys = MakeKeys();
+  const std::uint64_t before = name.size() > kBlock ? TakeBlocks(keys, name) : 0;
   return static_cast<std::uint32_t>(Fold(keys, before + Sum(keys, name.data(), name.size())) >> 32);
 }
 
