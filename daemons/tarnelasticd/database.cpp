@@ -199,7 +199,7 @@ void Database::EmptyLog() noexcept {
 }
 
 void Database::GiveBackFreePages() noexcept {
-  constexpr std::int64_t kFewOf = 32;
+  constexpr std::int64_t kFewOf = 128;
   try {
     Statement free = Prepare("PRAGMA freelist_count");
     Statement all = Prepare("PRAGMA page_count");
