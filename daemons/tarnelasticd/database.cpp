@@ -1,6 +1,7 @@
 #include "daemons/tarnelasticd/database.h"
 
 #include <cerrno>
+#include <exception>
 #include <utility>
 
 #include "daemons/tarnelasticd/engine_error.h"
@@ -204,7 +205,7 @@ void Database::GiveBackFreePages() noexcept {
     Statement free = Prepare("PRAGMA freelist_count");
     Statement all = Prepare("PRAGMA page_count");
     if (!free.Step() || !all.Step() || free.Int(0) * kFewOf <= all.Int(0)) return;
-  } catch (const Error&) {
+  } catch (const std::exception&) {
     return;
   }
   sqlite3_exec(handle(), "PRAGMA incremental_vacuum", nullptr, nullptr, nullptr);

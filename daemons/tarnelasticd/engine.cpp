@@ -107,6 +107,24 @@ Json::Value Answer(const std::string& name, Action action) {
   }
 }
 
+// Runs what nobody waits for, and which must not end the process either.
+template <typename Action, typename... Arguments>
+void EnduringWant(Action action, Arguments... arguments) noexcept {
+  try {
+    action(arguments...);
+  } catch (const std::bad_alloc&) {
+    // Not even for the log is there memory.
+  }
+}
+
+void CommitLogging(Index* index) {
+  try {
+    ReportingMemory([index] { index->Commit(); });
+  } catch (const Error& error) {
+    if (!index->Problem()) daemon::LogError("Commit failed: " + error.reason());
+  }
+}
+
 // Damage that shows up during work is remembered, so that the next index_create repairs it.
 template <typename Action>
 auto NotingDamage(Index* index, Action action) {
@@ -423,17 +441,15 @@ std::string Engine::Epoch() const {
 }
 
 void Engine::Tick() {
-  for (const auto& [id, index] : catalog_.All()) index->CommitIfOld();
+  EnduringWant([this] {
+    for (const auto& [id, index] : catalog_.All()) index->CommitIfOld();
+  });
 }
 
 void Engine::CommitAll() {
-  for (const auto& [id, index] : catalog_.All()) {
-    try {
-      index->Commit();
-    } catch (const Error& error) {
-      if (!index->Problem()) daemon::LogError("Commit failed: " + error.reason());
-    }
-  }
+  EnduringWant([this] {
+    for (const auto& [id, index] : catalog_.All()) EnduringWant(CommitLogging, index.get());
+  });
 }
 
 }  // namespace quarry::engine

@@ -54,7 +54,13 @@ void Index::CheckLost() {
 // However replacing the database ends, what is there then is opened.
 struct Index::Reopen {
   Index* index;
-  ~Reopen() { index->OpenLocked(); }
+  ~Reopen() {
+    try {
+      index->OpenLocked();
+    } catch (const std::bad_alloc&) {
+      // The next use of the index tries again.
+    }
+  }
 };
 
 void Index::OpenLocked() {
@@ -149,7 +155,10 @@ void Index::Remap(const Schema& schema) {
   const std::unique_lock<std::shared_mutex> lock(gate_);
   if (!store_) throw ProblemOr(kDamagedIndex);
   const Reopen reopen{this};
-  store_->writer->Commit();
+  {
+    const ReportLost report{this};
+    store_->writer->Commit();
+  }
   try {
     CopyDocuments(schema, CreateSpareDatabase(directory_, schema));
   } catch (...) {
@@ -174,9 +183,9 @@ void Index::Remove() {
 void Index::CloseCommitted() {
   if (!store_) return;
   try {
+    const ReportLost report{this};
     store_->writer->Commit();
   } catch (const Error& error) {
-    CheckLost();
     // A database that is gone or broken has nothing that could be kept.
     if (!HasCode(error, kDamagedIndex)) throw;
   }
@@ -214,12 +223,14 @@ void Index::CommitIfOld() {
   const std::unique_lock<std::mutex> writer_lock(writer_mutex_, std::try_to_lock);
   if (!writer_lock.owns_lock()) return;
   try {
+    const ReportLost report{this};
     store_->writer->CommitIfOld();
   } catch (const Error& error) {
     daemon::LogError("An index lost uncommitted work: " + error.reason());
     NoteDamage(error);
+  } catch (const std::bad_alloc&) {
+    daemon::LogError("An index lost uncommitted work: Out of memory");
   }
-  CheckLost();
 }
 
 void Index::Pause() {

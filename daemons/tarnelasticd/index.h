@@ -109,6 +109,11 @@ class Index {
   };
 
   struct Reopen;
+  // Whatever becomes of what the writer does, its loss is known afterwards.
+  struct ReportLost {
+    Index* index;
+    ~ReportLost() { index->CheckLost(); }
+  };
 
   template <typename Action>
   auto UseWriter(bool paused_too, Action action);
@@ -143,10 +148,7 @@ auto Index::UseWriter(bool paused_too, Action action) {
   } afterwards{store_->writer.get()};
   const std::lock_guard<std::mutex> lock(writer_mutex_);
   if (paused_ && !paused_too) throw Error(kPausedIndex, "The index is paused");
-  struct AtEnd {
-    Index* index;
-    ~AtEnd() { index->CheckLost(); }
-  } at_end{this};
+  const ReportLost report{this};
   return action(*store_->writer);
 }
 

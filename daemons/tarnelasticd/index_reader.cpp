@@ -54,7 +54,10 @@ void IndexReader::End() noexcept {
   if (db_.InTransaction()) sqlite3_exec(db_.handle(), "ROLLBACK", nullptr, nullptr, nullptr);
 }
 
-ReaderPool::ReaderPool(std::string database_path) : path_(std::move(database_path)) {}
+// Giving a reader back must not need memory.
+ReaderPool::ReaderPool(std::string database_path) : path_(std::move(database_path)) {
+  idle_.reserve(kMaxIdle);
+}
 
 ReaderPool::Lease::~Lease() {
   if (reader_) pool_->Return(std::move(reader_));

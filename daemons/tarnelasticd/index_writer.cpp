@@ -1,6 +1,7 @@
 #include "daemons/tarnelasticd/index_writer.h"
 
 #include <algorithm>
+#include <exception>
 #include <limits>
 #include <utility>
 #include <vector>
@@ -95,6 +96,7 @@ auto IndexWriter::Change(Action action) {
 
 void IndexWriter::Begin() {
   if (uncommitted_) return;
+  Undo();
   db_.Execute("BEGIN IMMEDIATE");
   uncommitted_ = true;
   transaction_bytes_ = 0;
@@ -109,12 +111,21 @@ void IndexWriter::Rollback() noexcept {
   uncommitted_ = false;
   lost_ = true;
   terms_requested_ = false;
+  must_undo_ = true;
   try {
-    if (db_.InTransaction()) db_.Execute("ROLLBACK");
-    LoadCounters();
-  } catch (const Error&) {
-    // The database is beyond help; the next use of it says so.
+    Undo();
+  } catch (const std::exception&) {
+    // Tried again by the next use, which says so where the database is beyond help.
   }
+}
+
+// What was not committed must neither stay in the database nor be counted, also where there was no
+// memory to undo it at once.
+void IndexWriter::Undo() {
+  if (!must_undo_) return;
+  if (db_.InTransaction()) db_.Execute("ROLLBACK");
+  LoadCounters();
+  must_undo_ = false;
 }
 
 // Checked with each change, since a writer that is never idle leaves CommitIfOld() no turn.
@@ -141,7 +152,6 @@ void IndexWriter::CommitNow() {
   attributes_.Flush();
   if (terms_requested_) {
     transaction_bytes_ += CollectTerms(&db_, next_id_ - collected_id_);
-    collected_id_ = next_id_;
   }
   db_.Prepare("INSERT OR REPLACE INTO meta(key,value) VALUES('documents',?1)")
       .Bind(1, documents_.load())
@@ -149,13 +159,16 @@ void IndexWriter::CommitNow() {
   db_.Execute("COMMIT");
   uncommitted_ = false;
   // The end of a pass: what it has left free may not be needed again for long.
-  if (std::exchange(terms_requested_, false)) db_.GiveBackFreePages();
+  if (std::exchange(terms_requested_, false)) {
+    collected_id_ = next_id_;
+    db_.GiveBackFreePages();
+  }
   // Else the log stays as large as the transaction was for as long as nobody writes.
   if (transaction_bytes_ >= kLargeTransaction) db_.EmptyLog();
 }
 
 void IndexWriter::Commit() {
-  if (!uncommitted_) return;
+  if (!uncommitted_) return Undo();
   try {
     CommitNow();
   } catch (...) {
@@ -352,6 +365,7 @@ std::int64_t IndexWriter::DeleteSelected(const Selection& selection) {
 }
 
 Json::Value IndexWriter::Find(const Selection& selection) {
+  Undo();
   const bool wants_text = WantsText(*schema_, selection);
   const std::set<std::string>* only = selection.load_fields ? &*selection.load_fields : nullptr;
   Json::Value found(Json::arrayValue);

@@ -94,6 +94,7 @@ class IndexWriter {
   auto Change(Action action);
   void Begin();
   void Rollback() noexcept;
+  void Undo();
   void CommitNow();
   void LoadCounters();
   void KeepWithinLimits();
@@ -131,6 +132,7 @@ class IndexWriter {
   std::atomic<std::int64_t> documents_{0};
   std::atomic<bool> uncommitted_{false};
   bool lost_ = false;
+  bool must_undo_ = false;  // what is lost is in the database or the counters still
   bool terms_requested_ = false;
   std::size_t transaction_bytes_ = 0;
   std::chrono::steady_clock::time_point transaction_start_{};
