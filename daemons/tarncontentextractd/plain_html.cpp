@@ -89,6 +89,12 @@ LibraryRules& Rules() {
   return rules;
 }
 
+// Characters that text does not hold are for the parser to judge: at some it ends an attribute.
+bool IsForTheParser(std::string_view character) {
+  return (!character.empty() && static_cast<unsigned char>(character[0]) < ' ') ||
+         character == "\xEF\xBF\xBE" || character == "\xEF\xBF\xBF";
+}
+
 // The character reference at `*at`, where "&" stands, which is moved behind it; "" for one that is
 // not written as it should be.
 std::string TakeReference(std::string_view text, std::size_t* at) {
@@ -96,8 +102,7 @@ std::string TakeReference(std::string_view text, std::size_t* at) {
   if (size == std::string_view::npos) return std::string();
   std::string decoded = DecodeEntity(text.substr(*at + 1, size - 1));
   *at += size + 1;
-  // Characters that text does not hold are for the parser to judge.
-  if (!decoded.empty() && static_cast<unsigned char>(decoded[0]) < ' ') decoded.clear();
+  if (IsForTheParser(decoded)) decoded.clear();
   return decoded;
 }
 

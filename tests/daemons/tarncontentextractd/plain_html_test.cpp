@@ -113,6 +113,8 @@ TEST(PlainHtml, WhatHasToBeGuessedIsLeftToTheParser) {
                            "<html><!DOCTYPE html></html>",
                            "<?xml version='1.0'?><html></html>",
                            "<!DOCTYPE html PUBLIC \"x\"><html></html>",
+                           "\xEF\xBB\xBF<html></html>",
+                           "<!DOCTYPE HTML><html></html>",
                            "<HTML></HTML>"}) {
     EXPECT_FALSE(ShortWay(page)) << page;
   }
@@ -140,8 +142,18 @@ TEST(PlainHtml, WhatHasToBeGuessedIsLeftToTheParser) {
                            "<x></x>",
                            "<img alt>",
                            "<img alt=\"&nonesuch;\">",
+                           "<img alt=\"a&#xFFFE;b\">",
+                           "<meta name=\"author\" content=\"a&#65535;b\">",
                            "<textarea></textarea>",
                            "<svg></svg>",
+                           "<math></math>",
+                           "<noscript></noscript>",
+                           "<iframe></iframe>",
+                           "<template></template>",
+                           "<plaintext></plaintext>",
+                           "<xmp></xmp>",
+                           "<br></br>",
+                           "<title>a<b>c</b></title>",
                            "<script><!-- --></script>",
                            "<script></SCRIPT></script>",
                            "<script></script ></script>",
@@ -190,6 +202,88 @@ TEST(PlainHtml, ElementsWithinEachOtherAreWhatTheParserTakesThemFor) {
     }
   }
   EXPECT_GT(plain, 2000u);
+}
+
+// Oddities in which nothing is left to guess.
+TEST(PlainHtml, WhatIsOddButPlainIsReadAlike) {
+  for (const char* body :
+       {"<form><div><form>a</form>b</div></form>c", "<a>x<span><a>y</a>z</span></a>",
+        "<table>q<tr>w<td><table><tr><td>e</td></tr></table></td>r</tr>t</table>",
+        "<td>x</td>y<tr>z</tr><li>a<p>b</p></li>",
+        "<img alt=\"a\" alt=\"b\"><img alt=\"a>b<c\r\nd\" alt=\"\">",
+        "<meta name=\"author\" name=\"keywords\" content=\"x\" content=\"y\">",
+        "<meta charset=\"utf-16\"><meta content=\"text/html; charset=latin1\">"
+        "\xC3\xA9\xEF\xBB\xBF\xE2\x80\xA8\xF0\x9F\x98\x80",
+        "<pre>\r\n\r\n a\rb</pre>c", "a<p/>b<div/>c<script/>d<title/>e<ul/>f",
+        "a<title>b&amp;<!-- c -->d</title>e<title>f</title>", "a<!---->b<!-- > < & -->c]]>d",
+        "&#128;&#x1FFFF;&#X41;&#000065;&#127;&thetasym;&apos;"}) {
+    EXPECT_TRUE(BothAgree(PageOf(body))) << body;
+  }
+  EXPECT_TRUE(BothAgree("<html/>"));
+  EXPECT_TRUE(BothAgree("<html><head/><body/></html>"));
+  EXPECT_TRUE(BothAgree(
+      "<html><!--a--><head><!--b--></head><!--c--><body>x</body><!--d--></html><!--e-->"));
+  const auto repeated = [](const std::string& piece, int times) {
+    std::string all;
+    while (times-- > 0) all += piece;
+    return all;
+  };
+  EXPECT_TRUE(BothAgree(PageOf(repeated("<div>", 900) + "x" + repeated("</div>", 900) + "y")));
+  EXPECT_TRUE(BothAgree(PageOf("<img alt=\"" + repeated("word ", 100000) + "\">after")));
+  EXPECT_TRUE(BothAgree("<html><head><title>" + repeated("\xC3\xA9 ab", 10000) +
+                        "</title></head><body>x</body></html>"));
+  EXPECT_TRUE(BothAgree(PageOf("<p" + repeated(" a=\"b\"", 1000) + ">x</p>")));
+}
+
+// Pages of elements in each other, whatever they are, closed in their order.
+class PageMaker {
+ public:
+  explicit PageMaker(unsigned seed) : random_(seed) {}
+
+  std::string Content(int levels) {
+    std::string content;
+    for (std::size_t count = Pick(5); count > 0; --count) {
+      content += levels == 0 || Pick(2) == 0 ? OneOf(kBits) : Element(levels);
+    }
+    return content;
+  }
+
+ private:
+  using Pieces = std::vector<std::string>;
+
+  std::size_t Pick(std::size_t count) { return random_() % count; }
+  const std::string& OneOf(const Pieces& pieces) { return pieces[Pick(pieces.size())]; }
+
+  std::string Element(int levels) {
+    const std::string& name = OneOf(kNames);
+    std::string element = "<" + name;
+    for (std::size_t count = Pick(4); count > 0; --count) {
+      element += " " + OneOf(kKeys) + "=\"" + OneOf(kValues) + "\"";
+    }
+    if (name == "br" || name == "img" || name == "meta" || Pick(25) == 0) return element + "/>";
+    return element + ">" + Content(name == "title" ? 0 : levels - 1) + "</" + name + ">";
+  }
+
+  const Pieces kNames{"a",     "b",     "code", "dd",   "div", "dl",    "dt",    "form", "h1",
+                      "img",   "br",    "li",   "meta", "nav", "p",     "pre",   "q",    "span",
+                      "table", "tbody", "td",   "th",   "tr",  "title", "style", "ul",   "script"};
+  const Pieces kBits{
+      " ",      "\r\n",   "words",  "\xC3\xA9",    "\xEF\xBF\xBE", "\x7F",     "&amp;",
+      "&nbsp;", "&#x85;", "&#128;", "&#xFFFF;",    "&apos;",       "<!-- -->", "<!-- > \xC2\x85-->",
+      "]]>",    "\"",     "'",      "\xE2\x80\xA8"};
+  const Pieces kKeys{"id", "name", "content", "alt", "property", "charset"};
+  const Pieces kValues{"",      "author",   "Keywords", "og:title",      "generator",  " a\nb ",
+                       "a>b<c", "it&#39;s", "&nbsp;",   "&#xFFFE;after", "description"};
+  std::mt19937 random_;
+};
+
+TEST(PlainHtml, PagesMadeAtRandomAreReadAlike) {
+  PageMaker maker(11);
+  std::size_t plain = 0;
+  for (int round = 0; round < 20000; ++round) {
+    plain += BothAgree(PageOf(maker.Content(1 + round % 6))) ? 1 : 0;
+  }
+  EXPECT_GT(plain, 5000u);
 }
 
 TEST(PlainHtml, EveryBeginningOfAPageIsReadAlike) {
