@@ -152,6 +152,7 @@ TEST(PlainHtml, WhatHasToBeGuessedIsLeftToTheParser) {
                            "<template></template>",
                            "<plaintext></plaintext>",
                            "<xmp></xmp>",
+                           "<!---->",
                            "<br></br>",
                            "<title>a<b>c</b></title>",
                            "<script><!-- --></script>",
@@ -215,7 +216,7 @@ TEST(PlainHtml, WhatIsOddButPlainIsReadAlike) {
         "<meta charset=\"utf-16\"><meta content=\"text/html; charset=latin1\">"
         "\xC3\xA9\xEF\xBB\xBF\xE2\x80\xA8\xF0\x9F\x98\x80",
         "<pre>\r\n\r\n a\rb</pre>c", "a<p/>b<div/>c<script/>d<title/>e<ul/>f",
-        "a<title>b&amp;<!-- c -->d</title>e<title>f</title>", "a<!---->b<!-- > < & -->c]]>d",
+        "a<title>b&amp;<!-- c -->d</title>e<title>f</title>", "a<!-- -->b<!-- > < & -->c]]>d",
         "&#128;&#x1FFFF;&#X41;&#000065;&#127;&thetasym;&apos;"}) {
     EXPECT_TRUE(BothAgree(PageOf(body))) << body;
   }
