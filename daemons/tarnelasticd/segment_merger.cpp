@@ -20,6 +20,8 @@ constexpr std::size_t kMostInputs = 64;
 constexpr std::int64_t kLeavesToRemove = 64;
 // Leaves that are merged while one change waits.
 constexpr std::int64_t kMostLeaves = 20000;
+// So many may be written anew for the sake of one.
+constexpr std::int64_t kFewLeaves = 256;
 // More than a table of any size comes to by itself.
 constexpr std::size_t kManyLevels = 8;
 
@@ -167,7 +169,6 @@ class SegmentMerger {
 // they would be written anew for the sake of a few leaves. Returns whether any do.
 bool PassOnLarge(std::size_t level, FtsStructure* structure) {
   constexpr std::int64_t kTimes = 8;
-  constexpr std::int64_t kFewLeaves = 256;
   if (level + 1 >= kManyLevels) return false;
   if (level + 1 == structure->levels.size()) structure->levels.emplace_back();
   std::vector<Segment>& from = structure->levels[level].segments;
@@ -195,6 +196,29 @@ void MergeInto(Database* db, const std::string& table, const std::vector<Segment
   const std::int64_t leaves = writer.Finish();
   if (leaves > 0) structure->levels[level].segments.push_back({id, 1, leaves});
   WriteStructure(db, table, *structure);
+}
+
+// FTS5 takes very long for a large level, a few leaves with each commit, and newer segments come to
+// that level meanwhile. Makes these one while they are about as large as those behind them, so that
+// there are few of them, and no leaf is written often.
+void MergeNewest(Database* db, const std::string& table, std::size_t level,
+                 FtsStructure* structure) {
+  std::vector<Segment>& all = structure->levels[level].segments;
+  const auto begin = static_cast<std::size_t>(structure->levels[level].merging);
+  std::int64_t leaves = 0;
+  std::size_t first = all.size();
+  while (first > begin && all.size() - first < kMostInputs) {
+    const std::int64_t more = CountLeaves({all[first - 1]});
+    if (leaves > 0 && more > std::max(kFewLeaves, 2 * leaves)) break;
+    if (leaves + more > kMostLeaves) break;
+    leaves += more;
+    --first;
+  }
+  if (all.size() - first < kManySegments) return;
+  const std::int64_t id = structure->NextSegment();
+  const std::vector<Segment> newest(all.begin() + static_cast<std::ptrdiff_t>(first), all.end());
+  all.resize(first);
+  MergeInto(db, table, newest, id, level, {}, structure);
 }
 
 // All segments, the oldest first, or none where some are not to be touched.
@@ -249,10 +273,13 @@ bool MergeAllSegments(Database* db, const std::string& table, const WordVisitor&
 
 void MergeFullLevels(Database* db, const std::string& table, FtsStructure* structure) {
   for (std::size_t i = 0; i < structure->levels.size(); ++i) {
+    if (structure->levels[i].segments.size() < kManySegments) continue;
     // A merge that FTS5 has begun goes on with the last segment of the next level.
-    const bool is_free =
-        structure->levels[i].merging == 0 && (i == 0 || structure->levels[i - 1].merging == 0);
-    if (!is_free || structure->levels[i].segments.size() < kManySegments) continue;
+    if (i > 0 && structure->levels[i - 1].merging > 0) continue;
+    if (structure->levels[i].merging > 0) {
+      MergeNewest(db, table, i, structure);
+      continue;
+    }
     if (PassOnLarge(i, structure)) WriteStructure(db, table, *structure);
     const FtsStructure::Level& level = structure->levels[i];
     if (level.segments.size() < kManySegments) continue;

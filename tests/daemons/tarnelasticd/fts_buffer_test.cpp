@@ -275,6 +275,31 @@ TEST_F(FtsBufferTest, KeepsSegmentsFew) {
   ExpectSame();
 }
 
+// It takes long for what is too large to be merged at once, and more comes meanwhile.
+TEST_F(FtsBufferTest, KeepsSegmentsFewWhileFts5Merges) {
+  for (int id = 1; id <= 4; ++id) {
+    std::string text;
+    for (int i = 0; i < 50000; ++i) text += "word" + std::to_string(id * 1000000 + i * 7) + ' ';
+    Begin();
+    Insert(id, {text, "", ""});
+    Commit();
+  }
+  db_->Execute("INSERT INTO body(body,rank) VALUES('merge',10)");
+  const auto is_merging = [this] {
+    return ReadStructure(db_.get(), "body")->levels[0].merging > 0;
+  };
+  int id = 5;
+  for (; is_merging(); ++id) {
+    Begin();
+    Insert(id, {Text(50, 1000), "", ""});
+    if (id % 4 == 0) Remove(id - 3);
+    Commit();
+    EXPECT_LE(Segments(), 16);
+  }
+  EXPECT_GT(id, 20);
+  ExpectSame();
+}
+
 // FTS5 would add a level each time, and fail with the two thousandth.
 TEST_F(FtsBufferTest, KeepsLevelsFewWhereAllIsMerged) {
   for (int id = 1; id <= 60; ++id) {
