@@ -12,6 +12,7 @@
 #include "daemons/common/command_line.h"
 #include "daemons/common/heap.h"
 #include "daemons/common/log.h"
+#include "daemons/common/open_files.h"
 #include "daemons/common/single_instance.h"
 #include "daemons/common/socket_server.h"
 #include "daemons/common/stop_signal.h"
@@ -30,6 +31,8 @@ constexpr std::size_t kMaxRequestBytes = std::size_t{4} << 20;
 constexpr int kFinishMilliseconds = 400;
 
 int Serve(std::size_t workers) {
+  // Each client has a few files open at a time, and machines with many processors many clients.
+  daemon::AllowManyFiles();
   const daemon::SingleInstance instance(kName);
   daemon::StopSignal stop;
   extract::WorkerPoolOptions pool_options;

@@ -1,7 +1,6 @@
 // tarnelasticd: the search engine's process.
 
 #include <sqlite3.h>
-#include <sys/resource.h>
 
 #include <CLI/CLI.hpp>
 #include <condition_variable>
@@ -16,6 +15,7 @@
 #include "daemons/common/command_line.h"
 #include "daemons/common/heap.h"
 #include "daemons/common/log.h"
+#include "daemons/common/open_files.h"
 #include "daemons/common/single_instance.h"
 #include "daemons/common/socket_server.h"
 #include "daemons/common/stop_signal.h"
@@ -89,20 +89,13 @@ void BoundMemory(std::size_t bytes) {
   sqlite3_hard_heap_limit64(static_cast<sqlite3_int64>(bytes));
 }
 
-// Each index keeps a handful of files open, and there is one per share.
-void AllowManyFiles() {
-  struct rlimit limit {};
-  if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
-  limit.rlim_cur = limit.rlim_max;
-  setrlimit(RLIMIT_NOFILE, &limit);
-}
-
 void Serve(const Settings& settings) {
   daemon::StopSignal stop;
   const daemon::SingleInstance instance(kName);
   const std::size_t memory = settings.memory_mib << 20;
   BoundMemory(memory);
-  AllowManyFiles();
+  // Each index keeps a handful of files open, and there is one per share.
+  daemon::AllowManyFiles();
   EngineOptions options;
   options.registry_path = RootedPath("/var/lib/quarry/engine/indexes.json");
   options.memory_bytes = memory;
