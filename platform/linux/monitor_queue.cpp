@@ -74,7 +74,9 @@ bool MonitorQueue::Upsert(const MonitorQueue& queue, const std::string& applicat
   }
   const std::string file = FileFor(registration.queue, application);
   if (file.empty()) return false;
+  // The monitor makes the directory, too, but nobody has been told yet that it will last.
   return MakeDirectories(MonitorDirectory(), 0750) &&
+         SyncDirectory(ParentDirectory(MonitorDirectory())) &&
          WriteFileDurably(file, quarry::toString(document) + "\n");
 }
 

@@ -1,13 +1,37 @@
 #include "platform/include/monitor.h"
 
 #include <gtest/gtest.h>
+#include <sys/syscall.h>
+#include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
+#include <filesystem>
+#include <string>
+#include <vector>
 
 #include "common/json.h"
 #include "tests/support/files.h"
 #include "tests/support/root.h"
 #include "tests/support/temp_dir.h"
+
+namespace {
+
+// What has been synced, in its order.
+std::vector<std::string>& Synced() {
+  static std::vector<std::string> paths;
+  return paths;
+}
+
+}  // namespace
+
+// In the place of the C library's: nothing else tells what would outlast a power failure.
+extern "C" int fsync(int fd) {
+  std::error_code failure;
+  Synced().push_back(
+      std::filesystem::read_symlink("/proc/self/fd/" + std::to_string(fd), failure).string());
+  return static_cast<int>(syscall(SYS_fsync, fd));
+}
 
 namespace TARN::TARNOTIFYD {
 namespace {
@@ -44,6 +68,15 @@ TEST_F(MonitorQueueTest, KeepsARegistrationInAFileOfItsOwn) {
   EXPECT_EQ(quarry::toString(document),
             "{\"application\":\"fileindex\",\"config\":[{\"ignore\":[\"@eaDir\"],\"mask\":65478,"
             "\"path\":\"/v/photo/0\"}],\"queue\":\"/q/photo\",\"type\":1}");
+}
+
+TEST_F(MonitorQueueTest, ADirectoryThatSomebodyElseHasMadeLastsAsWell) {
+  ASSERT_TRUE(std::filesystem::create_directories(dir_));
+  Synced().clear();
+  ASSERT_TRUE(MonitorQueue::Upsert(MonitorQueue(Config("/q/photo")), "fileindex", kType));
+  const std::string parent = std::filesystem::path(dir_).parent_path();
+  EXPECT_EQ(std::count(Synced().begin(), Synced().end(), parent), 1);
+  EXPECT_EQ(std::count(Synced().begin(), Synced().end(), dir_), 1);
 }
 
 TEST_F(MonitorQueueTest, ReplacesTheRegistrationOfTheSameQueueOnly) {
