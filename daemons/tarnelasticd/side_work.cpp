@@ -1,7 +1,6 @@
 #include "daemons/tarnelasticd/side_work.h"
 
 #include <algorithm>
-#include <system_error>
 #include <utility>
 
 namespace quarry::engine {
@@ -45,7 +44,7 @@ void SideWork::StartHelper() {
   try {
     helper_ = std::thread([this] { Help(); });
     is_helping_ = true;
-  } catch (const std::system_error&) {
+  } catch (const std::exception&) {
   }
 }
 
@@ -68,6 +67,7 @@ std::shared_ptr<SideWork::Task> SideWork::TakeFirst(Queue* queue) noexcept {
 // Whether nobody had begun it; nobody else will then.
 bool SideWork::Take(const std::shared_ptr<Task>& task) noexcept {
   const std::lock_guard<std::mutex> lock(mutex_);
+  if (task->is_done_) return false;
   for (Queue* queue : {&waiting_, &large_}) {
     const auto found = std::find(queue->begin(), queue->end(), task);
     if (found == queue->end()) continue;
@@ -93,7 +93,16 @@ void SideWork::Run(Task* task) noexcept {
 }
 
 void SideWork::RunAll() noexcept {
-  while (const std::shared_ptr<Task> task = TakeFirst(&waiting_)) Run(task.get());
+  for (std::size_t left = CountWaiting(); left > 0; --left) {
+    const std::shared_ptr<Task> task = TakeFirst(&waiting_);
+    if (!task) return;
+    Run(task.get());
+  }
+}
+
+std::size_t SideWork::CountWaiting() const noexcept {
+  const std::lock_guard<std::mutex> lock(mutex_);
+  return waiting_.size();
 }
 
 bool SideWork::IsDone(const Task& task) const {

@@ -33,7 +33,8 @@ class SideWork {
   // uses must stay as long as the task does, also when nobody asks for it any more.
   std::shared_ptr<Task> Add(std::size_t bytes, std::function<void()> run);
 
-  // Does all that nobody has begun, but for what is large.
+  // Does what nobody has begun by now, but for what is large. What others add meanwhile they do
+  // themselves, or whoever helps them without end would never be answered.
   void RunAll() noexcept;
 
   // What works on so many bytes is large.
@@ -50,6 +51,7 @@ class SideWork {
   using Queue = std::deque<std::shared_ptr<Task>>;
   void StartHelper();
   void Help() noexcept;
+  std::size_t CountWaiting() const noexcept;
   std::shared_ptr<Task> TakeFirst(Queue* queue) noexcept;
   bool Take(const std::shared_ptr<Task>& task) noexcept;
   void Run(Task* task) noexcept;

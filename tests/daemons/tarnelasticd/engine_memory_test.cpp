@@ -1,13 +1,16 @@
 // What becomes of an index when there is no memory for a moment, whatever it was doing then.
 
+#include <atomic>
 #include <cstddef>
 #include <cstdlib>
 #include <functional>
+#include <memory>
 #include <new>
 #include <set>
 #include <utility>
 
 #include "common/json.h"
+#include "daemons/tarnelasticd/side_work.h"
 #include "tests/daemons/tarnelasticd/support/engine_fixture.h"
 #include "tests/support/files.h"
 
@@ -152,6 +155,33 @@ TEST_F(MemoryTest, RequestsLoseNothingUntold) {
       // There was none for the answer either.
     }
   });
+}
+
+// Neither is anything begun that nobody can ask for, nor does it need a thread of its own.
+TEST(SideWorkMemoryTest, LargeWorkIsDoneOnceOrRefused) {
+  long after = 0;
+  int refused = 0;
+  for (bool has_failed = true; has_failed; ++after) {
+    std::atomic<int> done{0};
+    std::shared_ptr<SideWork::Task> task;
+    {
+      SideWork work;
+      std::function<void()> run = [&done] { ++done; };
+      succeeding = after;
+      failing = 1;
+      try {
+        task = work.Add(SideWork::kLarge, std::move(run));
+      } catch (const std::bad_alloc&) {
+      }
+      has_failed = std::exchange(failing, 0) == 0;
+      succeeding = 0;
+      if (task) work.Finish(task);
+    }
+    EXPECT_EQ(done, task ? 1 : 0);
+    if (!task) ++refused;
+  }
+  EXPECT_GT(refused, 0);
+  EXPECT_GT(after, refused + 1) << "No thread was refused";
 }
 
 }  // namespace

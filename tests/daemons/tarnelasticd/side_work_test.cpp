@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
+#include <functional>
 #include <future>
 #include <new>
 #include <stdexcept>
@@ -23,6 +24,20 @@ TEST(SideWorkTest, IsDoneOnceAndInOrder) {
   work.RunAll();
   work.Finish(first);
   EXPECT_EQ(done, (std::vector<int>{1, 2}));
+}
+
+TEST(SideWorkTest, WhoHelpsIsDoneSomeTime) {
+  SideWork work;
+  int done = 0;
+  const std::function<void()> endless = [&] {
+    ++done;
+    work.Add(1, endless);
+  };
+  work.Add(1, endless);
+  work.RunAll();
+  EXPECT_EQ(done, 1);
+  work.RunAll();
+  EXPECT_EQ(done, 2);
 }
 
 TEST(SideWorkTest, WhoNeedsItDoesWhatNobodyHasBegun) {
