@@ -220,7 +220,6 @@ void TextStore::Write(std::int64_t id, std::string text) {
 
 void TextStore::Write(std::int64_t id, std::shared_ptr<const std::string> text) {
   if (!sealed_.empty()) PlaceSealed();
-  if (open_bytes_ >= kHeldBytes || open_bytes_ - sealed_bytes_ >= kOpenBytes) Flush();
   const auto opened = Open(id);
   Row& row = opened->second;
   if (row.sealed) Unseal(&row);
@@ -236,6 +235,8 @@ void TextStore::Write(std::int64_t id, std::shared_ptr<const std::string> text) 
   } else if (kept != row.texts.end()) {
     row.texts.erase(kept);
   }
+  // Not left to the next call: a request that has been answered must not go on holding much.
+  if (open_bytes_ >= kHeldBytes || open_bytes_ - sealed_bytes_ >= kOpenBytes) Flush();
 }
 
 // A row that has grown becomes several. A text that fills one has one of its own, so that its

@@ -1,5 +1,6 @@
 #include "daemons/tarnelasticd/word_cutter.h"
 
+#include <algorithm>
 #include <random>
 #include <utility>
 
@@ -10,6 +11,9 @@ namespace quarry::engine {
 namespace {
 
 constexpr std::size_t kFirstSlots = 4096;
+// Bytes of a place among the words of one text.
+constexpr std::size_t kMostPlace = 4;
+static_assert(WordCutter::kMaxText < std::size_t{1} << 7 * kMostPlace);
 constexpr std::size_t kManyWords = std::size_t{64} << 10;  // of one text
 
 // Whoever knows the seed could write texts whose words all meet in one place of the table. One for
@@ -130,8 +134,10 @@ void WordCutter::PlacePositions() {
 void WordCutter::EncodePositions(const std::vector<std::size_t>& starts, CutText* cut) {
   std::size_t used = 0;
   for (std::size_t i = 0; i < counts_.size(); ++i) {
-    const std::size_t most = (counts_[i] + 2 * starts.size()) * kMaxVarint;
-    if (encoded_.size() < used + most) encoded_.resize(2 * (used + most));
+    const std::size_t most = counts_[i] * kMostPlace + 2 * starts.size() * kMaxVarint;
+    if (encoded_.size() < used + most) {
+      encoded_.resize(std::max(used + most, 2 * encoded_.size()));
+    }
     char* const begin = encoded_.data() + used;
     char* const end =
         EncodeWord(places_.data() + place_ends_[i] - counts_[i], counts_[i], starts, begin);

@@ -5,6 +5,7 @@
 #include <atomic>
 #include <limits>
 #include <map>
+#include <memory>
 #include <random>
 #include <string>
 #include <thread>
@@ -368,6 +369,16 @@ TEST_F(TextStoreWorkTest, HoldsNoMoreThanItMay) {
   ExpectTexts(texts_, 100);
   store_.Flush();
   ExpectTexts(texts_, 100);
+}
+
+// Not even until the next one comes.
+TEST_F(TextStoreWorkTest, HoldsNothingOfWhatIsTooLarge) {
+  const std::string text(std::size_t{16} << 20, 'x');
+  const auto shared = std::make_shared<const std::string>(text);
+  store_.Write(1, shared);
+  EXPECT_EQ(Rows(), 1);
+  EXPECT_EQ(shared.use_count(), 1);
+  EXPECT_EQ(store_.Read(1), text);
 }
 
 TEST(TextStoreEndTest, MayEndBeforeItsWork) {

@@ -4,7 +4,10 @@
 #include <gtest/gtest.h>
 
 #include <random>
+#include <string>
 #include <thread>
+
+#include "daemons/tarnelasticd/fts_number.h"
 
 namespace quarry::engine {
 namespace {
@@ -33,6 +36,21 @@ TEST(WordCutterTest, CutsEachWordOnce) {
   EXPECT_EQ(cut.letters, "onetwo");
   EXPECT_EQ(cut.places, "\x02\x04\x03\x01\x01\x02");
   EXPECT_EQ(cut.words[0].place_bytes, 2U);
+}
+
+TEST(WordCutterTest, PlacesMayBeFarFromEachOther) {
+  constexpr std::size_t kBetween = std::size_t{1} << 21;
+  std::string text = "far";
+  for (std::size_t i = 0; i < kBetween; ++i) text += " a";
+  text += " far";
+  const CutText cut = WordCutters().Cut({"", text});
+  std::string places = {1, 1};
+  AppendVarint(&places, 2);
+  AppendVarint(&places, kBetween + 1 + 2);
+  ASSERT_EQ(cut.words.size(), 2U);
+  EXPECT_EQ(cut.places.substr(0, cut.words[0].place_bytes), places);
+  EXPECT_EQ(cut.words[1].place_bytes, 2 + kBetween);
+  EXPECT_THAT(cut.sizes, ElementsAre(0, kBetween + 2));
 }
 
 TEST(WordCutterTest, KeepsNothingOfTheTextBefore) {
