@@ -29,6 +29,15 @@ struct Field {
   FieldValue value;
 };
 
+// How many bytes their texts have.
+inline std::size_t TextBytes(const std::vector<Field>& fields) {
+  std::size_t bytes = 0;
+  for (const Field& field : fields) {
+    if (const auto* text = std::get_if<std::string>(&field.value)) bytes += text->size();
+  }
+  return bytes;
+}
+
 // What was found in a file.
 class Extraction {
  public:

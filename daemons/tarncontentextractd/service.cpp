@@ -67,14 +67,6 @@ bool HasMember(const std::string& object, const std::string& name) {
   return object.find('"' + name + "\":") != std::string::npos;
 }
 
-std::size_t SizeOf(const std::vector<Field>& fields) {
-  std::size_t size = 0;
-  for (const Field& field : fields) {
-    if (const auto* text = std::get_if<std::string>(&field.value)) size += text->size();
-  }
-  return size;
-}
-
 // A file whose content may be read by now.
 bool IsWanted(const Json::Value& data) {
   Json::Value options;
@@ -98,7 +90,7 @@ struct ExtractService::Draft {
   // The document as text, at the end of `out`.
   void AppendTo(std::string* out) const {
     const std::string text = AttributeText(path, attributes);
-    out->reserve(std::max(out->capacity(), out->size() + text.size() + SizeOf(fields) * 9 / 8));
+    out->reserve(std::max(out->capacity(), out->size() + text.size() + TextBytes(fields) * 9 / 8));
     out->append(text, 0, text.size() - 1);
     for (std::size_t i = 0; i < fields.size(); ++i) {
       // What the file system says is never overruled by what a parser says.

@@ -14,6 +14,9 @@ namespace quarry::extract {
 namespace {
 
 constexpr int kMaxDoublings = 5;
+// No further file is read for who holds so much already. Small files do not come to it, unless
+// they have taken their worker over.
+constexpr std::size_t kManyAnswerBytes = std::size_t{8} << 20;
 
 }  // namespace
 
@@ -172,9 +175,14 @@ class WorkerPool::Run {
     const std::size_t end = results_.size() + next.size();
     std::vector<std::vector<Field>> done;
     const WorkerOutcome outcome = slot_->Parse(next, pool_.options_.file_timeout, &done);
-    for (std::vector<Field>& fields : done)
-      results_.push_back({PoolOutcome::kDone, std::move(fields)});
+    for (std::vector<Field>& fields : done) Keep(std::move(fields));
     if (outcome != WorkerOutcome::kDone) Lose(outcome, fresh, next.size() > 1, end);
+  }
+
+  void Keep(std::vector<Field> fields) {
+    bytes_ += TextBytes(fields);
+    results_.push_back({PoolOutcome::kDone, std::move(fields)});
+    go_on_ = go_on_ && bytes_ < kManyAnswerBytes;
   }
 
   // The worker is of no more use.
@@ -192,7 +200,7 @@ class WorkerPool::Run {
     daemon::LogWarning("Content of " + files_[results_.size()].name +
                        " cannot be read: its worker " + (died ? ending : "did not answer in time"));
     results_.push_back({PoolOutcome::kBadFile, {}});
-    go_on_ = died;
+    go_on_ = go_on_ && died;
   }
 
   // What holds for all that are left.
@@ -205,6 +213,7 @@ class WorkerPool::Run {
   const std::vector<PoolFile>& files_;
   std::vector<PoolResult> results_;
   std::size_t alone_until_ = 0;
+  std::size_t bytes_ = 0;  // of what the results hold
   bool go_on_ = true;
 };
 

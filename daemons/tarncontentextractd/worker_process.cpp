@@ -221,12 +221,15 @@ WorkerOutcome WorkerProcess::Parse(const std::vector<WorkerFile>& files, millise
   if (HasSpoken()) return WorkerOutcome::kDied;
   const std::size_t sent = Send(files);
   if (sent == 0) return WorkerOutcome::kDied;
+  std::size_t bytes = 0;
   while (out->size() < sent) {
     std::string_view answer;
     const WorkerOutcome outcome = ReadMessage(&answer, Clock::now() + timeout);
     if (outcome != WorkerOutcome::kDone) return outcome;
+    bytes += answer.size();
     std::vector<Field> fields;
-    if (!ReadAnswer(answer, next_, &fields)) return WorkerOutcome::kDied;
+    // All together take no more room than one may.
+    if (bytes > kMaxAnswerBytes || !ReadAnswer(answer, next_, &fields)) return WorkerOutcome::kDied;
     out->push_back(std::move(fields));
     ++next_;
     ++files_done_;

@@ -46,8 +46,9 @@ class WorkerProcess {
 
   // Has the worker parse the files one after the other, which it knows of all along, so that it
   // need not wait for the next. Blocks for at most `timeout` for each, or until `stop_fd` is
-  // readable. `out` is set to the fields of those that it has answered for, the first ones. With
-  // kDone that is at least one, and less than all where the worker takes no more at a time.
+  // readable. `out` is set to the fields of those that it has answered for, the first ones.
+  // Together they are not more bytes than one answer may have. With kDone that is at least one, and
+  // less than all where the worker takes no more at a time.
   WorkerOutcome Parse(const std::vector<WorkerFile>& files, std::chrono::milliseconds timeout,
                       std::vector<std::vector<Field>>* out);
 

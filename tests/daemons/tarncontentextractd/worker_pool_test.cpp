@@ -224,6 +224,17 @@ TEST_F(WorkerPoolTest, MoreFilesThanAWorkerTakesAtATimeAreAllDone) {
   EXPECT_EQ(Names(ParseAll(pool, Texts(2000, "good"))), Texts(2000, "done"));
 }
 
+TEST_F(WorkerPoolTest, NoMoreIsReadOnceThereIsMuch) {
+  WorkerPool pool(options_);
+  EXPECT_EQ(Names(ParseAll(pool, Texts(8, "much"))), Texts(2, "done"));
+  EXPECT_EQ(Names(ParseAll(pool, {"much"})), Texts(1, "done"));
+  EXPECT_EQ(Names(ParseAll(pool, {"good", "much", "crash", "good"})),
+            (Texts{"done", "done", "bad", "done"}));
+  // The file behind a dead one is blamed for nothing that it has not done.
+  EXPECT_EQ(Names(ParseAll(pool, {"much", "crash", "much", "crash"})),
+            (Texts{"done", "bad", "done"}));
+}
+
 TEST_F(WorkerPoolTest, WithoutWorkersAllFilesAreToldSo) {
   options_.command = HostileWorker("open");
   WorkerPool pool(options_);

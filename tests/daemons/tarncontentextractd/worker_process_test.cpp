@@ -230,6 +230,12 @@ TEST_F(WorkerProcessTest, LongAnswersFollowEachOther) {
   EXPECT_EQ(Parse(worker, "pid"), WorkerOutcome::kDone);
 }
 
+TEST_F(WorkerProcessTest, AnswersTogetherAreBounded) {
+  WorkerProcess worker(HostileWorker(), kPatience, -1);
+  EXPECT_EQ(ParseAll(worker, std::vector<std::string>(8, "much")), WorkerOutcome::kDied);
+  EXPECT_EQ(all_.size(), 2u);
+}
+
 TEST_F(WorkerProcessTest, ASlowFileIsBegunWithNothingHeldBack) {
   const std::string words(std::size_t{1} << 20, 'w');
   test::WriteFile(dir_ / "long", words);

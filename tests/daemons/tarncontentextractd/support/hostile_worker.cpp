@@ -133,6 +133,7 @@ class HostileExtractor : public Extractor {
     if (what == "ahead") AnswerTwice();
     if (what == "usedcrash" && files_seen > 1) raise(SIGKILL);
     if (what == "overrule") Overrule(out);
+    if (what == "much") out.text().Append(std::string(std::size_t{6} << 20, 'w'));
     if (what == "good" || what == "usedcrash") out.text().Append(source.Bytes());
     out.Set(kTitleField, Try(what, source));
   }
