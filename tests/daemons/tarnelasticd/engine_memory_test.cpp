@@ -38,28 +38,29 @@ void* Allocate(std::size_t size) {
 
 }  // namespace
 
-void* operator new(std::size_t size) {
+// Not inlined, or compilers see memory of one kind given back as another.
+[[gnu::noinline]] void* operator new(std::size_t size) {
   return Allocate(size);
 }
-void* operator new[](std::size_t size) {
+[[gnu::noinline]] void* operator new[](std::size_t size) {
   return Allocate(size);
 }
-void* operator new(std::size_t size, const std::nothrow_t&) noexcept {
+[[gnu::noinline]] void* operator new(std::size_t size, const std::nothrow_t&) noexcept {
   return AllocateOrNull(size);
 }
-void* operator new[](std::size_t size, const std::nothrow_t&) noexcept {
+[[gnu::noinline]] void* operator new[](std::size_t size, const std::nothrow_t&) noexcept {
   return AllocateOrNull(size);
 }
-void operator delete(void* memory) noexcept {
+[[gnu::noinline]] void operator delete(void* memory) noexcept {
   std::free(memory);
 }
-void operator delete[](void* memory) noexcept {
+[[gnu::noinline]] void operator delete[](void* memory) noexcept {
   std::free(memory);
 }
-void operator delete(void* memory, std::size_t) noexcept {
+[[gnu::noinline]] void operator delete(void* memory, std::size_t) noexcept {
   std::free(memory);
 }
-void operator delete[](void* memory, std::size_t) noexcept {
+[[gnu::noinline]] void operator delete[](void* memory, std::size_t) noexcept {
   std::free(memory);
 }
 
