@@ -54,19 +54,22 @@ void TryParsers(const Registry& registry) {
 }
 
 // Answers that the daemon need not be woken for yet, since there is more to do. It must not wait
-// long for any: a file that takes its time is begun with nothing held back.
+// long for any: a file that may take its time is begun with nothing held back, and no file is begun
+// with the answer of one that has taken its time.
 class HeldAnswers {
  public:
   explicit HeldAnswers(int channel) : channel_(channel) {}
 
-  void Add(std::string message) {
-    if (held_.empty()) since_ = Clock::now();
-    held_ += message;
-  }
+  void Add(const std::string& message) { held_ += message; }
 
-  bool MayWaitFor(Source& next) const {
-    return held_.size() < kMostHeld && next.Expected() <= kQuickFile &&
-           Clock::now() - since_ < kLongestHeld;
+  // Sends what must not wait until the next file is done. Returns false when the daemon is gone.
+  bool BeginFile(Source& next) {
+    const Clock::time_point now = Clock::now();
+    const bool may_wait =
+        held_.size() < kMostHeld && next.Expected() <= kQuickFile && now - since_ < kLongestHeld;
+    if (may_wait && !held_.empty()) return true;
+    since_ = now;
+    return Send();
   }
 
   // Returns false when the daemon is gone.
@@ -84,7 +87,7 @@ class HeldAnswers {
 
   int channel_;
   std::string held_;
-  Clock::time_point since_;
+  Clock::time_point since_;  // the first of the files was begun
 };
 
 }  // namespace
@@ -120,7 +123,7 @@ void ServeFiles(const Registry& registry, int channel, int seconds) {
     if (received != Received::kRequest) return;
     SetTimer(seconds);
     Source source(request.file.get(), request.extension);
-    if (!answers.MayWaitFor(source) && !answers.Send()) return;
+    if (!answers.BeginFile(source)) return;
     answers.Add(MakeAnswer(request.number, ParseFile(registry, source)));
   }
 }

@@ -248,6 +248,12 @@ TEST_F(WorkerProcessTest, ASlowFileIsBegunWithNothingHeldBack) {
   EXPECT_EQ(answers.size(), 2u);
 }
 
+TEST_F(WorkerProcessTest, AnAnswerThatTookTimeIsNotHeldBack) {
+  WorkerProcess worker(HostileWorker(), kPatience, -1);
+  EXPECT_EQ(ParseAll(worker, {"slow", "stall"}, seconds(2)), WorkerOutcome::kTimedOut);
+  EXPECT_EQ(all_.size(), 1u);
+}
+
 struct MiddleEnd {
   const char* what;
   WorkerOutcome outcome;

@@ -13,6 +13,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <chrono>
 #include <cstdint>
 #include <cstdlib>
 #include <cstring>
@@ -132,6 +133,7 @@ class HostileExtractor : public Extractor {
     if (what == "endless") ClaimMuch();
     if (what == "ahead") AnswerTwice();
     if (what == "usedcrash" && files_seen > 1) raise(SIGKILL);
+    if (what == "slow") TakeTime();
     if (what == "overrule") Overrule(out);
     if (what == "much") out.text().Append(std::string(std::size_t{6} << 20, 'w'));
     if (what == "good" || what == "usedcrash") out.text().Append(source.Bytes());
@@ -141,6 +143,11 @@ class HostileExtractor : public Extractor {
  private:
   [[noreturn]] static void Spin() {
     for (volatile unsigned counter = 0;;) counter = counter + 1;
+  }
+  // Longer than an answer may be held back.
+  static void TakeTime() {
+    const auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(50);
+    while (std::chrono::steady_clock::now() < end) continue;
   }
   // Fields that are not a parser's to say.
   static void Overrule(Extraction& out) {
