@@ -169,6 +169,33 @@ Json::Value RandomValue(std::mt19937* random, int depth) {
   }
 }
 
+TEST(AppendJsonStringTest, AddsWhatTheLibraryWritesAndReadsBack) {
+  std::string all = "before";
+  std::string text;
+  const auto expect_same = [&] {
+    const std::string written =
+        WrittenByLibrary(Json::Value(text.data(), text.data() + text.size()));
+    std::string out = all;
+    AppendJsonString(&out, text);
+    EXPECT_EQ(out, all + written);
+    Json::Value read;
+    ASSERT_TRUE(ReadByLibrary(written, &read)) << written;
+    EXPECT_EQ(read.asString(), text);
+  };
+  expect_same();
+  // Any byte behind any other: what is no UTF-8 stays as it is, NUL is written as a number.
+  for (int first = 0; first < 256; ++first) {
+    text.clear();
+    for (int second = 0; second < 256; ++second) {
+      text += static_cast<char>(first);
+      text += static_cast<char>(second);
+    }
+    expect_same();
+  }
+  text = "\xE2\x80\xA8\xE2\x80\xA9\xEF\xBB\xBF\xED\xA0\x80\xF4\x90\x80\x80</script>\\u0041";
+  expect_same();
+}
+
 TEST(JsonTextTest, AgreesWithTheLibraryOnRandomDocuments) {
   std::mt19937 random(1);
   for (int i = 0; i < 1000; ++i) {
