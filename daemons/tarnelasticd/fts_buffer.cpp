@@ -184,6 +184,17 @@ void FtsBuffer::MergeSegments(const FtsStructure& structure, std::int64_t writte
       .Run();
 }
 
+// What FTS5 has written counts too: of itself it would merge all of a level in one go, however
+// large, when many small changes have come to it.
+void FtsBuffer::MergeAfterChanges() {
+  WriteOutFts(db_, kBody);
+  std::optional<FtsStructure> structure = ReadStructure(db_, kBody);
+  if (!structure) return;
+  MergeFullLevels(db_, kBody, &*structure);
+  ForgetFts(db_);
+  MergeSegments(*structure, /*written=*/0);
+}
+
 void FtsBuffer::SaveLists() {
   TakeCut(/*all=*/true);
   if (runs_.IsFull()) {
@@ -270,6 +281,7 @@ void FtsBuffer::Flush() {
     RunBody(body_.remove, id, change.old);
     RunBody(body_.insert, id, change.now);
   }
+  if (!bodies_.empty() && has_own_segments_) MergeAfterChanges();
   for (const auto& [id, change] : labels_) FlushLabels(id, change);
   FlushLengths();
   Clear();

@@ -97,6 +97,7 @@ class FtsBuffer {
   std::int64_t WriteSegment(FtsStructure* structure);
   void WriteWords(SegmentWriter* writer);
   void MergeSegments(const FtsStructure& structure, std::int64_t written);
+  void MergeAfterChanges();
   void ClearLists();
   void FlushLabels(std::int64_t id, const Change<std::optional<Labels>>& change);
   void FlushLengths();

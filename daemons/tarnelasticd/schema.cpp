@@ -180,6 +180,11 @@ std::string Schema::CreateStatements() const {
   };
   // A table without any full text still has a column, which stays empty.
   add_words("body", ColumnList("t", std::max<std::size_t>(text_columns_, 1)), kTextTokenizer);
+  // FTS5 begins to merge a level as it is, large parts and all, and then all at once while one
+  // change waits, when it has so many segments. FtsBuffer sees to it that it seldom has.
+  sql +=
+      "INSERT INTO body(body,rank) VALUES('automerge',16);"
+      "INSERT INTO body(body,rank) VALUES('crisismerge',64);";
   // Nobody asks how long these are.
   add_words("labels", "name,extra", kTextTokenizer, ", columnsize=0");
   add_words("names", "name", "trigram case_sensitive 1", ", columnsize=0");

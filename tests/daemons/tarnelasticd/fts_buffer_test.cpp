@@ -300,6 +300,31 @@ TEST_F(FtsBufferTest, KeepsSegmentsFewWhileFts5Merges) {
   ExpectSame();
 }
 
+// For the sake of one change many leaves would be written anew.
+TEST_F(FtsBufferTest, LeavesLargeSegmentsAloneWhereTextsChange) {
+  for (int id = 1; id <= 2; ++id) {
+    std::string text;
+    for (int i = 0; i < 130000; ++i) text += "word" + std::to_string(id * 1000000 + i * 7) + ' ';
+    Begin();
+    Insert(id, {text, "", ""});
+    Commit();
+  }
+  const char* const large = "SELECT hex(block) FROM body_data WHERE id>>37 IN (1,2)";
+  const std::vector<std::string> before = Rows(db_.get(), large);
+  EXPECT_GT(before.size(), 512U);
+  Begin();
+  Insert(3, {"one", "", ""});
+  Commit();
+  for (int i = 0; i < 80; ++i) {
+    Begin();
+    Change(3, {Text(50, 1000), "", ""});
+    Commit();
+    EXPECT_LE(Segments(), 20);
+  }
+  EXPECT_TRUE(Rows(db_.get(), large) == before);
+  ExpectSame();
+}
+
 // FTS5 would add a level each time, and fail with the two thousandth.
 TEST_F(FtsBufferTest, KeepsLevelsFewWhereAllIsMerged) {
   for (int id = 1; id <= 60; ++id) {
