@@ -314,5 +314,41 @@ TEST_F(IndexTest, SearchesAndWritesRunSideBySide) {
   EXPECT_EQ(failures, 0);
 }
 
+// Several threads' texts, large ones too, are being cut and compressed whenever the index moves.
+TEST_F(IndexTest, MovesAndPausesLoseNothingOfWhatIsBeingDone) {
+  constexpr int kWriters = 3;
+  constexpr int kEach = 30;
+  Create("a");
+  const std::string before = Ask("engine_status", Json::objectValue)["epoch"].asString();
+  const std::string large(std::size_t{1} << 20, ' ');
+  std::atomic<int> at_work{kWriters};
+  std::vector<std::thread> threads;
+  for (int writer = 0; writer < kWriters; ++writer) {
+    threads.emplace_back([&, writer] {
+      for (int i = 0; i < kEach; ++i) {
+        const std::string name = std::to_string(writer) + 'x' + std::to_string(i);
+        const std::string text = "alpha word" + name + (i % 5 == 0 ? large + "omega" : "");
+        const Json::Value request = UpsertRequest("a", FileDocument("/s/" + name, text));
+        while (!engine_->Handle(request)["success"].asBool()) std::this_thread::yield();
+      }
+      --at_work;
+    });
+  }
+  for (int i = 0; at_work > 0; ++i) {
+    Ask("index_config_set", ConfigData("a", "", DirectoryOf(i % 2 == 0 ? "a2" : "a")));
+    Ask("index_pause", IdData("a"));
+    Ask("index_resume", IdData("a"));
+    engine_->Tick();
+  }
+  for (std::thread& thread : threads) thread.join();
+  Commit("a");
+  EXPECT_EQ(Ask("engine_status", Json::objectValue)["epoch"].asString(), before);
+  EXPECT_EQ(Paths("alpha").size(), std::size_t{kWriters * kEach});
+  EXPECT_EQ(Paths("omega").size(), std::size_t{kWriters * kEach / 5});
+  for (const char* name : {"0x0", "1x29", "2x25"}) {
+    EXPECT_THAT(Paths(std::string("word") + name), ElementsAre(std::string("/s/") + name));
+  }
+}
+
 }  // namespace
 }  // namespace quarry::engine
