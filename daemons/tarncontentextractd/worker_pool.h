@@ -62,9 +62,9 @@ class WorkerPool {
   // Has one worker parse the files, one after the other. Blocks until a worker is free, and for at
   // most the two timeouts for each file, and at most twice that for a file whose worker died or
   // did not answer: before a file is blamed it is given to a new worker by itself, since another
-  // may have done the harm. Returns what became of the files in their order. It ends
-  // early only behind one that timed out, as those behind it have waited long enough, and once the
-  // texts are many megabytes; the others may be given to Parse() again.
+  // may have done the harm. Returns what became of the files in their order. It ends early
+  // only behind one that timed out, as those behind it have waited long enough, and once the texts
+  // are many megabytes; the others may be given to Parse() again.
   std::vector<PoolResult> Parse(const std::vector<PoolFile>& files);
 
   // Makes all that wait in Parse(), and all that come, return kStopped soon. Does not wait for
