@@ -37,7 +37,7 @@ void WordLists::Prefetch(const std::vector<CutText::Word>& words, std::size_t ne
   if (next + kFar < words.size()) __builtin_prefetch(slot_of(words[next + kFar]));
   if (next + kNear >= words.size()) return;
   const Slot* const slot = slot_of(words[next + kNear]);
-  if (slot->word != 0) __builtin_prefetch(&words_[slot->word - 1]);
+  if (slot->word != 0) __builtin_prefetch(&At(slot->word - 1));
 }
 
 void WordLists::Add(std::int64_t id, const CutText& text) {
@@ -57,30 +57,43 @@ void WordLists::Add(std::int64_t id, const CutText& text) {
 }
 
 WordLists::Word& WordLists::Find(std::string_view word, std::uint64_t hash) {
-  if (2 * words_.size() >= slots_.size()) Grow();
+  if (2 * std::size_t{count_} >= slots_.size()) Grow();
   const auto short_hash = static_cast<std::uint32_t>(hash >> 32);
   std::size_t slot = short_hash & (slots_.size() - 1);
   for (; slots_[slot].word != 0; slot = (slot + 1) & (slots_.size() - 1)) {
     if (slots_[slot].hash != short_hash) continue;
-    Word& known = words_[slots_[slot].word - 1];
+    Word& known = At(slots_[slot].word - 1);
     if (known.size == word.size() && AreEqualWords(known.text, word.data(), word.size()))
       return known;
   }
   char* const text = Allocate(word.size());
   if (!word.empty()) std::memcpy(text, word.data(), word.size());
   char* const block = Allocate(kFirstBlock + sizeof(char*));
-  words_.push_back({text, static_cast<std::uint32_t>(word.size()), short_hash, 0, kFirstBlock,
-                    block, block, block + kFirstBlock, 0});
-  slots_[slot] = {short_hash, static_cast<std::uint32_t>(words_.size())};
-  return words_.back();
+  Word& made = NewWord();
+  made = {text,
+          static_cast<std::uint32_t>(word.size()),
+          short_hash,
+          0,
+          kFirstBlock,
+          block,
+          block,
+          block + kFirstBlock,
+          0};
+  slots_[slot] = {short_hash, count_};
+  return made;
+}
+
+WordLists::Word& WordLists::NewWord() {
+  if (count_ % kChunkWords == 0) chunks_.emplace_back(new Word[kChunkWords]);
+  return At(count_++);
 }
 
 void WordLists::Grow() {
   slots_.assign(std::max(kFirstSlots, 2 * slots_.size()), Slot{});
-  for (std::uint32_t number = 0; number < words_.size(); ++number) {
-    std::size_t slot = words_[number].hash & (slots_.size() - 1);
+  for (std::uint32_t number = 0; number < count_; ++number) {
+    std::size_t slot = At(number).hash & (slots_.size() - 1);
     while (slots_[slot].word != 0) slot = (slot + 1) & (slots_.size() - 1);
-    slots_[slot] = {words_[number].hash, number + 1};
+    slots_[slot] = {At(number).hash, number + 1};
   }
 }
 
@@ -130,7 +143,7 @@ void WordLists::CopyList(const Word& word, std::string* list) {
 }
 
 std::size_t WordLists::bytes() const {
-  return slabs_.size() * kSlabBytes + words_.capacity() * sizeof(Word) +
+  return slabs_.size() * kSlabBytes + chunks_.size() * kChunkWords * sizeof(Word) +
          slots_.size() * sizeof(Slot);
 }
 
@@ -140,8 +153,11 @@ void WordLists::ForEach(const Visitor& visit) const {
     const Word* word;
   };
   std::vector<Place> order;
-  order.reserve(words_.size());
-  for (const Word& word : words_) order.push_back({SortKey({word.text, word.size}), &word});
+  order.reserve(count_);
+  for (std::uint32_t number = 0; number < count_; ++number) {
+    const Word& word = At(number);
+    order.push_back({SortKey({word.text, word.size}), &word});
+  }
   std::sort(order.begin(), order.end(), [](const Place& a, const Place& b) {
     if (a.key != b.key) return a.key < b.key;
     return std::string_view(a.word->text, a.word->size) <
@@ -161,7 +177,8 @@ void WordLists::ForEach(const Visitor& visit) const {
 }
 
 void WordLists::Clear() {
-  std::vector<Word>().swap(words_);
+  chunks_.clear();
+  count_ = 0;
   std::vector<Slot>().swap(slots_);
   slabs_.clear();
   slab_at_ = nullptr;

@@ -26,7 +26,7 @@ class WordLists {
   // Adds the text `id`, which must be above all that were added since Clear().
   void Add(std::int64_t id, const CutText& text);
 
-  bool empty() const { return words_.empty(); }
+  bool empty() const { return count_ == 0; }
   // Roughly the memory that is held.
   std::size_t bytes() const;
 
@@ -57,6 +57,11 @@ class WordLists {
     std::uint32_t word;  // its number from 1; 0: free
   };
 
+  Word& At(std::uint32_t number) { return chunks_[number / kChunkWords][number % kChunkWords]; }
+  const Word& At(std::uint32_t number) const {
+    return chunks_[number / kChunkWords][number % kChunkWords];
+  }
+  Word& NewWord();
   void Prefetch(const std::vector<CutText::Word>& words, std::size_t next) const;
   Word& Find(std::string_view word, std::uint64_t hash);
   void Grow();
@@ -64,7 +69,11 @@ class WordLists {
   void Append(Word* word, const char* bytes, std::size_t size);
   static void CopyList(const Word& word, std::string* list);
 
-  std::vector<Word> words_;
+  static constexpr std::uint32_t kChunkWords = 4096;
+
+  // A list that is moved when it grows would for a moment take three times the room.
+  std::vector<std::unique_ptr<Word[]>> chunks_;
+  std::uint32_t count_ = 0;  // of words
   std::vector<Slot> slots_;
   std::vector<std::unique_ptr<char[]>> slabs_;
   char* slab_at_ = nullptr;
