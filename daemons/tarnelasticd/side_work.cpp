@@ -80,7 +80,7 @@ bool SideWork::Take(const std::shared_ptr<Task>& task) noexcept {
 void SideWork::Run(Task* task) noexcept {
   std::exception_ptr failure;
   try {
-    task->run_();
+    std::exchange(task->run_, nullptr)();
   } catch (...) {
     failure = std::current_exception();
   }

@@ -5,6 +5,7 @@
 #include <atomic>
 #include <functional>
 #include <future>
+#include <memory>
 #include <new>
 #include <stdexcept>
 #include <thread>
@@ -155,6 +156,20 @@ TEST(SideWorkTest, FailuresOfWhatIsLargeComeToWhoNeedsIt) {
   SideWork work;
   const auto task = work.Add(SideWork::kLarge, [] { throw std::bad_alloc(); });
   EXPECT_THROW(work.Finish(task), std::bad_alloc);
+}
+
+TEST(SideWorkTest, HoldsNothingOfWhatIsDone) {
+  SideWork work;
+  const auto held = std::make_shared<int>(0);
+  for (const std::size_t bytes : {std::size_t{1}, SideWork::kLarge}) {
+    const auto done = work.Add(bytes, [held] { ++*held; });
+    work.Finish(done);
+    EXPECT_EQ(held.use_count(), 1);
+    const auto failed = work.Add(bytes, [held] { throw std::bad_alloc(); });
+    EXPECT_THROW(work.Finish(failed), std::bad_alloc);
+    EXPECT_EQ(held.use_count(), 1);
+  }
+  EXPECT_EQ(*held, 2);
 }
 
 TEST(SideWorkTest, ManyShareIt) {
