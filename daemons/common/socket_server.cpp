@@ -61,11 +61,10 @@ int PollTimeout(Clock::time_point until, Clock::time_point now, int limit_ms) {
 }
 
 // The handler's answer; empty when it failed.
-std::string RunHandler(const RequestHandler& handler, const std::string& request,
-                       const Peer& peer) {
+std::string RunHandler(const RequestHandler& handler, std::string request, const Peer& peer) {
   std::string reply;
   try {
-    reply = handler(request, peer);
+    reply = handler(std::move(request), peer);
   } catch (const std::exception& error) {
     LogError(std::string("A request failed: ") + error.what());
     return std::string();
@@ -260,10 +259,10 @@ bool SocketServer::Impl::ServeInput(std::uint64_t id, Connection& connection) {
 
 bool SocketServer::Impl::Dispatch(std::uint64_t id, Connection& connection, std::string request) {
   if (options_.workers == 0) {
-    return Reply(connection, RunHandler(handler_, request, connection.peer()));
+    return Reply(connection, RunHandler(handler_, std::move(request), connection.peer()));
   }
-  pool_->Add([this, id, peer = connection.peer(), request = std::move(request)] {
-    outbox_.Put(id, RunHandler(handler_, request, peer));
+  pool_->Add([this, id, peer = connection.peer(), request = std::move(request)]() mutable {
+    outbox_.Put(id, RunHandler(handler_, std::move(request), peer));
   });
   return true;
 }

@@ -24,10 +24,10 @@ struct Peer {
   gid_t gid = static_cast<gid_t>(-1);
 };
 
-// Makes the answer to one request. An empty answer, or an exception, closes the connection without
-// a frame. With workers it runs on several threads at once, but never twice at a time for one
-// connection.
-using RequestHandler = std::function<std::string(const std::string& request, const Peer& peer)>;
+// Makes the answer to one request, which is the handler's to let go of as soon as it may. An empty
+// answer, or an exception, closes the connection without a frame. With workers it runs on several
+// threads at once, but never twice at a time for one connection.
+using RequestHandler = std::function<std::string(std::string request, const Peer& peer)>;
 
 struct SocketServerOptions {
   // Threads that run the handler; with 0 it runs inside Step().

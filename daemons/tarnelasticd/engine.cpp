@@ -67,13 +67,14 @@ std::optional<std::string> OptionalName(const Json::Value& data, const char* key
 const std::string kUpsert = "document_upsert_by_id";
 
 // The requests from `element` on that store documents in the same index.
-std::vector<const Json::Value*> UpsertsOfOneIndex(Json::Value::const_iterator element,
-                                                  Json::Value::const_iterator end) {
-  std::vector<const Json::Value*> upserts;
+std::vector<Json::Value*> UpsertsOfOneIndex(Json::Value::iterator element,
+                                            Json::Value::iterator end) {
+  std::vector<Json::Value*> upserts;
   const Json::Value* id = nullptr;
   for (; element != end; ++element) {
-    if (!element->isObject() || (*element)["command"] != kUpsert) break;
-    const Json::Value& data = (*element)["data"];
+    const Json::Value& request = *element;
+    if (!request.isObject() || request["command"] != kUpsert) break;
+    const Json::Value& data = request["data"];
     if (!data.isObject() || (id != nullptr && data["id"] != *id)) break;
     id = &data["id"];
     upserts.push_back(&*element);
@@ -170,30 +171,33 @@ const std::map<std::string, Engine::Command>& Engine::Commands() {
   return commands;
 }
 
-std::string Engine::HandleText(const std::string& text) {
+std::string Engine::HandleText(std::string text) {
   try {
     Json::Value request;
-    if (fromString(request, text)) return toString(Handle(request));
-    return toString(FailureReply(kMalformedRequest, "The request is no JSON"));
+    if (!fromString(request, text)) {
+      return toString(FailureReply(kMalformedRequest, "The request is no JSON"));
+    }
+    std::string().swap(text);
+    return toString(Handle(std::move(request)));
   } catch (const std::bad_alloc&) {
     // Which command it was is not known, and some must never be answered as busy.
     return toString(FailureReply(kOutOfMemory, "Out of memory"));
   }
 }
 
-Json::Value Engine::Handle(const Json::Value& request) {
-  if (request.isObject() && request.isMember("compound")) return HandleBatch(request["compound"]);
+Json::Value Engine::Handle(Json::Value request) {
+  if (request.isObject() && request.isMember("compound")) return HandleBatch(&request["compound"]);
   return HandleOne(request);
 }
 
-Json::Value Engine::HandleBatch(const Json::Value& elements) {
-  if (!elements.isArray()) return FailureReply(kMalformedRequest, "Not an array: compound");
+Json::Value Engine::HandleBatch(Json::Value* elements) {
+  if (!elements->isArray()) return FailureReply(kMalformedRequest, "Not an array: compound");
   Json::Value response = SuccessReply(Json::Value(Json::arrayValue));
   response["has_fail"] = false;
-  for (auto element = elements.begin(); element != elements.end();) {
-    const std::vector<const Json::Value*> upserts = UpsertsOfOneIndex(element, elements.end());
+  for (auto element = elements->begin(); element != elements->end();) {
+    const std::vector<Json::Value*> upserts = UpsertsOfOneIndex(element, elements->end());
     std::vector<Json::Value> answers;
-    if (upserts.size() > 1) {
+    if (!upserts.empty()) {
       answers = UpsertAll(upserts);
     } else {
       answers.push_back(HandleOne(*element));
@@ -217,7 +221,7 @@ Json::Value Engine::HandleOne(const Json::Value& request) {
 
 // Documents in a row cost the writer one turn, and are made ready before it. Each is answered as it
 // would be by itself.
-std::vector<Json::Value> Engine::UpsertAll(const std::vector<const Json::Value*>& requests) {
+std::vector<Json::Value> Engine::UpsertAll(const std::vector<Json::Value*>& requests) {
   std::vector<Json::Value> answers(requests.size());
   const Json::Value all = Answer(
       kUpsert, [&] { return ReportingMemory([&] { return UpsertInto(requests, &answers); }); });
@@ -228,7 +232,7 @@ std::vector<Json::Value> Engine::UpsertAll(const std::vector<const Json::Value*>
   return answers;
 }
 
-Json::Value Engine::UpsertInto(const std::vector<const Json::Value*>& requests,
+Json::Value Engine::UpsertInto(const std::vector<Json::Value*>& requests,
                                std::vector<Json::Value>* answers) {
   const auto answer = [answers](std::size_t i, auto action) {
     (*answers)[i] = Answer(kUpsert, [&] {
@@ -238,10 +242,12 @@ Json::Value Engine::UpsertInto(const std::vector<const Json::Value*>& requests,
       });
     });
   };
-  const auto data_of = [&](std::size_t i) -> const Json::Value& { return (*requests[i])["data"]; };
+  const auto data_of = [&](std::size_t i) -> const Json::Value& {
+    return std::as_const(*requests[i])["data"];
+  };
   const std::shared_ptr<Index> index = catalog_.Find(NameProperty(data_of(0), "id"));
   std::size_t bytes = 0;
-  for (const Json::Value* request : requests) bytes += EstimateMemory((*request)["data"]["data"]);
+  for (std::size_t i = 0; i < requests.size(); ++i) bytes += EstimateMemory(data_of(i)["data"]);
   const MemoryBudget::Share memory(&memory_, bytes);
   Index::Access access(index.get());
   std::vector<std::optional<StoredDocument>> documents(requests.size());
@@ -250,6 +256,7 @@ Json::Value Engine::UpsertInto(const std::vector<const Json::Value*>& requests,
       const std::string path = NameProperty(data_of(i), "doc_id");
       documents[i] = MakeDocument(*access.schema(), path, ObjectProperty(data_of(i), "data"));
     });
+    *requests[i] = Json::Value();
   }
   access.Write([&](IndexWriter& writer) {
     for (std::size_t i = 0; i < requests.size(); ++i) {

@@ -43,10 +43,11 @@ class Engine {
   Engine(const Engine&) = delete;
   Engine& operator=(const Engine&) = delete;
 
-  // Answers one request, or a batch. Never throws; blocks as long as the work takes.
-  Json::Value Handle(const Json::Value& request);
+  // Answers one request, or a batch. Never throws; blocks as long as the work takes. What is not
+  // needed of the request any more it lets go of, documents above all, before it waits for others.
+  Json::Value Handle(Json::Value request);
   // The same from text to text. What is no JSON is answered with an error.
-  std::string HandleText(const std::string& request);
+  std::string HandleText(std::string request);
 
   // Commits what has been open for too long. To be called every second or so.
   void Tick();
@@ -62,10 +63,10 @@ class Engine {
   static const std::map<std::string, Command>& Commands();
 
   Json::Value HandleOne(const Json::Value& request);
-  std::vector<Json::Value> UpsertAll(const std::vector<const Json::Value*>& requests);
-  Json::Value UpsertInto(const std::vector<const Json::Value*>& requests,
+  std::vector<Json::Value> UpsertAll(const std::vector<Json::Value*>& requests);
+  Json::Value UpsertInto(const std::vector<Json::Value*>& requests,
                          std::vector<Json::Value>* answers);
-  Json::Value HandleBatch(const Json::Value& elements);
+  Json::Value HandleBatch(Json::Value* elements);
   Json::Value RunCommand(const std::string& name, const Json::Value& request);
 
   Json::Value IndexCreate(const Json::Value& data);

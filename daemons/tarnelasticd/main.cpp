@@ -104,8 +104,8 @@ void Serve(const Settings& settings) {
   server_options.workers = settings.threads;
   daemon::SocketServer server(
       RootedPath("/var/run/tarnelasticd.sock"),
-      [&engine](const std::string& request, const daemon::Peer&) {
-        return engine.HandleText(request);
+      [&engine](std::string request, const daemon::Peer&) {
+        return engine.HandleText(std::move(request));
       },
       server_options);
   server.WakeOn(stop.Fd());
