@@ -6,7 +6,6 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
-#include <cmath>
 #include <iterator>
 #include <map>
 #include <memory>
@@ -18,6 +17,7 @@
 #include "daemons/tarnelasticd/engine_error.h"
 #include "daemons/tarnelasticd/segment_merger.h"
 #include "daemons/tarnelasticd/varint.h"
+#include "tests/daemons/tarnelasticd/support/full_text.h"
 #include "tests/support/files.h"
 #include "tests/support/temp_dir.h"
 
@@ -59,9 +59,8 @@ class FtsBufferTest : public testing::Test {
   }
   std::unique_ptr<Database> Connect(const std::string& name) {
     auto db = std::make_unique<Database>(dir_ / name);
-    db->Execute(
-        "PRAGMA synchronous=OFF;PRAGMA journal_mode=MEMORY;"
-        "CREATE VIRTUAL TABLE temp.places USING fts5vocab(main,body,instance)");
+    db->Execute("PRAGMA synchronous=OFF;PRAGMA journal_mode=MEMORY");
+    CreatePlaces(db.get());
     return db;
   }
 
@@ -116,39 +115,14 @@ class FtsBufferTest : public testing::Test {
     statement.Run();
   }
 
-  static std::vector<std::string> Rows(Database* db, const std::string& sql) {
-    std::vector<std::string> rows;
-    Statement statement = db->Prepare(sql);
-    while (statement.Step()) rows.emplace_back(statement.Text(0));
-    return rows;
-  }
-  // Every place of every word, lengths and totals are the same, and FTS5 finds nothing wrong.
-  void ExpectSame() {
-    db_->Execute("INSERT INTO body(body) VALUES('integrity-check')");
-    for (const char* sql :
-         {"SELECT term||' '||doc||' '||col||' '||offset FROM temp.places ORDER BY term,doc,col,"
-          "offset",
-          "SELECT id||' '||hex(sz) FROM body_docsize ORDER BY id",
-          "SELECT hex(block) FROM body_data WHERE id=1"}) {
-      EXPECT_EQ(Rows(db_.get(), sql), Rows(model_.get(), sql)) << sql;
-    }
-  }
-  std::int64_t Number(const std::string& sql) {
-    Statement statement = db_->Prepare(sql);
-    return statement.Step() ? statement.Int(0) : -1;
-  }
+  void ExpectSame() { ExpectSameWords(db_.get(), model_.get()); }
   // Segments have places for their words, one for each first leaf at least.
-  std::int64_t Segments() { return Number("SELECT count(DISTINCT segid) FROM body_idx"); }
+  std::int64_t Segments() {
+    return Number(db_.get(), "SELECT count(DISTINCT segid) FROM body_idx");
+  }
 
-  // `words` words, the first ones of the vocabulary much more often than the others.
   std::string Text(std::size_t words, std::size_t vocabulary) {
-    std::string text;
-    for (std::size_t i = 0; i < words; ++i) {
-      const auto number = static_cast<std::uint64_t>(
-          std::pow(vocabulary, std::uniform_real_distribution<>(0, 1)(random_)));
-      text += "w" + std::to_string(number * 2654435761U % 1000003) + " ";
-    }
-    return text;
+    return RandomWords(&random_, words, vocabulary);
   }
 
   const Schema schema_ = ThreeTexts();
@@ -186,8 +160,8 @@ TEST_F(FtsBufferTest, SpreadsListsOverLeaves) {
   for (int i = 0; i < 9000; ++i) text += i % 300 == 0 ? "rare " : "often ";
   for (int i = 1; i < 40; ++i) Insert(3 * i, {text, "often", Text(2000, 20000)});
   Commit();
-  EXPECT_GT(Number("SELECT count(*) FROM body_data"), 50);
-  EXPECT_LE(Number("SELECT max(length(block)) FROM body_data"), 4096);
+  EXPECT_GT(Number(db_.get(), "SELECT count(*) FROM body_data"), 50);
+  EXPECT_LE(Number(db_.get(), "SELECT max(length(block)) FROM body_data"), 4096);
   ExpectSame();
 }
 

@@ -5,7 +5,6 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <cmath>
 #include <iterator>
 #include <map>
 #include <memory>
@@ -15,6 +14,7 @@
 
 #include "daemons/tarnelasticd/engine_error.h"
 #include "daemons/tarnelasticd/segment_writer.h"
+#include "tests/daemons/tarnelasticd/support/full_text.h"
 #include "tests/support/files.h"
 #include "tests/support/temp_dir.h"
 
@@ -37,8 +37,8 @@ class SegmentMergerTest : public testing::Test {
         "CREATE VIRTUAL TABLE body USING fts5(a,b, content='');"
         "INSERT INTO body(body,rank) VALUES('automerge',0);"
         "INSERT INTO body(body,rank) VALUES('crisismerge',1000);"
-        "CREATE VIRTUAL TABLE temp.places USING fts5vocab(main,body,instance);"
         "CREATE VIRTUAL TABLE temp.words USING fts5vocab(main,body,row)");
+    CreatePlaces(db.get());
     return db;
   }
 
@@ -61,28 +61,9 @@ class SegmentMergerTest : public testing::Test {
     texts_.erase(id);
   }
 
-  static std::vector<std::string> Rows(Database* db, const std::string& sql) {
-    std::vector<std::string> rows;
-    Statement statement = db->Prepare(sql);
-    while (statement.Step()) rows.emplace_back(statement.Text(0));
-    return rows;
-  }
-  void ExpectSame() {
-    tested_->Execute("INSERT INTO body(body) VALUES('integrity-check')");
-    for (const char* sql :
-         {"SELECT term||' '||doc||' '||col||' '||offset FROM temp.places ORDER BY term,doc,col,"
-          "offset",
-          "SELECT id||' '||hex(sz) FROM body_docsize ORDER BY id",
-          "SELECT hex(block) FROM body_data WHERE id=1"}) {
-      EXPECT_EQ(Rows(tested_.get(), sql), Rows(model_.get(), sql)) << sql;
-    }
-  }
-  std::int64_t Number(const std::string& sql) {
-    Statement statement = tested_->Prepare(sql);
-    return statement.Step() ? statement.Int(0) : -1;
-  }
+  void ExpectSame() { ExpectSameWords(tested_.get(), model_.get()); }
   std::int64_t Segments() {
-    return Number("SELECT count(DISTINCT id>>37) FROM body_data WHERE id>>37>0");
+    return Number(tested_.get(), "SELECT count(DISTINCT id>>37) FROM body_data WHERE id>>37>0");
   }
 
   // Merges both, and compares what has been told of words.
@@ -107,13 +88,7 @@ class SegmentMergerTest : public testing::Test {
   }
 
   std::string Text(std::size_t words, std::size_t vocabulary) {
-    std::string text;
-    for (std::size_t i = 0; i < words; ++i) {
-      const auto number = static_cast<std::uint64_t>(
-          std::pow(vocabulary, std::uniform_real_distribution<>(0, 1)(random_)));
-      text += "w" + std::to_string(number * 2654435761U % 1000003) + " ";
-    }
-    return text;
+    return RandomWords(&random_, words, vocabulary);
   }
   void ChangeAtRandom() {
     if (texts_.empty() || random_() % 4 != 0) {
@@ -164,7 +139,7 @@ TEST_F(SegmentMergerTest, ForgetsWhatIsDeleted) {
   Remove(2);
   EXPECT_TRUE(MergeAll());
   EXPECT_EQ(Segments(), 0);
-  EXPECT_EQ(Number("SELECT count(*) FROM body_idx"), 0);
+  EXPECT_EQ(Number(tested_.get(), "SELECT count(*) FROM body_idx"), 0);
   ExpectSame();
   Insert(1, "one");
   ExpectSame();
@@ -215,7 +190,7 @@ TEST_F(SegmentMergerTest, WritesIndexesOfLongLists) {
   EXPECT_TRUE(MergeAll());
   ExpectSame();
   const char* const indexes = "SELECT count(*) FROM body_data WHERE id>>36&1";
-  EXPECT_GE(Number(indexes), 2);
+  EXPECT_GE(Number(tested_.get(), indexes), 2);
   EXPECT_EQ(Rows(tested_.get(), indexes), Rows(model_.get(), indexes));
   const char* const phrase =
       "SELECT rowid FROM body('\"and rare often\" AND often') ORDER BY rowid";
@@ -242,9 +217,11 @@ TEST_F(SegmentMergerTest, WritesIndexesOfSeveralNodes) {
   AddToTotals(tested_.get(), "body", kRows, {kRows, 0});
   ForgetFts(tested_.get());
   tested_->Execute("COMMIT;INSERT INTO body(body) VALUES('integrity-check')");
-  EXPECT_GT(Number("SELECT count(*) FROM body_data WHERE id>>36&1 AND id>>31&31=0"), 1);
-  EXPECT_EQ(Number("SELECT count(*) FROM body_data WHERE id>>36&1 AND id>>31&31=1"), 1);
-  EXPECT_EQ(Number("SELECT count(*) FROM body('rare often')"), kRows / 1000);
+  EXPECT_GT(Number(tested_.get(), "SELECT count(*) FROM body_data WHERE id>>36&1 AND id>>31&31=0"),
+            1);
+  EXPECT_EQ(Number(tested_.get(), "SELECT count(*) FROM body_data WHERE id>>36&1 AND id>>31&31=1"),
+            1);
+  EXPECT_EQ(Number(tested_.get(), "SELECT count(*) FROM body('rare often')"), kRows / 1000);
 }
 
 TEST_F(SegmentMergerTest, MergesFullLevelsOnly) {
