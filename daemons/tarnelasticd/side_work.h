@@ -30,8 +30,9 @@ class SideWork {
   SideWork& operator=(const SideWork&) = delete;
 
   // Leaves `run`, which works on so many bytes and is called at most once, by any thread. What it
-  // uses must stay as long as the task does, also when nobody asks for it any more. What it holds
-  // is let go before the task is done: whoever waits for that may count on the memory.
+  // refers to must stay as long as the task does, also when nobody asks for it any more. What it
+  // owns is let go before the task is done, so that whoever waits for that may count on the memory;
+  // of a task that is dropped, at the end of its run, or with the last who has the task.
   std::shared_ptr<Task> Add(std::size_t bytes, std::function<void()> run);
 
   // Does what nobody has begun by now, but for what is large. What others add meanwhile they do
