@@ -195,8 +195,9 @@ void Worker::CheckShareIsThere() {
 }
 
 Worker::Milliseconds Worker::Fail(const std::string& error) {
-  progress_.SetState(WorkState::kRetrying);
+  // In this order: whoever reads that it is retrying also reads why.
   progress_.EndPass(error);
+  progress_.SetState(WorkState::kRetrying);
   if (error != last_error_)
     daemon::LogError("Share " + share_ + " cannot be indexed now: " + error);
   last_error_ = error;
