@@ -246,16 +246,25 @@ Json::Value Engine::UpsertInto(const std::vector<Json::Value*>& requests,
     return std::as_const(*requests[i])["data"];
   };
   const std::shared_ptr<Index> index = catalog_.Find(NameProperty(data_of(0), "id"));
+  std::vector<std::optional<std::string>> paths(requests.size());  // none: refused
   std::size_t bytes = 0;
-  for (std::size_t i = 0; i < requests.size(); ++i) bytes += EstimateMemory(data_of(i)["data"]);
+  for (std::size_t i = 0; i < requests.size(); ++i) {
+    answer(i, [&] {
+      const std::string path = NameProperty(data_of(i), "doc_id");
+      bytes += EstimateMemory(ObjectProperty(data_of(i), "data"));
+      paths[i] = path;
+    });
+  }
+  if (std::none_of(paths.begin(), paths.end(), [](const auto& path) { return path.has_value(); })) {
+    return {};
+  }
   const MemoryBudget::Share memory(&memory_, bytes);
   Index::Access access(index.get());
   std::vector<std::optional<StoredDocument>> documents(requests.size());
   for (std::size_t i = 0; i < requests.size(); ++i) {
-    answer(i, [&] {
-      const std::string path = NameProperty(data_of(i), "doc_id");
-      documents[i] = MakeDocument(*access.schema(), path, ObjectProperty(data_of(i), "data"));
-    });
+    if (!paths[i]) continue;
+    answer(i,
+           [&] { documents[i] = MakeDocument(*access.schema(), *paths[i], data_of(i)["data"]); });
     *requests[i] = Json::Value();
   }
   access.Write([&](IndexWriter& writer) {

@@ -43,8 +43,8 @@ class Engine {
   Engine(const Engine&) = delete;
   Engine& operator=(const Engine&) = delete;
 
-  // Answers one request, or a batch. Never throws; blocks as long as the work takes. What is not
-  // needed of the request any more it lets go of, documents above all, before it waits for others.
+  // Answers one request, or a batch. Never throws; blocks as long as the work takes. Documents of a
+  // batch are let go of when they have been made ready to be stored, before they wait for that.
   Json::Value Handle(Json::Value request);
   // The same from text to text. What is no JSON is answered with an error.
   std::string HandleText(std::string request);

@@ -17,6 +17,12 @@ using testing::IsEmpty;
 
 class DurabilityTest : public EngineTest {
  protected:
+  // Nothing is committed for its age, however slow the machine is.
+  DurabilityTest() {
+    WriterLimits limits;
+    limits.commit_age = std::chrono::hours(1);
+    UseLimits(limits);
+  }
   ~DurabilityTest() override { engine_.reset(); }
 
   // Ends the engine without giving it a chance to commit, as far as its files can tell.
@@ -104,9 +110,6 @@ TEST(WriterLimitsTest, NoTransactionStaysOpenForLong) {
 }
 
 TEST_F(DurabilityTest, TickLeavesAYoungTransactionAlone) {
-  WriterLimits limits;
-  limits.commit_age = std::chrono::hours(1);
-  UseLimits(limits);
   Create();
   Upsert(FileDocument("/s/1", "alpha"));
   engine_->Tick();
@@ -114,10 +117,9 @@ TEST_F(DurabilityTest, TickLeavesAYoungTransactionAlone) {
 }
 
 TEST_F(DurabilityTest, ATransactionEndsWhenItIsLarge) {
-  WriterLimits limits;
+  WriterLimits limits = options_.writer;
   limits.flush_bytes = 20000;
   limits.commit_bytes = 60000;
-  limits.commit_age = std::chrono::hours(1);
   UseLimits(limits);
   Create();
   int documents = 0;
@@ -140,9 +142,8 @@ TEST_F(DurabilityTest, ALargeTransactionLeavesNoLargeLog) {
 
 // Changes of attributes alone touch no full text, but fill the log all the same.
 TEST_F(DurabilityTest, ATransactionOfAttributesEndsWhenItIsLarge) {
-  WriterLimits limits;
+  WriterLimits limits = options_.writer;
   limits.commit_bytes = 100 * 512;
-  limits.commit_age = std::chrono::hours(1);
   UseLimits(limits);
   Create();
   Add("/s/1", "alpha");
@@ -274,6 +275,22 @@ TEST_F(CorruptionTest, AFileThatIsNoDatabaseIsAClearError) {
   EXPECT_EQ(AskError("search", only), 1405);
   ExpectRepairable();
   EXPECT_EQ(Problem(), "");
+}
+
+// Alone and in a batch, whatever beside them cannot be stored.
+TEST_F(CorruptionTest, DocumentsThatAreWrongAreToldSo) {
+  test::WriteFile(database_, std::string(8192, 'x'));
+  Start();
+  Json::Value wrong = UpsertRequest("a", FileDocument("/s/1"));
+  wrong["data"].removeMember("doc_id");
+  EXPECT_EQ(engine_->Handle(wrong)["error"]["code"].asInt(), 1402);
+  Json::Value batch;
+  batch["compound"].append(wrong);
+  EXPECT_EQ(engine_->Handle(batch)["data"][0U]["error"]["code"].asInt(), 1402);
+  batch["compound"].append(UpsertRequest("a", FileDocument("/s/2")));
+  const Json::Value answers = engine_->Handle(batch)["data"];
+  EXPECT_EQ(answers[0U]["error"]["code"].asInt(), 1402);
+  EXPECT_EQ(answers[1U]["error"]["code"].asInt(), 1405);
 }
 
 TEST_F(CorruptionTest, AMissingOrEmptyFileIsAClearError) {

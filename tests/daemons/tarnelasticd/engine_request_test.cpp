@@ -281,7 +281,12 @@ TEST_F(RequestTest, AnswersDocumentsOfBatchesOneByOne) {
   Json::Value batch;
   Json::Value expected(Json::arrayValue);
   for (const Json::Value& request : requests) batch["compound"].append(request);
-  for (const Json::Value& request : requests) expected.append(engine_->Handle(request));
+  for (const Json::Value& request : requests) {
+    Json::Value alone;
+    alone["compound"].append(request);
+    expected.append(engine_->Handle(request));
+    EXPECT_EQ(engine_->Handle(alone)["data"][0U], expected[expected.size() - 1]);
+  }
   const std::vector<std::string> below_a = Below("/s", "a");
   const std::vector<std::string> below_b = Below("/s", "b");
   for (const char* index : {"a", "b"}) {
