@@ -5,6 +5,7 @@
 
 #include <atomic>
 #include <ctime>
+#include <filesystem>
 #include <optional>
 #include <thread>
 
@@ -196,7 +197,10 @@ TEST_F(IndexDaemonTest, KeepsThePauseThatTheFileHas) {
   test::WriteFile(fileindex::kFileIndexStatusCfgPath, "{\"resume_time\":0}");
   StartDaemon();
   EXPECT_TRUE(Becomes({{"s", "paused"}}));
-  test::WriteFile(fileindex::kFileIndexStatusCfgPath, "{\"resume_time\":1}");
+  // Replaced whole, as the library does.
+  const std::string replacement = fileindex::kFileIndexStatusCfgPath + ".new";
+  test::WriteFile(replacement, "{\"resume_time\":1}");
+  std::filesystem::rename(replacement, fileindex::kFileIndexStatusCfgPath);
   EXPECT_TRUE(Becomes({{"s", "retrying"}}));
 }
 
@@ -295,9 +299,8 @@ TEST_F(IndexDaemonTest, AnswersCommandsThatComeAtTheVeryEnd) {
   test::RawPeer half(CommandSocketPath());
   const std::string frame = daemon::MakeFrame("{\"type\":\"resume\"}");
   half.Send(frame.substr(0, 6));
-  std::thread rest([&] { half.Send(frame.substr(6)); });
+  half.Send(frame.substr(6));
   EXPECT_TRUE(daemon_->Stop(std::chrono::seconds(20)));
-  rest.join();
   EXPECT_THAT(before.RecvFrame(), ::testing::HasSubstr("\"success\":true"));
   EXPECT_THAT(half.RecvFrame(), ::testing::HasSubstr("\"success\":true"));
   daemon_.reset();

@@ -200,8 +200,8 @@ TEST_F(WorkerTableTest, OneSharesTroubleIsItsOwn) {
   WorkerTable table([&](const std::string& share) {
     return MakeWorker(share == "broken" ? broken : host_, index_, disk_, slots_);
   });
-  table.SetShares({"broken", "s"});
   disk_.WriteFile("/v/s/a.txt");
+  table.SetShares({"broken", "s"});
   EXPECT_TRUE(test::WaitUntil([&] {
     std::set<std::string> states;
     for (const Json::Value& report : table.Report()) states.insert(report["state"].asString());

