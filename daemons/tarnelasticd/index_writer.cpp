@@ -111,6 +111,7 @@ void IndexWriter::Rollback() noexcept {
   uncommitted_ = false;
   lost_ = true;
   terms_requested_ = false;
+  words_changed_ = false;
   must_undo_ = true;
   try {
     Undo();
@@ -150,7 +151,8 @@ void IndexWriter::CommitNow() {
   buffer_.Flush();
   texts_.Flush();
   attributes_.Flush();
-  if (terms_requested_) {
+  if (std::exchange(words_changed_, false)) OutdateTerms(&db_);
+  if (terms_requested_ && !AreTermsCurrent(&db_)) {
     transaction_bytes_ += CollectTerms(&db_, next_id_ - collected_id_);
   }
   db_.Prepare("INSERT OR REPLACE INTO meta(key,value) VALUES('documents',?1)")
@@ -186,6 +188,8 @@ bool IndexWriter::TakeLost() {
 }
 
 void IndexWriter::RequestTerms() {
+  Undo();
+  if (!uncommitted_ && AreTermsCurrent(&db_)) return;
   Change([this] { return terms_requested_ = true; });
 }
 
@@ -210,6 +214,7 @@ void IndexWriter::WriteRow(const std::string& sql, std::int64_t id, const Docume
 
 void IndexWriter::ChangeLabels(const Found& old, const Labels& now) {
   if (old.labels == now) return;
+  words_changed_ = true;
   buffer_.ChangeLabels(old.id, old.labels, now);
 }
 
@@ -226,6 +231,7 @@ void IndexWriter::ChangeText(std::int64_t doc, std::string body) {
   const std::int64_t text = TextOf(&db_, doc);
   std::string old = texts_.Read(text);
   if (old == body) return;
+  words_changed_ = true;
   buffer_.NoteText(doc);
   if (!old.empty()) DropText(doc, text, std::move(old));
   if (!body.empty()) AddText(doc, std::move(body));
@@ -247,6 +253,7 @@ void IndexWriter::AddText(std::int64_t doc, std::string body) {
 void IndexWriter::Insert(StoredDocument document) {
   const std::int64_t id = NewId();
   WriteRow(insert_sql_, id, document.row);
+  words_changed_ = true;
   buffer_.InsertLabels(id, document.labels);
   transaction_bytes_ += document.body.size();
   ++documents_;
@@ -267,6 +274,7 @@ void IndexWriter::Replace(const Found& old, StoredDocument document) {
 
 void IndexWriter::Remove(const Found& old) {
   ChangeText(old.id, "");
+  words_changed_ = true;
   buffer_.ChangeLabels(old.id, old.labels, std::nullopt);
   db_.Prepare("DELETE FROM docs WHERE id=?1").Bind(1, old.id).Run();
   attributes_.Write(old.id, "");

@@ -63,7 +63,7 @@ class IndexWriter {
   // more than kMaxFound, or more than one with more text than kMaxFoundText together.
   Json::Value Find(const Selection& selection);
 
-  // Makes the words to suggest anew with the next commit.
+  // Makes the words to suggest anew with the next commit, where they are others by then.
   void RequestTerms();
   // Makes all changes durable and visible. Blocks for the disk.
   void Commit();
@@ -134,6 +134,7 @@ class IndexWriter {
   bool lost_ = false;
   bool must_undo_ = false;  // what is lost is in the database or the counters still
   bool terms_requested_ = false;
+  bool words_changed_ = false;  // in the open transaction
   std::size_t transaction_bytes_ = 0;
   std::chrono::steady_clock::time_point transaction_start_{};
 };

@@ -269,11 +269,20 @@ std::size_t CollectTerms(Database* db, std::int64_t new_documents) {
   if (documents <= kMaxSorted && new_documents * kFewOf > documents) {
     db->Execute("REINDEX docs;REINDEX text_hashes");
   }
+  db->Execute("INSERT OR REPLACE INTO meta(key,value) VALUES('terms_are_current',1)");
   return is_merged ? static_cast<std::size_t>(lists.leaves()) * SegmentWriter::kLeafBytes : 0;
 }
 
 bool HasTerms(Database* db) {
   return db->Prepare("SELECT 1 FROM terms LIMIT 1").Step();
+}
+
+bool AreTermsCurrent(Database* db) {
+  return db->Prepare("SELECT 1 FROM meta WHERE key='terms_are_current'").Step();
+}
+
+void OutdateTerms(Database* db) {
+  db->Execute("DELETE FROM meta WHERE key='terms_are_current'");
 }
 
 std::int64_t DocumentsWith(Database* db, std::string_view term) {

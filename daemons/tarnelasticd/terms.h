@@ -40,6 +40,12 @@ std::size_t CollectTerms(Database* db, std::int64_t new_documents);
 // Whether words have been collected, and there were any.
 bool HasTerms(Database* db);
 
+// Whether collecting them anew would find the same: OutdateTerms() has not been called since.
+bool AreTermsCurrent(Database* db);
+
+// To be called within each transaction that changes what documents are found by.
+void OutdateTerms(Database* db);
+
 // How many documents had the word; 0 for one that was not collected.
 std::int64_t DocumentsWith(Database* db, std::string_view term);
 

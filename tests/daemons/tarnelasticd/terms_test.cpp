@@ -13,6 +13,7 @@
 #include "daemons/tarnelasticd/index_files.h"
 #include "daemons/tarnelasticd/text_tokenizer.h"
 #include "tests/daemons/tarnelasticd/support/engine_fixture.h"
+#include "tests/support/files.h"
 
 namespace quarry::engine {
 
@@ -290,6 +291,111 @@ TEST_F(TermsTest, CountCopies) {
   Add("/s/5", "harbour storm");
   Collect();
   EXPECT_EQ(Collected(), (Words{{"harbour", 3}, {"storm", 2}}));
+}
+
+// Nor is anything written for it, where nothing is written for anything else.
+TEST_F(TermsTest, AreNotCollectedAgainWhereTheyAreTheSame) {
+  Add("/s/1", "harbour storm");
+  Add("/s/2", "harbour storm");
+  Collect();
+  db_->Execute("DELETE FROM terms");
+  const std::string log = DatabasePath(DirectoryOf("a")) + "-wal";
+  const std::string before = test::ReadFile(log);
+  Collect();
+  EXPECT_TRUE(test::ReadFile(log) == before);
+  Ask("document_set_by_id", Parse(R"({"id":"a","doc_id":"/s/1","data":{"TARNMDFSSize":7}})"));
+  Upsert(FileDocument("/s/2", "harbour storm"));
+  Collect();
+  EXPECT_NE(test::ReadFile(log), before);
+  EXPECT_EQ(Collected(), Words());
+  Restart();
+  Collect();
+  EXPECT_EQ(Collected(), Words());
+  Add("/s/3");
+  Restart();
+  Collect();
+  EXPECT_EQ(Collected(), (Words{{"harbour", 2}, {"storm", 2}}));
+}
+
+// Changes of all kinds, against the words of an index that is made of what they leave.
+class ChangedTermsTest : public TermsTest {
+ protected:
+  std::string AnyOf(const std::vector<std::string>& all) { return all[random_() % all.size()]; }
+  std::string AnyPath() { return "/s/" + AnyOf({"harbour", "storm", "lighthouse", "ship.odt"}); }
+  std::string AnyText() {
+    return AnyOf({"", "harbour storm", "storm lighthouse", "harbour ship", "lighthouse harbour"});
+  }
+
+  void Store() {
+    const std::string path = AnyPath();
+    documents_[path] = FileDocument(path, AnyText());
+    Upsert(documents_[path]);
+  }
+  void Set(const std::string& path, const std::string& field, const std::string& value) {
+    Json::Value data = Parse(R"({"id":"a"})");
+    data["doc_id"] = path;
+    data["data"][field] = value;
+    if (!Ask("document_set_by_id", data)["found"].asBool()) return;
+    documents_[path][field] = value;
+  }
+  void Move() {
+    const std::string path = AnyPath();
+    const std::string to = AnyPath();
+    Set(path, "TARNMDPath", to);
+    if (path == to || documents_.count(path) == 0) return;
+    documents_[to] = documents_[path];
+    documents_.erase(path);
+  }
+  void Delete() {
+    const std::string path = AnyPath();
+    Json::Value data = Parse(R"({"id":"a"})");
+    data["doc_id"] = path;
+    Ask("document_del_by_id", data);
+    documents_.erase(path);
+  }
+  void Change() {
+    switch (random_() % 7) {
+      case 0:
+        return Move();
+      case 1:
+        return Delete();
+      case 2:
+        return Set(AnyPath(), "TARNMDTextContent", AnyText());
+      case 3:
+        return Set(AnyPath(), "TARNMDSearchFileName", AnyOf({"storm", "ship"}));
+      case 4:
+        return Set(AnyPath(), "_TARNMDUserTags", AnyOf({"harbour", "calm"}));
+      case 5:
+        return Commit();
+      default:
+        return Store();
+    }
+  }
+
+  Words WordsOfOneMadeNow() {
+    Create("model");
+    for (const auto& [path, document] : documents_) Upsert(document, "model");
+    Ask("update_term_suggestion", Parse(R"({"db_name":"model","doc_id_field":"TARNMDPath"})"));
+    Commit("model");
+    db_ = std::make_unique<Database>(DatabasePath(DirectoryOf("model")));
+    const Words words = Collected();
+    db_.reset();
+    Ask("index_delete", Parse(R"({"id":"model"})"));
+    return words;
+  }
+
+  std::map<std::string, Json::Value> documents_;
+  std::mt19937 random_{31};
+};
+
+TEST_F(ChangedTermsTest, AreThoseOfWhatIsThere) {
+  for (int round = 0; round < 300; ++round) {
+    for (auto changes = random_() % 3; changes > 0; --changes) Change();
+    if (random_() % 20 == 0) Restart();
+    Collect();
+    const Words words = Collected();
+    ASSERT_EQ(words, WordsOfOneMadeNow()) << round;
+  }
 }
 
 }  // namespace
