@@ -170,7 +170,10 @@ void IndexWriter::CommitNow() {
 }
 
 void IndexWriter::Commit() {
-  if (!uncommitted_) return Undo();
+  if (!uncommitted_) {
+    terms_requested_ = false;
+    return Undo();
+  }
   try {
     CommitNow();
   } catch (...) {
@@ -187,10 +190,14 @@ bool IndexWriter::TakeLost() {
   return std::exchange(lost_, false);
 }
 
+// Where nobody else writes and the words are the same, nothing is written for them.
 void IndexWriter::RequestTerms() {
   Undo();
-  if (!uncommitted_ && AreTermsCurrent(&db_)) return;
-  Change([this] { return terms_requested_ = true; });
+  if (uncommitted_ || db_.HasMoved() || !AreTermsCurrent(&db_)) {
+    Change([this] { return terms_requested_ = true; });
+  } else {
+    terms_requested_ = true;
+  }
 }
 
 DocumentRow IndexWriter::Unpack(const Statement& row) {
@@ -374,6 +381,16 @@ std::int64_t IndexWriter::DeleteSelected(const Selection& selection) {
 
 Json::Value IndexWriter::Find(const Selection& selection) {
   Undo();
+  try {
+    return FindAll(selection);
+  } catch (...) {
+    // Without memory, or where the disk fails, SQLite ends a transaction for a question as well.
+    if (uncommitted_ && !db_.InTransaction()) Rollback();
+    throw;
+  }
+}
+
+Json::Value IndexWriter::FindAll(const Selection& selection) {
   const bool wants_text = WantsText(*schema_, selection);
   const std::set<std::string>* only = selection.load_fields ? &*selection.load_fields : nullptr;
   Json::Value found(Json::arrayValue);

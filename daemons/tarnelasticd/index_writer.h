@@ -63,7 +63,7 @@ class IndexWriter {
   // more than kMaxFound, or more than one with more text than kMaxFoundText together.
   Json::Value Find(const Selection& selection);
 
-  // Makes the words to suggest anew with the next commit, where they are others by then.
+  // Makes the words to suggest anew with the next commit, if they are others by then.
   void RequestTerms();
   // Makes all changes durable and visible. Blocks for the disk.
   void Commit();
@@ -114,6 +114,7 @@ class IndexWriter {
   DocumentRow Unpack(const Statement& row);
   void WriteRow(const std::string& sql, std::int64_t id, const DocumentRow& row);
   bool SetLocked(std::string_view path, const Json::Value& changes);
+  Json::Value FindAll(const Selection& selection);
 
   std::shared_ptr<const Schema> schema_;
   WriterLimits limits_;

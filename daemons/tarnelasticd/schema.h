@@ -1,7 +1,8 @@
 // What an index keeps of each field, as its mappings say.
 //
 // Tables of an index's database:
-//   meta    key, value: the version of this layout, the mappings, how many documents there are
+//   meta    key, value: the version of this layout, the mappings, how many documents there are,
+//           whether the words to suggest are current
 //   docs    one row per document: its path, and a column per field that documents are found or
 //           ordered by as a whole; selection.h says what odd_parent is
 //   attributes  what else is known of the documents; attributes.h and text_store.h say more

@@ -24,6 +24,9 @@ constexpr std::size_t kBlockBytes = std::size_t{32} << 10;
 constexpr std::int64_t kMaxSorted = 200000;
 constexpr std::int64_t kFewOf = 8;
 
+// To be raised when other words are collected from the same documents: they are not current then.
+constexpr int kRules = 1;
+
 [[noreturn]] void FailDamaged() {
   throw Error(kDamagedIndex, "The words to suggest are damaged");
 }
@@ -269,7 +272,9 @@ std::size_t CollectTerms(Database* db, std::int64_t new_documents) {
   if (documents <= kMaxSorted && new_documents * kFewOf > documents) {
     db->Execute("REINDEX docs;REINDEX text_hashes");
   }
-  db->Execute("INSERT OR REPLACE INTO meta(key,value) VALUES('terms_are_current',1)");
+  db->Prepare("INSERT OR REPLACE INTO meta(key,value) VALUES('current_terms',?1)")
+      .Bind(1, std::int64_t{kRules})
+      .Run();
   return is_merged ? static_cast<std::size_t>(lists.leaves()) * SegmentWriter::kLeafBytes : 0;
 }
 
@@ -278,11 +283,12 @@ bool HasTerms(Database* db) {
 }
 
 bool AreTermsCurrent(Database* db) {
-  return db->Prepare("SELECT 1 FROM meta WHERE key='terms_are_current'").Step();
+  Statement rules = db->Prepare("SELECT value FROM meta WHERE key='current_terms'");
+  return rules.Step() && rules.Int(0) == kRules;
 }
 
 void OutdateTerms(Database* db) {
-  db->Execute("DELETE FROM meta WHERE key='terms_are_current'");
+  db->Execute("DELETE FROM meta WHERE key='current_terms'");
 }
 
 std::int64_t DocumentsWith(Database* db, std::string_view term) {

@@ -31,16 +31,17 @@ constexpr std::int64_t kMaxTermLetters = 40;
 // The statements that make the tables.
 std::string CreateTermTables();
 
-// Collects the words of all documents anew, inside the transaction that is open. Where the full
-// text of a small index has come in many pieces it is put together first, and where many documents
-// are new, other indexes. Returns how many bytes of full text were put together, roughly. Throws
-// Error as Database does, as all below do.
+// Collects the words of all documents anew, inside the transaction that is open; they are current
+// then. Where the full text of a small index has come in many pieces it is put together first, and
+// where many documents are new, other indexes. Returns how many bytes of full text were put
+// together, roughly. Throws Error as Database does, as all below do.
 std::size_t CollectTerms(Database* db, std::int64_t new_documents);
 
 // Whether words have been collected, and there were any.
 bool HasTerms(Database* db);
 
-// Whether collecting them anew would find the same: OutdateTerms() has not been called since.
+// Whether words have been collected, and OutdateTerms() not been called since: doing it anew would
+// find the same.
 bool AreTermsCurrent(Database* db);
 
 // To be called within each transaction that changes what documents are found by.

@@ -202,6 +202,28 @@ TEST_F(DurabilityTest, AFullDiskAtAnyMomentLosesNothingCommitted) {
   }
 }
 
+// A question that fails takes the transaction around it along, whole.
+TEST_F(DurabilityTest, AFailedReadLeavesNoHalfTransaction) {
+  Create();
+  for (int i = 0; i < 200; ++i) {
+    Upsert(FileDocument("/s/" + std::to_string(i), "alpha word" + std::to_string(i)));
+  }
+  Restart();
+  const std::string epoch = Epoch();
+  Upsert(FileDocument("/t/1", "alpha"));
+  disk_.FailReads(true);
+  EXPECT_EQ(AskError("document_get_by_query",
+                     Parse(R"({"id":"a","query":{"qsl":{"prefix":{"TARNMDPath":"/"}}}})")),
+            1408);
+  disk_.FailReads(false);
+  EXPECT_NE(Epoch(), epoch);
+  Add("/t/2", "alpha");
+  EXPECT_THAT(Below("/t"), ElementsAre("/t/2"));
+  EXPECT_EQ(Below("/").size(), 201U);
+  EXPECT_EQ(Paths("alpha").size(), 201U);
+  EXPECT_EQ(Ask("engine_status", Json::objectValue)["indexes"][0U]["documents"].asInt(), 201);
+}
+
 TEST_F(DurabilityTest, AFailedSyncIsNoCommit) {
   Create();
   Upsert(FileDocument("/s/1", "alpha"));

@@ -7,6 +7,7 @@
 
 #include "common/json.h"
 #include "daemons/tarnelasticd/index_files.h"
+#include "daemons/tarnelasticd/terms.h"
 #include "tests/daemons/tarnelasticd/support/engine_fixture.h"
 #include "tests/daemons/tarnelasticd/support/fault_disk.h"
 
@@ -131,11 +132,14 @@ class IndexRemadeTest : public EngineTest, public testing::WithParamInterface<un
     Ask("index_create", create);
     CommitAll();
   }
-  void CollectTerms() {
+  static Json::Value TermsRequest() {
     Json::Value data;
     data["db_name"] = "a";
     data["doc_id_field"] = "TARNMDPath";
-    Ask("update_term_suggestion", data);
+    return MakeRequest("update_term_suggestion", data);
+  }
+  void CollectTerms() {
+    ASSERT_TRUE(engine_->Handle(TermsRequest())["success"].asBool());
     CommitAll();
   }
   void Change() {
@@ -178,6 +182,14 @@ class IndexRemadeTest : public EngineTest, public testing::WithParamInterface<un
     }
     return hits;
   }
+  static std::vector<std::string> TermsIn(const std::string& directory) {
+    Database db(DatabasePath(directory));
+    std::vector<std::string> terms;
+    for (const Term& term : TermsThatBegin(&db, "", 1000000)) {
+      terms.push_back(term.text + ' ' + std::to_string(term.documents));
+    }
+    return terms;
+  }
   void Compare() {
     test::TempDir other;
     EngineOptions options;
@@ -186,8 +198,10 @@ class IndexRemadeTest : public EngineTest, public testing::WithParamInterface<un
     anew.Handle(CreateRequest("a", other / "index/a"));
     for (const auto& [path, document] : now_) anew.Handle(UpsertRequest("a", document));
     ASSERT_EQ(Listing(engine_.get()), Listing(&anew));
+    anew.Handle(TermsRequest());
     anew.CommitAll();
-    CommitAll();
+    CollectTerms();
+    ASSERT_EQ(TermsIn(DirectoryOf("a")), TermsIn(other / "index/a"));
     for (const char* query : {"one", "two", "one two", "\"one one\"", "harbour", "sea7", "isle2*",
                               "three OR five", "-one", "name:txt", "six", "in:/s/a one"}) {
       ASSERT_EQ(Hits(engine_.get(), query), Hits(&anew, query)) << query;

@@ -317,6 +317,26 @@ TEST_F(TermsTest, AreNotCollectedAgainWhereTheyAreTheSame) {
   EXPECT_EQ(Collected(), (Words{{"harbour", 2}, {"storm", 2}}));
 }
 
+TEST_F(TermsTest, AreThoseOfTheCommitAfterTheyWereAskedFor) {
+  Add("/s/harbour");
+  Collect();
+  Ask("update_term_suggestion", Parse(R"({"db_name":"a","doc_id_field":"TARNMDPath"})"));
+  Add("/s/storm");
+  EXPECT_EQ(Collected(), (Words{{"harbour", 1}, {"storm", 1}}));
+  // One that is answered is not kept for later.
+  Collect();
+  Add("/s/ship");
+  EXPECT_EQ(Collected(), (Words{{"harbour", 1}, {"storm", 1}}));
+}
+
+TEST_F(TermsTest, ARemovedDatabaseIsNoticed) {
+  Add("/s/harbour");
+  Collect();
+  std::filesystem::remove(DatabasePath(DirectoryOf("a")));
+  Ask("update_term_suggestion", Parse(R"({"db_name":"a","doc_id_field":"TARNMDPath"})"));
+  EXPECT_EQ(AskError("commit", Parse(R"({"id":"a"})")), kDamagedIndex);
+}
+
 // Changes of all kinds, against the words of an index that is made of what they leave.
 class ChangedTermsTest : public TermsTest {
  protected:

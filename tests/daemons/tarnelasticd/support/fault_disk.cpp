@@ -14,6 +14,7 @@ struct State {
   std::mutex mutex;
   bool limited = false;
   std::int64_t room = 0;
+  bool fail_reads = false;
   bool fail_syncs = false;
   bool tracking = false;
   std::map<std::string, std::string> durable;
@@ -40,6 +41,11 @@ int Close(sqlite3_file* file) {
   return Inner(file)->pMethods->xClose(Inner(file));
 }
 int Read(sqlite3_file* file, void* to, int size, sqlite3_int64 offset) {
+  {
+    State& state = TheState();
+    const std::lock_guard<std::mutex> lock(state.mutex);
+    if (state.fail_reads) return SQLITE_IOERR_READ;
+  }
   return Inner(file)->pMethods->xRead(Inner(file), to, size, offset);
 }
 int Write(sqlite3_file* file, const void* from, int size, sqlite3_int64 offset) {
@@ -158,6 +164,7 @@ FaultDisk::~FaultDisk() {
   State& state = TheState();
   const std::lock_guard<std::mutex> lock(state.mutex);
   state.limited = false;
+  state.fail_reads = false;
   state.fail_syncs = false;
   state.tracking = false;
   state.durable.clear();
@@ -174,6 +181,12 @@ void FaultDisk::SetUnlimitedRoom() {
   State& state = TheState();
   const std::lock_guard<std::mutex> lock(state.mutex);
   state.limited = false;
+}
+
+void FaultDisk::FailReads(bool fail) {
+  State& state = TheState();
+  const std::lock_guard<std::mutex> lock(state.mutex);
+  state.fail_reads = fail;
 }
 
 void FaultDisk::FailSyncs(bool fail) {

@@ -1,4 +1,4 @@
-// A disk below SQLite that runs full, fails to sync, and forgets what was not synced.
+// A disk below SQLite that runs full, fails to read or sync, and forgets what was not synced.
 
 #ifndef QUARRY_TESTS_DAEMONS_TARNELASTICD_SUPPORT_FAULT_DISK_H_
 #define QUARRY_TESTS_DAEMONS_TARNELASTICD_SUPPORT_FAULT_DISK_H_
@@ -21,7 +21,8 @@ class FaultDisk {
   // From now on so many bytes can be written before the disk is full.
   void SetRoom(std::int64_t bytes);
   void SetUnlimitedRoom();
-  // Whether syncing fails.
+  // Whether reading, or syncing, fails.
+  void FailReads(bool fail);
   void FailSyncs(bool fail);
 
   // What the files of `directory` hold now counts as safe on the disk; after that only what is
