@@ -254,6 +254,7 @@ Json::Value Engine::UpsertInto(const std::vector<Json::Value*>& requests,
       bytes += EstimateMemory(ObjectProperty(data_of(i), "data"));
       paths[i] = path;
     });
+    if (!paths[i]) *requests[i] = Json::Value();
   }
   if (std::none_of(paths.begin(), paths.end(), [](const auto& path) { return path.has_value(); })) {
     return {};
