@@ -29,7 +29,7 @@ using State = Connection::State;
 constexpr auto kAcceptPause = std::chrono::milliseconds(100);
 // A server that ends takes requests until nobody has sent anything for that long, but not for
 // longer than that altogether. On a machine that is busy all of that may pass before anybody is
-// looked at, so it looks a few times whatever the time.
+// looked at, so it looks a few times whatever the time, and however long answering takes.
 constexpr auto kSilence = std::chrono::milliseconds(20);
 constexpr auto kLastRequestsTime = std::chrono::milliseconds(100);
 constexpr int kLeastLooks = 8;
