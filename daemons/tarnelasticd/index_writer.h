@@ -40,8 +40,9 @@ struct WriterLimits {
 
 // The one connection that changes an index. Changes collect in a transaction: this object's own
 // questions see them at once, searches after Commit(). A change that fails, whatever for, takes all
-// that was not committed with it; Lost() tells. Throws Error as Database does. One thread at a
-// time, but for documents(), HasUncommitted() and RunSideWork().
+// that was not committed with it, and a question may where memory or the disk fails; TakeLost()
+// tells. Throws Error as Database does. One thread at a time, but for documents(), HasUncommitted()
+// and RunSideWork().
 class IndexWriter {
  public:
   // Opens the database of an index that exists. `schema` is the one that it was made with.

@@ -40,8 +40,8 @@ std::size_t CollectTerms(Database* db, std::int64_t new_documents);
 // Whether words have been collected, and there were any.
 bool HasTerms(Database* db);
 
-// Whether words have been collected, and OutdateTerms() not been called since: doing it anew would
-// find the same.
+// Whether words have been collected by today's rules, and OutdateTerms() not been called since:
+// doing it anew would find the same.
 bool AreTermsCurrent(Database* db);
 
 // To be called within each transaction that changes what documents are found by.
