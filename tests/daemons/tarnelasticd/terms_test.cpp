@@ -32,9 +32,15 @@ class TermsTest : public EngineTest {
  protected:
   TermsTest() { Create(); }
 
-  // Collects the words and closes the engine, so that the database can be looked at.
+  void Request(const std::string& index = "a") {
+    Json::Value data;
+    data["db_name"] = index;
+    data["doc_id_field"] = "TARNMDPath";
+    Ask("update_term_suggestion", data);
+  }
+  // Collects the words, which can be looked at then.
   void Collect() {
-    Ask("update_term_suggestion", Parse(R"({"db_name":"a","doc_id_field":"TARNMDPath"})"));
+    Request();
     Commit();
     db_ = std::make_unique<Database>(DatabasePath(DirectoryOf("a")));
   }
@@ -320,7 +326,7 @@ TEST_F(TermsTest, AreNotCollectedAgainWhereTheyAreTheSame) {
 TEST_F(TermsTest, AreThoseOfTheCommitAfterTheyWereAskedFor) {
   Add("/s/harbour");
   Collect();
-  Ask("update_term_suggestion", Parse(R"({"db_name":"a","doc_id_field":"TARNMDPath"})"));
+  Request();
   Add("/s/storm");
   EXPECT_EQ(Collected(), (Words{{"harbour", 1}, {"storm", 1}}));
   // One that is answered is not kept for later.
@@ -333,7 +339,7 @@ TEST_F(TermsTest, ARemovedDatabaseIsNoticed) {
   Add("/s/harbour");
   Collect();
   std::filesystem::remove(DatabasePath(DirectoryOf("a")));
-  Ask("update_term_suggestion", Parse(R"({"db_name":"a","doc_id_field":"TARNMDPath"})"));
+  Request();
   EXPECT_EQ(AskError("commit", Parse(R"({"id":"a"})")), kDamagedIndex);
 }
 
@@ -395,7 +401,7 @@ class ChangedTermsTest : public TermsTest {
   Words WordsOfOneMadeNow() {
     Create("model");
     for (const auto& [path, document] : documents_) Upsert(document, "model");
-    Ask("update_term_suggestion", Parse(R"({"db_name":"model","doc_id_field":"TARNMDPath"})"));
+    Request("model");
     Commit("model");
     db_ = std::make_unique<Database>(DatabasePath(DirectoryOf("model")));
     const Words words = Collected();
